@@ -1,0 +1,25 @@
+# One set of flags for everything: C++20, every warning an error, a sanitizer on request.
+set(CMAKE_CXX_STANDARD 20)
+set(CMAKE_CXX_STANDARD_REQUIRED ON)
+set(CMAKE_CXX_EXTENSIONS OFF)
+
+if(NOT CMAKE_BUILD_TYPE)
+  set(CMAKE_BUILD_TYPE RelWithDebInfo)
+endif()
+
+set(SKEIN_SANITIZE "" CACHE STRING "Sanitizers, as -fsanitize= takes them")
+
+add_compile_options(-Wall -Wextra -Wpedantic -Werror)
+if(CMAKE_CXX_COMPILER_ID STREQUAL "Clang")
+  add_compile_options(-Wthread-safety)
+endif()
+if(SKEIN_SANITIZE)
+  add_compile_options(-fsanitize=${SKEIN_SANITIZE} -fno-omit-frame-pointer -O1)
+  add_link_options(-fsanitize=${SKEIN_SANITIZE})
+  if(SKEIN_SANITIZE MATCHES "undefined")
+    add_compile_options(-fno-sanitize-recover=undefined)
+  endif()
+  if(SKEIN_SANITIZE MATCHES "thread")
+    add_compile_options(-Wno-tsan)
+  endif()
+endif()

@@ -1,0 +1,38 @@
+# skein_room(DIR LINKS TARGETS... [MAIN PROGRAM]): one static library of the room's
+# sources, named skein_ and the folder's path, and with MAIN a program of its main.cc.
+# A .capnp file in the room is compiled into it.
+function(skein_room dir)
+  cmake_parse_arguments(ROOM "" "MAIN" "LINKS" ${ARGN})
+  string(REPLACE "/" "_" name "skein_${dir}")
+  file(GLOB_RECURSE sources CONFIGURE_DEPENDS "${CMAKE_SOURCE_DIR}/${dir}/*.cc")
+  list(REMOVE_ITEM sources "${CMAKE_SOURCE_DIR}/${dir}/main.cc")
+  file(GLOB schemas CONFIGURE_DEPENDS "${CMAKE_SOURCE_DIR}/${dir}/*.capnp")
+
+  if(schemas)
+    set(CAPNPC_OUTPUT_DIR "${CMAKE_BINARY_DIR}/generated/${dir}")
+    set(CAPNPC_SRC_PREFIX "${CMAKE_SOURCE_DIR}/${dir}")
+    file(MAKE_DIRECTORY "${CAPNPC_OUTPUT_DIR}")
+    capnp_generate_cpp(generated generated_headers ${schemas})
+    add_library(${name}_schema STATIC ${generated})
+    target_include_directories(${name}_schema SYSTEM PUBLIC "${CMAKE_BINARY_DIR}/generated")
+    target_compile_options(${name}_schema PRIVATE -w)
+    target_link_libraries(${name}_schema PUBLIC CapnProto::capnp-rpc)
+    list(APPEND ROOM_LINKS ${name}_schema)
+  endif()
+
+  if(NOT sources)
+    # A room of headers alone, or one still to be furnished.
+    add_library(${name} INTERFACE)
+    target_include_directories(${name} INTERFACE "${CMAKE_SOURCE_DIR}")
+    target_link_libraries(${name} INTERFACE ${ROOM_LINKS})
+  else()
+    add_library(${name} STATIC ${sources})
+    target_include_directories(${name} PUBLIC "${CMAKE_SOURCE_DIR}")
+    target_link_libraries(${name} PUBLIC ${ROOM_LINKS})
+  endif()
+  if(ROOM_MAIN AND EXISTS "${CMAKE_SOURCE_DIR}/${dir}/main.cc")
+    add_executable(${ROOM_MAIN} "${CMAKE_SOURCE_DIR}/${dir}/main.cc")
+    target_link_libraries(${ROOM_MAIN} PRIVATE ${name})
+    set_target_properties(${ROOM_MAIN} PROPERTIES RUNTIME_OUTPUT_DIRECTORY "${CMAKE_BINARY_DIR}/bin")
+  endif()
+endfunction()
