@@ -1,0 +1,111 @@
+#pragma once
+
+#include <cstdint>
+#include <map>
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "base/Completion.h"
+#include "platform/fileprovider/NSFileProviderEnumerating.h"
+#include "platform/fileprovider/NSFileProviderItem.h"
+#include "platform/foundation/NSError.h"
+#include "platform/foundation/NSURL.h"
+
+namespace skein {
+
+// What the extension's attributes file says, as NSExtensionMain read it.
+struct NSExtensionAttributes {
+  std::string principalClass;
+  std::map<std::string, std::string> values;
+};
+
+// The operations a host may ask of a File Provider extension. The host calls them on
+// its own threads, several at once. A completion handler is called exactly once, on
+// any thread, unless the operation says otherwise; an empty one is allowed.
+//
+// Every operation here has the platform's default behaviour: lookups answer nil, the
+// others answer NSFeatureUnsupportedError in NSCocoaErrorDomain ("not supported").
+class NSFileProviderExtension {
+ public:
+  using ItemCompletion = Completion<NSFileProviderItemPtr, NSErrorPtr>;
+  using ErrorCompletion = Completion<NSErrorPtr>;
+
+  virtual ~NSFileProviderExtension() = default;
+
+  // Lookups, synchronous.
+  virtual NSURLPtr URLForItemWithPersistentIdentifier(
+      const NSFileProviderItemIdentifier& identifier);
+  virtual std::optional<NSFileProviderItemIdentifier> persistentIdentifierForItemAtURL(
+      const NSURLPtr& url);
+  // itemForIdentifier:error:
+  virtual NSFileProviderItemPtr itemForIdentifier(const NSFileProviderItemIdentifier& identifier,
+                                                  NSErrorOut error);
+  // enumeratorForContainerItemIdentifier:error:
+  virtual std::shared_ptr<NSFileProviderEnumerator> enumeratorForContainerItemIdentifier(
+      const NSFileProviderItemIdentifier& identifier, NSErrorOut error);
+  virtual NSErrorPtr fileProviderErrorFromFSError(const NSErrorPtr& error);
+
+  // Contents.
+  // providePlaceholderAtURL:completionHandler:
+  virtual void providePlaceholderAtURL(const NSURLPtr& url, ErrorCompletion completionHandler);
+  // startProvidingItemAtURL:readingOptions:completionHandler:
+  virtual void startProvidingItemAtURL(const NSURLPtr& url, std::uint64_t readingOptions,
+                                       ErrorCompletion completionHandler);
+  // startProvidingItemAtURL:completionHandler:
+  virtual void startProvidingItemAtURL(const NSURLPtr& url, ErrorCompletion completionHandler);
+  virtual void stopProvidingItemAtURL(const NSURLPtr& url);
+  virtual void itemChangedAtURL(const NSURLPtr& url);
+
+  // Item operations.
+  // importDocumentAtURL:toParentItemIdentifier:completionHandler:
+  virtual void importDocumentAtURL(const NSURLPtr& url,
+                                   const NSFileProviderItemIdentifier& toParentItemIdentifier,
+                                   ItemCompletion completionHandler);
+  // createDirectoryWithName:inParentItemIdentifier:completionHandler:
+  virtual void createDirectoryWithName(const std::string& name,
+                                       const NSFileProviderItemIdentifier& inParentItemIdentifier,
+                                       ItemCompletion completionHandler);
+  // renameItemWithIdentifier:toName:completionHandler:
+  virtual void renameItemWithIdentifier(const NSFileProviderItemIdentifier& identifier,
+                                        const std::string& toName,
+                                        ItemCompletion completionHandler);
+  // reparentItemWithIdentifier:toParentItemWithIdentifier:newName:completionHandler:
+  virtual void reparentItemWithIdentifier(
+      const NSFileProviderItemIdentifier& identifier,
+      const NSFileProviderItemIdentifier& toParentItemWithIdentifier,
+      std::optional<std::string> newName, ItemCompletion completionHandler);
+  // trashItemWithIdentifier:completionHandler:
+  virtual void trashItemWithIdentifier(const NSFileProviderItemIdentifier& identifier,
+                                       ItemCompletion completionHandler);
+  // untrashItemWithIdentifier:toParentItemIdentifier:completionHandler:
+  virtual void untrashItemWithIdentifier(
+      const NSFileProviderItemIdentifier& identifier,
+      std::optional<NSFileProviderItemIdentifier> toParentItemIdentifier,
+      ItemCompletion completionHandler);
+  // deleteItemWithIdentifier:completionHandler:
+  virtual void deleteItemWithIdentifier(const NSFileProviderItemIdentifier& identifier,
+                                        ErrorCompletion completionHandler);
+  // setLastUsedDate:forItemIdentifier:completionHandler:
+  virtual void setLastUsedDate(std::optional<NSDate> date,
+                               const NSFileProviderItemIdentifier& forItemIdentifier,
+                               ItemCompletion completionHandler);
+  // setTagData:forItemIdentifier:completionHandler:
+  virtual void setTagData(std::optional<NSData> tagData,
+                          const NSFileProviderItemIdentifier& forItemIdentifier,
+                          ItemCompletion completionHandler);
+  // setFavoriteRank:forItemIdentifier:completionHandler:
+  virtual void setFavoriteRank(std::optional<std::int64_t> rank,
+                               const NSFileProviderItemIdentifier& forItemIdentifier,
+                               ItemCompletion completionHandler);
+
+ protected:
+  // The superclass's half of construction. False without attributes: an extension that
+  // no host started has nothing to serve, and its own construction must answer nil.
+  bool init(std::shared_ptr<const NSExtensionAttributes> attributes);
+
+ private:
+  std::shared_ptr<const NSExtensionAttributes> _attributes;
+};
+
+}  // namespace skein
