@@ -1,0 +1,114 @@
+// vald as the local host knows it: the framework's daemon, and what only this host has
+// (accounts, containers, status, checks). The same interface stands on both sides of
+// the socket: vald's core implements it, the connection's proxies do too.
+#pragma once
+
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "vellum/VLContainer.h"
+#include "vellum/VLDaemonConnection.h"
+
+namespace skein {
+
+struct LocalAccount {
+  std::string name;
+  // nil: an account that counts as logged out.
+  std::optional<std::string> perAppAccountIdentifier;
+
+  friend bool operator==(const LocalAccount&, const LocalAccount&) = default;
+};
+
+// What is true of vald at the moment.
+struct LocalDaemonStatus {
+  enum class Scan : std::uint8_t { Idle, First, Verifying, Rescanning };
+  enum class Watch : std::uint8_t { Complete, Degraded };
+
+  std::string store;  // the drive's folder, absolute
+  std::int64_t processID = 0;
+  std::uint64_t documents = 0;
+  std::uint64_t folders = 0;
+  std::uint64_t aliases = 0;
+  Scan scan = Scan::Idle;
+  std::uint64_t scannedFolders = 0;  // of the running scan
+  std::uint64_t pendingFolders = 0;
+  std::uint64_t unreadableFolders = 0;
+  Watch watch = Watch::Complete;
+  std::string watchReason;  // why it is degraded, in words; empty when complete
+  std::uint64_t watches = 0;
+  std::uint64_t watchBudget = 0;
+  std::uint64_t overflows = 0;        // since the start
+  std::uint64_t rank = 0;             // the newest change's
+  std::uint64_t oldestTokenRank = 0;  // older tokens are expired
+  std::uint64_t senders = 0;          // update senders that are alive
+  std::optional<LocalAccount> account;
+};
+
+// One difference between the store on disk and the index.
+struct IndexDifference {
+  enum class Kind : std::uint8_t { MissingInIndex, MissingInStore, Attributes, Identity };
+  Kind kind = Kind::MissingInIndex;
+  std::string path;  // absolute
+  std::string detail;
+};
+
+// "The next call of `method` answers this": for tests and trials. Reaches only the
+// owner of the socket, and only a vald that was started with fault injection allowed.
+struct FaultInjection {
+  enum class Action : std::uint8_t { AnswerError, DropConnection, Delay };
+  std::string method;  // the selector's first keyword, such as "enumerateItemsInFolder"
+  Action action = Action::AnswerError;
+  std::string errorDomain;
+  std::int64_t errorCode = 0;
+  std::uint32_t delayMilliseconds = 0;
+  std::uint32_t times = 1;
+};
+
+// Pushed by vald to each subscriber, on a delivery thread.
+class LocalDaemonEvents {
+ public:
+  virtual ~LocalDaemonEvents() = default;
+  virtual void accountDidChange(std::optional<LocalAccount> account) = 0;
+  virtual void containerListDidChange() = 0;
+};
+
+// Threads, replies and errors as VLDaemon says.
+class LocalDaemon : public VLDaemon {
+ public:
+  // Null URL and an error for an identifier that names nothing.
+  virtual void URLForFileObjectID(VLFileObjectID fileObjectID,
+                                  Reply<NSURLPtr, NSErrorPtr> reply) = 0;
+
+  // The item at an absolute path inside the store. `scanFirst`: look at the file before
+  // answering. Null item and NSCocoaErrorDomain 4 when there is none.
+  virtual void queryItemForURL(NSURLPtr url, bool scanFirst,
+                               Reply<VLQueryItemPtr, NSErrorPtr> reply) = 0;
+
+  virtual void account(Reply<std::optional<LocalAccount>, NSErrorPtr> reply) = 0;
+  // Survives a restart. Replaces the account that was logged in.
+  virtual void logIn(LocalAccount account, Reply<NSErrorPtr> reply) = 0;
+  virtual void logOut(Reply<NSErrorPtr> reply) = 0;
+
+  virtual void containers(Reply<std::vector<VLContainer::Properties>, NSErrorPtr> reply) = 0;
+
+  // `events` is called until the connection ends or `events` dies (held weakly by the
+  // caller's side only).
+  virtual void subscribe(std::shared_ptr<LocalDaemonEvents> events, Reply<NSErrorPtr> reply) = 0;
+
+  virtual void status(Reply<LocalDaemonStatus, NSErrorPtr> reply) = 0;
+
+  // Walks the store and compares it with the index. At most `limit` differences.
+  virtual void checkIndex(std::uint64_t limit,
+                          Reply<std::vector<IndexDifference>, NSErrorPtr> reply) = 0;
+
+  virtual void injectFault(FaultInjection fault, Reply<NSErrorPtr> reply) = 0;
+
+  // Replies, then ends the process in order.
+  virtual void stop(Reply<NSErrorPtr> reply) = 0;
+};
+
+}  // namespace skein

@@ -1,0 +1,36 @@
+#pragma once
+
+#include <memory>
+
+#include "base/Executor.h"
+#include "platform/fileprovider/NSFileProviderManager.h"
+#include "platform/foundation/NSNotificationCenter.h"
+#include "platform/log/Log.h"
+#include "support/RootURL.h"
+#include "support/VLLogSection.h"
+#include "vellum/VLAccount.h"
+#include "vellum/VLContainer.h"
+#include "vellum/VLDaemonConnection.h"
+#include "vellum/VLDocuments.h"
+
+namespace skein {
+
+// The world as the extension meets it: each role by reference, wired once by the
+// process's main (or by a test) and outliving everything that is made with it. What the
+// process keeps once (section numbers, the root URL) is here too, so that each
+// environment starts fresh.
+struct Environment {
+  Log& log;  // vlc_default_log
+  std::shared_ptr<Executor> executor;
+  NSNotificationCenter& notificationCenter;
+  NSFileProviderManager& providerManager;
+  VLAccounts& accounts;
+  VLContainers& containers;
+  VLDaemonConnection& daemonConnection;
+  VLDocuments& documents;
+  VLQueryItemLookup& queryItems;
+  VLLogSections& logSections;
+  RootURL& rootURL;
+};
+
+}  // namespace skein

@@ -1,0 +1,114 @@
+// Calls to vald, and what vald pushes back.
+#pragma once
+
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "base/UniqueFunction.h"
+#include "platform/foundation/NSData.h"
+#include "platform/foundation/NSError.h"
+#include "platform/foundation/NSURL.h"
+#include "vellum/VLFileObjectID.h"
+#include "vellum/VLQueryItem.h"
+
+namespace skein {
+
+// Receives the items of a watched folder as they change. Called on a delivery thread of
+// the connection, one push at a time; never on its reader thread. The connection holds
+// the receiver until its sender was invalidated or died.
+class VLItemNotificationReceiving {
+ public:
+  virtual ~VLItemNotificationReceiving() = default;
+
+  // receiveUpdates:logicalExtensions:physicalExtensions:reply:
+  // `reply` is the daemon's flow control: it holds back further pushes meanwhile.
+  virtual void receiveUpdates(const VLQueryItems& items,
+                              const std::vector<std::string>& logicalExtensions,
+                              const std::vector<std::string>& physicalExtensions,
+                              Reply<> reply) = 0;
+
+  // receiveProgressUpdates:reply: the daemon does not wait for this reply.
+  virtual void receiveProgressUpdates(const VLQueryItems& updates, Reply<> reply) = 0;
+};
+
+// The daemon's end of one watch. Any thread. For each message either its reply or the
+// proxy's error handler runs, once, on a reply thread.
+class VLItemNotificationSending {
+ public:
+  virtual ~VLItemNotificationSending() = default;
+
+  // boostPriority: the watch's pushes go before others'.
+  virtual void boostPriority(Reply<> reply) = 0;
+
+  // watchItemAtURL:options:gatherReply: the reply comes when the watch stands. 19
+  // watches a folder's own children, 23 its whole subtree.
+  virtual void watchItemAtURL(const NSURLPtr& url, std::uint64_t options,
+                              Reply<NSErrorPtr> gatherReply) = 0;
+
+  // Ends the watch; nothing is pushed afterwards.
+  virtual void invalidate() = 0;
+};
+
+// A sender as it comes from the daemon: makes proxies of itself, each with an error
+// handler of its own for the messages that are lost. Their errors come on a reply thread.
+class VLItemNotificationSender : public VLItemNotificationSending {
+ public:
+  // Never null.
+  virtual std::shared_ptr<VLItemNotificationSending> remoteObjectProxyWithErrorHandler(
+      std::function<void(NSErrorPtr)> errorHandler) = 0;
+};
+
+// vald itself, as a proxy. Asynchronous: a call returns at once; its reply runs later,
+// once, on a reply thread, from where synchronous calls may be made, or the proxy's error
+// handler runs instead. Never on the calling thread and never under a caller's lock.
+class VLDaemon {
+ public:
+  using ItemsReply = Reply<NSFileProviderItems, std::uint64_t, NSErrorPtr>;
+
+  virtual ~VLDaemon() = default;
+
+  // enumerateItemsInFolder:sortOrder:offset:limit:completion:
+  // `folder` nil: the drive's root. `sortOrder` 0 by name, 1 by date (newest first). The
+  // reply's number is the next page's offset, 0 at the end.
+  virtual void enumerateItemsInFolder(std::optional<VLFileObjectID> folder, std::uint8_t sortOrder,
+                                      std::uint64_t offset, std::uint64_t limit,
+                                      ItemsReply completion) = 0;
+
+  // enumerateAllFoldersWithSortOrder:offset:limit:completion:
+  virtual void enumerateAllFoldersWithSortOrder(std::uint8_t sortOrder, std::uint64_t offset,
+                                                std::uint64_t limit, ItemsReply completion) = 0;
+
+  // currentNotifRankWithReply:
+  virtual void currentNotifRankWithReply(Reply<std::uint64_t, NSErrorPtr> reply) = 0;
+
+  // enumerateWorkingSetChangesFromChangeToken:limit:completion:
+  // A nil token is the start of the history. At most `limit` changes, updates and
+  // deletions together; the token given back unchanged means that there are no more. A
+  // token that is too old answers NSFileProviderErrorSyncAnchorExpired.
+  virtual void enumerateWorkingSetChangesFromChangeToken(
+      std::optional<NSData> changeToken, std::uint64_t limit,
+      Reply<NSFileProviderItems, std::vector<VLFileObjectID>, std::optional<NSData>, NSErrorPtr>
+          completion) = 0;
+
+  // getItemUpdateSenderWithReceiver:reply: the daemon holds `receiver` as said above.
+  virtual void getItemUpdateSenderWithReceiver(
+      std::shared_ptr<VLItemNotificationReceiving> receiver,
+      Reply<std::shared_ptr<VLItemNotificationSender>, NSErrorPtr> reply) = 0;
+};
+
+// The process's connection to vald; it is made anew when it was lost. Any thread.
+class VLDaemonConnection {
+ public:
+  virtual ~VLDaemonConnection() = default;
+
+  // remoteObjectProxyWithErrorHandler: never null. The handler runs once for each
+  // message that gets no reply because the connection failed, on a reply thread.
+  virtual std::shared_ptr<VLDaemon> remoteObjectProxyWithErrorHandler(
+      std::function<void(NSErrorPtr)> errorHandler) = 0;
+};
+
+}  // namespace skein
