@@ -1,13 +1,10 @@
 #pragma once
 
 #include <cstddef>
-#include <deque>
+#include <memory>
 #include <string>
-#include <thread>
-#include <vector>
 
 #include "base/Executor.h"
-#include "base/Mutex.h"
 
 namespace skein {
 
@@ -19,26 +16,17 @@ class ThreadPool final : public Executor {
   // `width`: running workers, at least 1. `name`: shown by debuggers, cut at 15 bytes.
   ThreadPool(std::size_t width, std::string name);
 
-  // Runs what was posted before, then joins. Must not run on one of its own workers.
+  // Runs what was posted before, then joins. When a worker drops the last reference,
+  // that worker is left to end by itself.
   ~ThreadPool() override;
 
-  void post(Task task) override SKEIN_EXCLUDES(_mutex);
-  void beginWait() override SKEIN_EXCLUDES(_mutex);
-  void endWait() override SKEIN_EXCLUDES(_mutex);
+  void post(Task task) override;
+  void beginWait() override;
+  void endWait() override;
 
  private:
-  void run() SKEIN_EXCLUDES(_mutex);
-  void addThreadIfNeeded() SKEIN_REQUIRES(_mutex);
-
-  const std::size_t _width;
-  const std::string _name;
-  Mutex _mutex;
-  CondVar _workArrived;
-  std::deque<Task> _tasks SKEIN_GUARDED_BY(_mutex);
-  std::vector<std::thread> _threads SKEIN_GUARDED_BY(_mutex);
-  std::size_t _idle SKEIN_GUARDED_BY(_mutex) = 0;
-  std::size_t _waiting SKEIN_GUARDED_BY(_mutex) = 0;
-  bool _stopping SKEIN_GUARDED_BY(_mutex) = false;
+  struct State;
+  std::shared_ptr<State> _state;
 };
 
 }  // namespace skein

@@ -9,6 +9,7 @@
 
 #include "base/Completion.h"
 #include "base/Fault.h"
+#include "base/Mutex.h"
 #include "base/ThreadPool.h"
 #include "platform/log/Log.h"
 
@@ -92,14 +93,20 @@ TEST(SerialQueue, SyncOntoItselfIsAFaultAndRunsInline) {
   EXPECT_EQ(faults.count(), 1u);
 }
 
-TEST(SerialQueue, MayLoseItsLastReferenceOnItsOwnWorker) {
-  auto pool = std::make_shared<ThreadPool>(1, "test");
-  auto queue = std::make_shared<SerialQueue>("last", pool);
-  std::promise<void> after;
-  auto* raw = queue.get();
-  raw->async([queue = std::move(queue)]() mutable { queue.reset(); });
-  pool->post([&after] { after.set_value(); });
-  ASSERT_EQ(after.get_future().wait_for(kDeadline), std::future_status::ready);
+TEST(SerialQueue, QueueAndPoolMayLoseTheirLastReferenceOnTheirOwnWorker) {
+  std::promise<void> gone;
+  {
+    auto pool = std::make_shared<ThreadPool>(1, "test");
+    auto queue = std::make_shared<SerialQueue>("last", pool);
+    SerialQueue* raw = queue.get();
+    // Destroyed with its closure, on the worker, after queue and pool.
+    std::shared_ptr<void> last(nullptr, [&gone](void*) { gone.set_value(); });
+    raw->async([last, queue = std::move(queue), pool = std::move(pool)]() mutable {
+      queue.reset();
+      pool.reset();
+    });
+  }
+  ASSERT_EQ(gone.get_future().wait_for(kDeadline), std::future_status::ready);
 }
 
 TEST(Completion, TwiceOrNeverIsAFaultAndEmptyIsNone) {
