@@ -123,4 +123,29 @@ void NSFileProviderExtension::setFavoriteRank(std::optional<std::int64_t>,
   completionHandler(nullptr, notSupported());
 }
 
+void NSFileProviderExtension::_defaultApplicationContainerForBundleIdentifier(
+    std::optional<std::string>, ItemCompletion completionHandler) {
+  completionHandler(nullptr, notSupported());
+}
+
+std::shared_ptr<NSProgress> NSFileProviderExtension::fetchThumbnailsForItemIdentifiers(
+    const std::vector<NSFileProviderItemIdentifier>&, NSSize, ThumbnailHandler,
+    ErrorCompletion completionHandler) {
+  completionHandler(notSupported());
+  return NSProgress::progressWithTotalUnitCount(0);
+}
+
+std::shared_ptr<NSProgress> NSFileProviderExtension::fetchThumbnailsForItemIdentifiersWithType(
+    const std::vector<NSFileProviderItemIdentifier>&, NSSize, ThumbnailWithTypeHandler,
+    ErrorCompletion completionHandler) {
+  completionHandler(notSupported());
+  return NSProgress::progressWithTotalUnitCount(0);
+}
+
+NSFileProviderServiceSources NSFileProviderExtension::supportedServiceSourcesForItemIdentifier(
+    const NSFileProviderItemIdentifier&, NSErrorOut error) {
+  error.store(notSupported());
+  return {};
+}
+
 }  // namespace skein

@@ -1,15 +1,21 @@
 #pragma once
 
 #include <cstdint>
+#include <functional>
 #include <map>
 #include <memory>
 #include <optional>
 #include <string>
+#include <variant>
+#include <vector>
 
 #include "base/Completion.h"
 #include "platform/fileprovider/NSFileProviderEnumerating.h"
 #include "platform/fileprovider/NSFileProviderItem.h"
+#include "platform/fileprovider/NSFileProviderServiceSource.h"
 #include "platform/foundation/NSError.h"
+#include "platform/foundation/NSProgress.h"
+#include "platform/foundation/NSSize.h"
 #include "platform/foundation/NSURL.h"
 
 namespace skein {
@@ -30,6 +36,14 @@ class NSFileProviderExtension {
  public:
   using ItemCompletion = Completion<NSFileProviderItemPtr, NSErrorPtr>;
   using ErrorCompletion = Completion<NSErrorPtr>;
+  // Identifier, image data, content type, error. Called once per item that is answered.
+  using ThumbnailWithTypeHandler =
+      std::function<void(const NSFileProviderItemIdentifier&, std::optional<NSData>,
+                         std::optional<std::string>, NSErrorPtr)>;
+  // Identifier, image data, and a third value that is an error or a content type.
+  using ThumbnailHandler =
+      std::function<void(const NSFileProviderItemIdentifier&, std::optional<NSData>,
+                         std::variant<std::monostate, NSErrorPtr, std::string>)>;
 
   virtual ~NSFileProviderExtension() = default;
 
@@ -98,6 +112,25 @@ class NSFileProviderExtension {
   virtual void setFavoriteRank(std::optional<std::int64_t> rank,
                                const NSFileProviderItemIdentifier& forItemIdentifier,
                                ItemCompletion completionHandler);
+
+  // _defaultApplicationContainerForBundleIdentifier:completionHandler:
+  virtual void _defaultApplicationContainerForBundleIdentifier(
+      std::optional<std::string> bundleIdentifier, ItemCompletion completionHandler);
+
+  // Thumbnails. Both answer at once with a progress that cancels the batch; never null.
+  // fetchThumbnailsForItemIdentifiers:requestedSize:perThumbnailCompletionHandler:completionHandler:
+  virtual std::shared_ptr<NSProgress> fetchThumbnailsForItemIdentifiers(
+      const std::vector<NSFileProviderItemIdentifier>& identifiers, NSSize requestedSize,
+      ThumbnailHandler perThumbnailCompletionHandler, ErrorCompletion completionHandler);
+  // fetchThumbnailsForItemIdentifiers:requestedSize:perThumbnailCompletionHandlerWithType:completionHandler:
+  virtual std::shared_ptr<NSProgress> fetchThumbnailsForItemIdentifiersWithType(
+      const std::vector<NSFileProviderItemIdentifier>& identifiers, NSSize requestedSize,
+      ThumbnailWithTypeHandler perThumbnailCompletionHandlerWithType,
+      ErrorCompletion completionHandler);
+
+  // supportedServiceSourcesForItemIdentifier:error: synchronous.
+  virtual NSFileProviderServiceSources supportedServiceSourcesForItemIdentifier(
+      const NSFileProviderItemIdentifier& identifier, NSErrorOut error);
 
  protected:
   // The superclass's half of construction. False without attributes: an extension that
