@@ -95,8 +95,9 @@ class LocalDaemon : public VLDaemon {
 
   virtual void containers(Reply<std::vector<VLContainer::Properties>, NSErrorPtr> reply) = 0;
 
-  // `events` is called until the connection ends or `events` dies (held weakly by the
-  // caller's side only).
+  // `events` is called until the connection ends or `events` dies. Both sides hold it
+  // weakly: vald's core does, so the server keeps it alive while the connection lives;
+  // and the connection does, so the subscriber keeps its own.
   virtual void subscribe(std::shared_ptr<LocalDaemonEvents> events, Reply<NSErrorPtr> reply) = 0;
 
   virtual void status(Reply<LocalDaemonStatus, NSErrorPtr> reply) = 0;
