@@ -1,0 +1,173 @@
+#include "linux/protocol/DrivePaths.h"
+
+#include <fcntl.h>
+#include <pwd.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdint>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <memory>
+
+#include "vellum/VLErrors.h"
+
+namespace skein {
+namespace {
+
+constexpr std::size_t kLongestSocketPath = sizeof(sockaddr_un::sun_path) - 1;
+
+NSErrorPtr failure(int code, const std::string& what) {
+  return vl_errorWithPOSIXCode(code, what + ": " + std::strerror(code) + ".");
+}
+
+// The variable's value when it is an absolute path; others are to be ignored.
+std::string folderFromEnvironment(const char* variable) {
+  const char* value = std::getenv(variable);
+  return value != nullptr && value[0] == '/' ? value : std::string();
+}
+
+std::string homeFolder() {
+  std::string home = folderFromEnvironment("HOME");
+  if (home.empty()) {
+    passwd entry{};
+    passwd* found = nullptr;
+    char buffer[4096];
+    if (getpwuid_r(geteuid(), &entry, buffer, sizeof buffer, &found) == 0 && found != nullptr) {
+      home = found->pw_dir;
+    }
+  }
+  return home;
+}
+
+bool isFolder(const std::string& path) {
+  struct stat status {};
+  return stat(path.c_str(), &status) == 0 && S_ISDIR(status.st_mode);
+}
+
+// The session's runtime folder. Without one, a folder below /tmp stands in for it; it is
+// checked like every runtime folder before anything is put there.
+std::string runtimeBase() {
+  std::string base = folderFromEnvironment("XDG_RUNTIME_DIR");
+  if (!base.empty()) return base;
+  base = "/run/user/" + std::to_string(geteuid());
+  if (isFolder(base)) return base;
+  return "/tmp/skein-runtime-" + std::to_string(geteuid());
+}
+
+NSErrorPtr makeFolder(const std::string& path, mode_t mode) {
+  if (mkdir(path.c_str(), mode) == 0 || errno == EEXIST) return nullptr;
+  return failure(errno, "The folder " + path + " cannot be made");
+}
+
+NSErrorPtr makeFoldersAbove(const std::string& path) {
+  for (std::size_t end = path.find('/', 1); end != std::string::npos;
+       end = path.find('/', end + 1)) {
+    const std::string above = path.substr(0, end);
+    if (isFolder(above)) continue;
+    if (NSErrorPtr error = makeFolder(above, 0700)) return error;
+  }
+  return nullptr;
+}
+
+// A folder that nobody else may enter: made when it is missing, refused when it belongs
+// to somebody else or is no folder (a link is none), closed to others when it is open.
+NSErrorPtr makePrivateFolder(const std::string& path) {
+  if (NSErrorPtr error = makeFoldersAbove(path)) return error;
+  if (NSErrorPtr error = makeFolder(path, 0700)) return error;
+  struct stat status {};
+  if (lstat(path.c_str(), &status) != 0) return failure(errno, path + " cannot be looked at");
+  if (!S_ISDIR(status.st_mode)) return failure(ENOTDIR, path + " has to be a folder");
+  if (status.st_uid != geteuid()) {
+    return failure(EACCES, path + " belongs to another user (number " +
+                               std::to_string(status.st_uid) + "); set XDG_RUNTIME_DIR to a " +
+                               "folder of your own");
+  }
+  if ((status.st_mode & 077) != 0 && chmod(path.c_str(), 0700) != 0) {
+    return failure(errno, path + " cannot be closed to other users");
+  }
+  return nullptr;
+}
+
+// FNV-1a: the identifier has to be the same on every run, not hard to guess.
+std::string identifierOf(const std::string& store) {
+  std::uint64_t hash = 0xcbf29ce484222325U;
+  for (const char c : store) {
+    hash ^= static_cast<unsigned char>(c);
+    hash *= 0x100000001b3U;
+  }
+  char text[17];
+  std::snprintf(text, sizeof text, "%016llx", static_cast<unsigned long long>(hash));
+  return text;
+}
+
+NSErrorPtr resolveStore(const std::string& store, std::string& resolved) {
+  if (store.empty()) {
+    return vl_errorWithPOSIXCode(EINVAL,
+                                 "No drive was named: give --store FOLDER, or set SKEIN_STORE.");
+  }
+  const std::unique_ptr<char, decltype(&std::free)> real(realpath(store.c_str(), nullptr),
+                                                         &std::free);
+  if (real == nullptr) {
+    return failure(errno, "The drive's folder " + store + " cannot be opened");
+  }
+  if (!isFolder(real.get())) {
+    return failure(ENOTDIR, "The drive " + store + " has to be a folder");
+  }
+  resolved = real.get();
+  return nullptr;
+}
+
+NSErrorPtr fill(DrivePaths& paths, const std::string& store) {
+  std::string resolved;
+  if (NSErrorPtr error = resolveStore(store, resolved)) return error;
+
+  const std::string home = homeFolder();
+  std::string stateBase = folderFromEnvironment("XDG_STATE_HOME");
+  if (stateBase.empty() && !home.empty()) stateBase = home + "/.local/state";
+  std::string dataBase = folderFromEnvironment("XDG_DATA_HOME");
+  if (dataBase.empty() && !home.empty()) dataBase = home + "/.local/share";
+  if (stateBase.empty() || dataBase.empty()) {
+    return vl_errorWithPOSIXCode(ENOENT,
+                                 "There is no home folder to keep the drive's state in: set HOME.");
+  }
+
+  paths.driveID = identifierOf(resolved);
+  const std::string runtimeTop = runtimeBase() + "/skein";
+  paths.runtimeDirectory = runtimeTop + '/' + paths.driveID;
+  paths.stateDirectory = stateBase + "/skein/" + paths.driveID;
+  paths.containersDirectory = dataBase + "/skein/" + paths.driveID + "/containers";
+  paths.daemonSocket = paths.runtimeDirectory + "/vald.socket";
+  paths.hostSocket = paths.runtimeDirectory + "/skein-host.socket";
+  paths.database = paths.stateDirectory + "/index.sqlite";
+  paths.daemonLog = paths.stateDirectory + "/vald.log";
+  paths.hostLog = paths.stateDirectory + "/skein-host.log";
+  if (paths.hostSocket.size() > kLongestSocketPath) {
+    return failure(ENAMETOOLONG, "The socket path " + paths.hostSocket + " is longer than " +
+                                     std::to_string(kLongestSocketPath) +
+                                     " bytes; set XDG_RUNTIME_DIR to a folder with a shorter path");
+  }
+
+  for (const std::string& folder : {runtimeTop, paths.runtimeDirectory, stateBase + "/skein",
+                                    paths.stateDirectory, paths.containersDirectory}) {
+    if (NSErrorPtr error = makePrivateFolder(folder)) return error;
+  }
+  paths.store = std::move(resolved);
+  return nullptr;
+}
+
+}  // namespace
+
+DrivePaths DrivePaths::forStore(const std::string& store, NSErrorOut error) {
+  DrivePaths paths;
+  if (NSErrorPtr problem = fill(paths, store)) {
+    error.store(std::move(problem));
+    paths.store.clear();
+  }
+  return paths;
+}
+
+}  // namespace skein

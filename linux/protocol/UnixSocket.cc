@@ -1,0 +1,79 @@
+#include "linux/protocol/UnixSocket.h"
+
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstring>
+
+#include "vellum/VLErrors.h"
+
+namespace skein {
+namespace {
+
+constexpr int kBacklog = 128;
+
+// False when the path is too long for a socket.
+bool addressFor(const std::string& path, sockaddr_un& address) {
+  if (path.size() >= sizeof address.sun_path) return false;
+  address.sun_family = AF_UNIX;
+  std::memcpy(address.sun_path, path.c_str(), path.size() + 1);
+  return true;
+}
+
+FileDescriptor newSocket() {
+  return FileDescriptor(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
+}
+
+}  // namespace
+
+FileDescriptor listenOnUnixSocket(const std::string& path, NSErrorOut error) {
+  const auto fail = [&](int code) {
+    error.store(vl_errorWithPOSIXCode(
+        code, "The socket " + path + " cannot be listened on: " + std::strerror(code) + "."));
+    return FileDescriptor();
+  };
+  sockaddr_un address{};
+  if (!addressFor(path, address)) return fail(ENAMETOOLONG);
+  FileDescriptor listener = newSocket();
+  if (!listener) return fail(errno);
+  if (unlink(path.c_str()) != 0 && errno != ENOENT) return fail(errno);
+  if (bind(listener.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
+    return fail(errno);
+  }
+  // Nobody can connect before listen(), so the mode is right from the first moment on.
+  if (chmod(path.c_str(), 0600) != 0) return fail(errno);
+  if (listen(listener.get(), kBacklog) != 0) return fail(errno);
+  return listener;
+}
+
+FileDescriptor connectToUnixSocket(const std::string& path, int& code) {
+  code = 0;
+  sockaddr_un address{};
+  if (!addressFor(path, address)) {
+    code = ENAMETOOLONG;
+    return {};
+  }
+  FileDescriptor connection = newSocket();
+  if (!connection ||
+      connect(connection.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
+    code = errno;
+    return {};
+  }
+  if (peerUserOfSocket(connection.get()) != geteuid()) {
+    code = EACCES;
+    return {};
+  }
+  return connection;
+}
+
+std::optional<uid_t> peerUserOfSocket(int descriptor) {
+  ucred peer{};
+  socklen_t length = sizeof peer;
+  if (getsockopt(descriptor, SOL_SOCKET, SO_PEERCRED, &peer, &length) != 0) return std::nullopt;
+  return peer.uid;
+}
+
+}  // namespace skein

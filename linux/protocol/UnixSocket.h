@@ -1,0 +1,27 @@
+// Unix sockets as plain descriptors: what needs no event loop.
+#pragma once
+
+#include <sys/types.h>
+
+#include <optional>
+#include <string>
+
+#include "linux/protocol/FileDescriptor.h"
+#include "platform/foundation/NSError.h"
+
+namespace skein {
+
+// A listening socket at `path`, mode 0600, close-on-exec, non-blocking. What stands at
+// the path is replaced: a process that calls this holds its program's lock file, so a
+// socket found there is stale. None, with an error that names the path and the cause.
+FileDescriptor listenOnUnixSocket(const std::string& path, NSErrorOut error);
+
+// Connects without waiting. None with an errno in `code`: ENOENT or ECONNREFUSED when
+// nobody listens, EAGAIN when the listener does not accept, EACCES when the listener is
+// a process of another user.
+FileDescriptor connectToUnixSocket(const std::string& path, int& code);
+
+// Who is at the other end; nothing when that cannot be told.
+std::optional<uid_t> peerUserOfSocket(int descriptor);
+
+}  // namespace skein
