@@ -17,6 +17,8 @@ inline constexpr std::int64_t VLVellumErrorInvalidParameter = 15;
 inline constexpr std::int64_t VLVellumErrorUnknownShare = 20;
 // The connection to vald broke, or vald does not answer.
 inline constexpr std::int64_t VLVellumErrorDaemonUnreachable = 30;
+// Changes were too many to be told one by one: the folder must be listed afresh.
+inline constexpr std::int64_t VLVellumErrorChangesLost = 31;
 
 // "Nobody is logged in": VLVellumErrorNotAuthenticated.
 NSErrorPtr vlc_errorLoggedOut();

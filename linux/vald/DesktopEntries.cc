@@ -1,0 +1,136 @@
+#include "linux/vald/DesktopEntries.h"
+
+#include <glib.h>
+
+#include <algorithm>
+#include <cstdint>
+#include <filesystem>
+#include <map>
+#include <memory>
+#include <set>
+#include <system_error>
+
+#include "vellum/VLContainer.h"
+
+namespace skein::vald {
+namespace {
+
+namespace fs = std::filesystem;
+
+constexpr char kGroup[] = G_KEY_FILE_DESKTOP_GROUP;
+constexpr char kContainersKey[] = "X-Skein-Containers";
+constexpr std::size_t kLongestID = 128;
+constexpr std::size_t kMostContainers = 1000;
+constexpr std::uintmax_t kLargestEntry = 1 << 20;
+constexpr int kDeepestFolder = 8;
+
+using KeyFile = std::unique_ptr<GKeyFile, decltype(&g_key_file_unref)>;
+using Text = std::unique_ptr<char, decltype(&g_free)>;
+using Texts = std::unique_ptr<char*, decltype(&g_strfreev)>;
+
+struct Claim {
+  std::vector<std::string> containerIDs;
+  std::string name;
+  std::optional<std::string> icon;
+};
+
+std::optional<std::string> localText(GKeyFile* file, const char* key) {
+  const Text text(g_key_file_get_locale_string(file, kGroup, key, nullptr, nullptr), g_free);
+  if (!text || *text == '\0') return std::nullopt;
+  return std::string(text.get());
+}
+
+// What one desktop entry claims; nothing for one that is hidden or unreadable.
+Claim readEntry(const fs::path& path) {
+  std::error_code failure;
+  if (!fs::is_regular_file(path, failure) || fs::file_size(path, failure) > kLargestEntry) {
+    return {};
+  }
+  const KeyFile file(g_key_file_new(), g_key_file_unref);
+  if (!g_key_file_load_from_file(file.get(), path.c_str(), G_KEY_FILE_NONE, nullptr)) return {};
+  if (g_key_file_get_boolean(file.get(), kGroup, G_KEY_FILE_DESKTOP_KEY_HIDDEN, nullptr)) return {};
+  const Texts ids(g_key_file_get_string_list(file.get(), kGroup, kContainersKey, nullptr, nullptr),
+                  g_strfreev);
+  if (!ids) return {};
+
+  Claim claim;
+  for (char** id = ids.get(); *id != nullptr; ++id) {
+    if (isAppContainerID(*id)) claim.containerIDs.emplace_back(*id);
+  }
+  claim.name = localText(file.get(), G_KEY_FILE_DESKTOP_KEY_NAME).value_or("");
+  claim.icon = localText(file.get(), G_KEY_FILE_DESKTOP_KEY_ICON);
+  return claim;
+}
+
+// The entries below `folder`: the name that the desktop knows each by (its path, with a
+// dash for each separator) and where it is.
+std::map<std::string, fs::path> entriesInFolder(const std::string& folder) {
+  std::map<std::string, fs::path> entries;
+  std::error_code failure;
+  fs::recursive_directory_iterator entry(folder, fs::directory_options::skip_permission_denied,
+                                         failure);
+  for (; !failure && entry != fs::recursive_directory_iterator(); entry.increment(failure)) {
+    if (entry.depth() >= kDeepestFolder) entry.disable_recursion_pending();
+    if (entry->path().extension() != ".desktop") continue;
+    std::string name = entry->path().lexically_relative(folder).native();
+    std::replace(name.begin(), name.end(), '/', '-');
+    entries.emplace(std::move(name), entry->path());
+  }
+  return entries;
+}
+
+// A display name is a name in the drive's root.
+std::string asFileName(std::string name, const std::string& containerID) {
+  std::replace(name.begin(), name.end(), '/', '-');
+  return name.empty() || name.front() == '.' ? containerID : name;
+}
+
+}  // namespace
+
+bool isAppContainerID(const std::string& id) {
+  const bool plain = std::all_of(id.begin(), id.end(), [](char c) {
+    const auto byte = static_cast<unsigned char>(c);
+    return byte > 0x20 && byte != 0x7F && byte != '/';
+  });
+  return plain && !id.empty() && id.size() <= kLongestID && id.front() != '.' &&
+         id != VLUbiquitousDefaultContainerID && id != VLUbiquitousDocumentsContainerID &&
+         id != VLUbiquitousDesktopContainerID;
+}
+
+std::vector<std::string> applicationFolders() {
+  std::vector<std::string> folders{std::string(g_get_user_data_dir()) + "/applications"};
+  for (const char* const* folder = g_get_system_data_dirs(); *folder != nullptr; ++folder) {
+    folders.push_back(std::string(*folder) + "/applications");
+  }
+  return folders;
+}
+
+std::vector<AppContainer> appContainersInFolders(const std::vector<std::string>& folders) {
+  std::set<std::string> seenEntries;
+  std::map<std::string, AppContainer> byID;
+  for (const std::string& folder : folders) {
+    for (const auto& [entryName, path] : entriesInFolder(folder)) {
+      if (!seenEntries.insert(entryName).second) continue;
+      const Claim claim = readEntry(path);
+      for (const std::string& id : claim.containerIDs) {
+        if (byID.size() < kMostContainers) {
+          byID.try_emplace(id, AppContainer{id, asFileName(claim.name, id), claim.icon});
+        }
+      }
+    }
+  }
+
+  std::vector<AppContainer> containers;
+  std::set<std::string> seenNames;
+  for (auto& [id, container] : byID) {
+    // Two apps of one name, or one app with two containers, are told apart.
+    if (!seenNames.insert(container.displayName).second) {
+      container.displayName += " (" + id + ")";
+      seenNames.insert(container.displayName);
+    }
+    containers.push_back(std::move(container));
+  }
+  return containers;
+}
+
+}  // namespace skein::vald
