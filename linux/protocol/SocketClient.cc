@@ -1,0 +1,357 @@
+#include "linux/protocol/SocketClient.h"
+
+#include <cerrno>
+#include <cstring>
+#include <list>
+#include <map>
+#include <utility>
+#include <vector>
+
+#include "base/Fault.h"
+#include "linux/protocol/RpcConnection.h"
+#include "linux/protocol/UnixSocket.h"
+#include "vellum/VLErrors.h"
+
+namespace skein {
+namespace {
+
+// How long a peer that let a deadline pass has to answer a probe.
+constexpr auto kProbeTime = 500 * kj::MILLISECONDS;
+// How often a peer is probed while it takes its time.
+constexpr auto kBetweenProbes = 500 * kj::MILLISECONDS;
+
+}  // namespace
+
+// Lives on the loop's thread.
+struct SocketClient::Core final : std::enable_shared_from_this<Core>,
+                                  private kj::TaskSet::ErrorHandler {
+  // A message under way. It fails at most once, and only while it is not answered.
+  struct Message {
+    Fail fail;  // empty: answered, or failed
+    std::uint64_t connection = 0;
+    kj::Canceler canceler;
+    std::list<std::shared_ptr<Message>>::iterator place;
+  };
+  using MessagePtr = std::shared_ptr<Message>;
+
+  Core(std::shared_ptr<RpcLoop> rpcLoop, std::shared_ptr<Executor> runner, Options settings)
+      : loop(std::move(rpcLoop)),
+        executor(std::move(runner)),
+        options(std::move(settings)),
+        tasks(*this) {}
+  ~Core() { close(); }
+
+  kj::Promise<NSErrorPtr> connected();
+  kj::Promise<NSErrorPtr> connect();
+  NSErrorPtr connectNow(int& code);
+  kj::Promise<NSErrorPtr> startProgramAndConnect();
+  void lose(const NSErrorPtr& error);
+  void close();
+
+  MessagePtr newMessage(Fail fail);
+  void run(const MessagePtr& message, kj::Promise<Task> sending, Patience patience);
+  kj::Promise<void> deadlineOf(const MessagePtr& message, Patience patience);
+  kj::Promise<void> probeForEver(std::uint64_t number);
+  kj::Promise<void> probe(std::uint64_t number, kj::Duration time);
+  void finish(const MessagePtr& message, const NSErrorPtr& error);
+  NSErrorPtr errorFor(const kj::Exception& exception) const;
+  NSErrorPtr unreachable(const std::string& what) const;
+  NSErrorPtr deadlineError() const;
+  NSErrorPtr lostError() const;
+  void taskFailed(kj::Exception&& exception) override;
+
+  const std::shared_ptr<RpcLoop> loop;
+  const std::shared_ptr<Executor> executor;
+  const Options options;
+  std::function<void()> connectedHandler;
+
+  // The connection, and while there is none, why the last one ended.
+  kj::Own<RpcConnection> connection;
+  kj::Maybe<capnp::Capability::Client> server;
+  std::uint64_t number = 0;
+  NSErrorPtr lastError;
+  NSErrorPtr closed;  // set for good by close()
+  kj::Promise<void> ending = nullptr;
+  bool connecting = false;
+  kj::ForkedPromise<NSErrorPtr> connectingNow = nullptr;
+
+  std::list<MessagePtr> messages;
+  struct Watcher {
+    std::uint64_t connection;
+    Lost lost;
+  };
+  std::map<std::uint64_t, Watcher> watchers;
+  std::uint64_t lastWatcher = 0;
+  kj::TaskSet tasks;
+};
+
+NSErrorPtr SocketClient::Core::unreachable(const std::string& what) const {
+  std::string text = options.peer + ' ' + what;
+  if (options.program && !options.program->logPath.empty()) {
+    text += " Its log is " + options.program->logPath + ".";
+  }
+  return vl_errorDaemonUnreachable(text);
+}
+
+NSErrorPtr SocketClient::Core::deadlineError() const {
+  return unreachable("did not answer within " + std::to_string(options.deadline.count()) +
+                     " ms; it is stopped or too busy.");
+}
+
+NSErrorPtr SocketClient::Core::lostError() const {
+  return unreachable("closed the connection; it has ended or was restarted. Try again.");
+}
+
+NSErrorPtr SocketClient::Core::errorFor(const kj::Exception& exception) const {
+  switch (exception.getType()) {
+    case kj::Exception::Type::DISCONNECTED: return lostError();
+    case kj::Exception::Type::UNIMPLEMENTED:
+      return unreachable(
+          "does not know this request; it is of another version. Stop it and try "
+          "again.");
+    default:
+      return unreachable("gave no answer: " + std::string(exception.getDescription().cStr()) + ".");
+  }
+}
+
+// --- The connection.
+
+kj::Promise<NSErrorPtr> SocketClient::Core::connected() {
+  if (closed) return closed;
+  if (connection.get() != nullptr) return NSErrorPtr();
+  if (!connecting) {
+    connecting = true;
+    connectingNow = connect()
+                        .then([this](NSErrorPtr error) {
+                          connecting = false;
+                          return error;
+                        })
+                        .fork();
+  }
+  return connectingNow.addBranch();
+}
+
+kj::Promise<NSErrorPtr> SocketClient::Core::connect() {
+  int code = 0;
+  NSErrorPtr error = connectNow(code);
+  if (!error || !options.program || (code != ENOENT && code != ECONNREFUSED)) return error;
+  return startProgramAndConnect();
+}
+
+NSErrorPtr SocketClient::Core::connectNow(int& code) {
+  FileDescriptor socket = connectToUnixSocket(options.socketPath, code);
+  if (!socket) {
+    const bool notThere = code == ENOENT || code == ECONNREFUSED;
+    return unreachable(notThere ? "does not run."
+                                : "cannot be reached at " + options.socketPath + ": " +
+                                      std::strerror(code) + ".");
+  }
+  connection = kj::heap<RpcConnection>(loop->io(), std::move(socket), RpcLimits::ofClient());
+  server = connection->bootstrap();
+  const std::uint64_t mine = ++number;
+  ending = connection->onEnd()
+               .then([this, mine] {
+                 // Not from inside the connection's own promise.
+                 tasks.add(kj::evalLater([this, mine] {
+                   if (number == mine && connection.get() != nullptr) lose(lostError());
+                 }));
+               })
+               .eagerlyEvaluate(nullptr);
+  if (connectedHandler) executor->post([handler = connectedHandler] { handler(); });
+  return nullptr;
+}
+
+kj::Promise<NSErrorPtr> SocketClient::Core::startProgramAndConnect() {
+  auto paf = kj::newPromiseAndFulfiller<NSErrorPtr>();
+  auto fulfiller =
+      loop->own(std::make_unique<kj::Own<kj::PromiseFulfiller<NSErrorPtr>>>(kj::mv(paf.fulfiller)));
+  executor->post([fulfiller = std::move(fulfiller), program = *options.program, loop = loop,
+                  executor = executor] {
+    ScopedWait wait(*executor);
+    NSErrorPtr error = startProgram(program);
+    loop->post([fulfiller, error = std::move(error)]() mutable {
+      (*fulfiller)->fulfill(std::move(error));
+    });
+  });
+  return paf.promise.then([this](NSErrorPtr error) {
+    int code = 0;
+    if (closed) return closed;
+    return error ? error : connectNow(code);
+  });
+}
+
+void SocketClient::Core::lose(const NSErrorPtr& error) {
+  const std::uint64_t lost = number;
+  lastError = error;
+  std::vector<MessagePtr> failing;
+  for (const MessagePtr& message : messages) {
+    if (message->connection == lost) failing.push_back(message);
+  }
+  for (const MessagePtr& message : failing) {
+    finish(message, error);
+    message->canceler.cancel("the connection was lost");
+  }
+  std::vector<Lost> told;
+  for (auto at = watchers.begin(); at != watchers.end();) {
+    if (at->second.connection == lost) {
+      told.push_back(std::move(at->second.lost));
+      at = watchers.erase(at);
+    } else {
+      ++at;
+    }
+  }
+  for (Lost& watcher : told) watcher(error);
+  server = nullptr;
+  ending = nullptr;
+  connection = nullptr;
+}
+
+void SocketClient::Core::close() {
+  const NSErrorPtr error = vl_errorDaemonUnreachable("The connection to " + options.peer +
+                                                     " was closed by this program.");
+  closed = error;
+  if (connection.get() != nullptr) lose(error);
+  while (!messages.empty()) {
+    const MessagePtr message = messages.front();
+    finish(message, error);
+    message->canceler.cancel("the client was closed");
+  }
+}
+
+// --- Messages.
+
+SocketClient::Core::MessagePtr SocketClient::Core::newMessage(Fail fail) {
+  auto message = std::make_shared<Message>();
+  message->fail = std::move(fail);
+  message->place = messages.insert(messages.end(), message);
+  return message;
+}
+
+void SocketClient::Core::finish(const MessagePtr& message, const NSErrorPtr& error) {
+  if (!message->fail) return;
+  Fail fail = std::exchange(message->fail, nullptr);
+  messages.erase(message->place);
+  if (!error) return;
+  executor->post([fail = std::move(fail), error]() mutable { fail(error); });
+}
+
+void SocketClient::Core::run(const MessagePtr& message, kj::Promise<Task> sending,
+                             Patience patience) {
+  auto answered = sending.then([this, message](Task handOn) {
+    if (!message->fail) return;
+    finish(message, nullptr);
+    executor->post(std::move(handOn));
+  });
+  tasks.add(message->canceler.wrap(answered.exclusiveJoin(deadlineOf(message, patience)))
+                .catch_([this, message](kj::Exception&& exception) {
+                  finish(message, errorFor(exception));
+                }));
+}
+
+kj::Promise<void> SocketClient::Core::deadlineOf(const MessagePtr& message, Patience patience) {
+  auto& timer = loop->io().timer;
+  const auto time = options.deadline.count() * kj::MILLISECONDS;
+  if (patience == Patience::Deadline) {
+    return timer.afterDelay(time).then([this, message] {
+      finish(message, deadlineError());
+      const std::uint64_t suspect = message->connection;
+      if (suspect == number && connection.get() != nullptr) {
+        tasks.add(probe(suspect, kProbeTime));
+      }
+    });
+  }
+  return timer.afterDelay(kBetweenProbes).then([this, message] {
+    return probeForEver(message->connection);
+  });
+}
+
+// Loses the connection when the peer's loop does not answer in time.
+kj::Promise<void> SocketClient::Core::probe(std::uint64_t suspect, kj::Duration time) {
+  if (suspect != number || connection.get() == nullptr) return kj::READY_NOW;
+  auto answer = connection->bootstrap().whenResolved().then([] { return true; },
+                                                            [](kj::Exception&&) { return true; });
+  auto late = loop->io().timer.afterDelay(time).then([] { return false; });
+  return answer.exclusiveJoin(kj::mv(late)).then([this, suspect](bool lives) {
+    if (lives) return;
+    tasks.add(kj::evalLater([this, suspect] {
+      if (number == suspect && connection.get() != nullptr) lose(deadlineError());
+    }));
+  });
+}
+
+kj::Promise<void> SocketClient::Core::probeForEver(std::uint64_t suspect) {
+  const auto time = options.deadline.count() * kj::MILLISECONDS - kBetweenProbes;
+  return probe(suspect, time).then([this, suspect] {
+    return loop->io().timer.afterDelay(kBetweenProbes).then([this, suspect] {
+      return probeForEver(suspect);
+    });
+  });
+}
+
+void SocketClient::Core::taskFailed(kj::Exception&& exception) {
+  reportFault(std::string("a message's promise failed: ") + exception.getDescription().cStr());
+}
+
+// --- The face.
+
+SocketClient::SocketClient(std::shared_ptr<RpcLoop> loop, std::shared_ptr<Executor> executor,
+                           Options options)
+    : _loop(loop),
+      _executor(executor),
+      _core(loop->own(std::make_unique<Core>(loop, executor, std::move(options)))) {}
+
+SocketClient::~SocketClient() { close(); }
+
+void SocketClient::close() {
+  _loop->post([core = _core] { core->close(); });
+}
+
+void SocketClient::setConnectedHandler(std::function<void()> handler) {
+  _loop->post([core = _core, handler = std::move(handler)]() mutable {
+    core->connectedHandler = std::move(handler);
+  });
+}
+
+void SocketClient::send(Send send, Fail fail, Patience patience) {
+  _loop->post([core = _core.get(), keep = _core, send = std::move(send), fail = std::move(fail),
+               patience]() mutable {
+    auto message = core->newMessage(std::move(fail));
+    auto sending = core->connected().then(
+        [core, message, send = std::move(send)](NSErrorPtr error) mutable -> kj::Promise<Task> {
+          if (error) {
+            core->finish(message, error);
+            return Task();
+          }
+          message->connection = core->number;
+          return send(KJ_ASSERT_NONNULL(core->server));
+        });
+    core->run(message, kj::mv(sending), patience);
+  });
+}
+
+std::uint64_t SocketClient::currentConnection() const { return _core->number; }
+
+void SocketClient::sendOver(std::uint64_t number, UniqueFunction<kj::Promise<Task>()> send,
+                            Fail fail, Patience patience) {
+  auto message = _core->newMessage(std::move(fail));
+  message->connection = number;
+  if (number != _core->number || _core->connection.get() == nullptr) {
+    _core->finish(message, _core->lastError ? _core->lastError : _core->lostError());
+    return;
+  }
+  _core->run(message, kj::evalNow([&] { return send(); }), patience);
+}
+
+std::uint64_t SocketClient::whenLost(std::uint64_t number, Lost lost) {
+  const std::uint64_t key = ++_core->lastWatcher;
+  if (number != _core->number || _core->connection.get() == nullptr) {
+    lost(_core->lastError ? _core->lastError : _core->lostError());
+    return key;
+  }
+  _core->watchers.emplace(key, Core::Watcher{number, std::move(lost)});
+  return key;
+}
+
+void SocketClient::forget(std::uint64_t key) { _core->watchers.erase(key); }
+
+}  // namespace skein

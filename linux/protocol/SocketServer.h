@@ -1,0 +1,58 @@
+#pragma once
+
+#include <capnp/capability.h>
+
+#include <chrono>
+#include <cstddef>
+#include <functional>
+#include <memory>
+#include <string>
+
+#include "linux/protocol/RpcLoop.h"
+#include "platform/foundation/NSError.h"
+#include "platform/log/Log.h"
+
+namespace skein {
+
+// Listens on a Unix socket and serves an object to each peer that runs as this user.
+//
+// Any peer may misbehave: what cannot be parsed, is too long or never ends its calls
+// closes that connection and nothing else. There is an upper bound to connections; when
+// it is reached, the one that has been silent for longest makes room, first of all one
+// that never spoke.
+class SocketServer {
+ public:
+  // Makes the object for one connection; called on the loop's thread. The connection
+  // holds it, and releases it (there) when it ends.
+  using Bootstrap = std::function<capnp::Capability::Client()>;
+
+  struct Options {
+    std::size_t mostConnections = 64;
+    // A connection that says nothing for so long from its start is closed.
+    std::chrono::milliseconds firstMessage{5000};
+  };
+
+  // Listens from now on. Null with an error that names the path. Any thread but the
+  // loop's. `log` has to outlive the server.
+  static std::shared_ptr<SocketServer> listen(const std::shared_ptr<RpcLoop>& loop,
+                                              const std::string& path, Bootstrap bootstrap,
+                                              Log& log, Options options, NSErrorOut error);
+
+  // Closes the socket and every connection, soon, and removes the socket's file.
+  ~SocketServer();
+  SocketServer(const SocketServer&) = delete;
+  SocketServer& operator=(const SocketServer&) = delete;
+
+  // Closes every connection there is; new ones are accepted. Any thread.
+  void dropConnections();
+
+ private:
+  struct Core;
+  SocketServer(std::shared_ptr<RpcLoop> loop, std::string path, std::shared_ptr<Core> core);
+
+  std::shared_ptr<RpcLoop> _loop;
+  const std::string _path;
+  std::shared_ptr<Core> _core;
+};
+
+}  // namespace skein
