@@ -10,9 +10,10 @@
 #include "platform/fileprovider/NSFileProviderExtension.h"
 #include "platform/foundation/NSOperation.h"
 #include "support/Environment.h"
-#include "vellum/VLFileProvidingOperation.h"
 
 namespace skein {
+
+class VLFileProvidingOperation;
 
 // The extension's principal class: what a host instantiates by name and calls from its
 // own threads, several operations at once. Every operation is one line that hands it to

@@ -1,0 +1,108 @@
+#include "tests/support/ScriptedDaemon.h"
+
+#include "platform/log/Description.h"
+
+namespace skein {
+
+class ScriptedSender::Proxy final : public VLItemNotificationSending {
+ public:
+  Proxy(std::shared_ptr<ScriptedSender> sender, ErrorHandler errorHandler)
+      : _sender(std::move(sender)), _errorHandler(std::move(errorHandler)) {}
+  void boostPriority(Reply<> reply) override { _sender->boost(std::move(reply), _errorHandler); }
+  void watchItemAtURL(const NSURLPtr& url, std::uint64_t options,
+                      Reply<NSErrorPtr> reply) override {
+    _sender->watch(url, options, std::move(reply), _errorHandler);
+  }
+  void invalidate() override { _sender->invalidate(); }
+
+ private:
+  const std::shared_ptr<ScriptedSender> _sender;
+  const ErrorHandler _errorHandler;
+};
+
+std::shared_ptr<VLItemNotificationSending> ScriptedSender::remoteObjectProxyWithErrorHandler(
+    std::function<void(NSErrorPtr)> errorHandler) {
+  return std::make_shared<Proxy>(shared_from_this(), std::move(errorHandler));
+}
+
+void ScriptedSender::invalidate() {
+  _transcript.add(_name + " invalidate");
+  receiver = nullptr;
+}
+
+void ScriptedSender::boost(Reply<> reply, ErrorHandler errorHandler) {
+  _transcript.add(_name + " boostPriority");
+  boosts.hold(std::move(reply), std::move(errorHandler));
+}
+
+void ScriptedSender::watch(const NSURLPtr& url, std::uint64_t options, Reply<NSErrorPtr> reply,
+                           ErrorHandler errorHandler) {
+  _transcript.add(_name + " watch " + description(url) + " " + std::to_string(options));
+  watches.hold(std::move(reply), std::move(errorHandler));
+}
+
+class ScriptedDaemon::Proxy final : public VLDaemon {
+ public:
+  Proxy(ScriptedDaemon& daemon, ErrorHandler errorHandler)
+      : _daemon(daemon), _errorHandler(std::move(errorHandler)) {}
+
+  void enumerateItemsInFolder(std::optional<VLFileObjectID> folder, std::uint8_t sortOrder,
+                              std::uint64_t offset, std::uint64_t limit,
+                              ItemsReply completion) override {
+    say("items in " + description(folder) + page(sortOrder, offset, limit));
+    _daemon.pages.hold(std::move(completion), _errorHandler);
+  }
+  void enumerateAllFoldersWithSortOrder(std::uint8_t sortOrder, std::uint64_t offset,
+                                        std::uint64_t limit, ItemsReply completion) override {
+    say("all folders" + page(sortOrder, offset, limit));
+    _daemon.folderPages.hold(std::move(completion), _errorHandler);
+  }
+  void currentNotifRankWithReply(Reply<std::uint64_t, NSErrorPtr> reply) override {
+    say("rank");
+    _daemon.ranks.hold(std::move(reply), _errorHandler);
+  }
+  void enumerateWorkingSetChangesFromChangeToken(
+      std::optional<NSData> changeToken, std::uint64_t limit,
+      Reply<NSFileProviderItems, std::vector<VLFileObjectID>, std::optional<NSData>, NSErrorPtr>
+          completion) override {
+    say("working set from " + (changeToken ? std::string(changeToken->view()) : "nil") + " limit " +
+        std::to_string(limit));
+    _daemon.workingSetChanges.hold(std::move(completion), _errorHandler);
+  }
+  void getItemUpdateSenderWithReceiver(
+      std::shared_ptr<VLItemNotificationReceiving> receiver,
+      Reply<std::shared_ptr<VLItemNotificationSender>, NSErrorPtr> reply) override {
+    say("sender");
+    _daemon.senders.hold(
+        [receiver = std::move(receiver), reply = std::move(reply)](
+            std::shared_ptr<VLItemNotificationSender> sender, NSErrorPtr error) mutable {
+          if (auto* own = dynamic_cast<ScriptedSender*>(sender.get())) {
+            own->receiver = std::move(receiver);
+          }
+          reply(std::move(sender), std::move(error));
+        },
+        _errorHandler);
+  }
+
+ private:
+  void say(const std::string& call) { _daemon._transcript.add("daemon: " + call); }
+  static std::string page(std::uint8_t sortOrder, std::uint64_t offset, std::uint64_t limit) {
+    return " order " + std::to_string(sortOrder) + " offset " + std::to_string(offset) + " limit " +
+           std::to_string(limit);
+  }
+
+  ScriptedDaemon& _daemon;
+  const ErrorHandler _errorHandler;
+};
+
+std::shared_ptr<VLDaemon> ScriptedDaemon::remoteObjectProxyWithErrorHandler(
+    std::function<void(NSErrorPtr)> errorHandler) {
+  return std::make_shared<Proxy>(*this, std::move(errorHandler));
+}
+
+std::shared_ptr<ScriptedSender> ScriptedDaemon::makeSender() {
+  return std::make_shared<ScriptedSender>("sender " + std::to_string(++_senders), _transcript,
+                                          _ledger);
+}
+
+}  // namespace skein

@@ -1,0 +1,79 @@
+#pragma once
+
+#include <atomic>
+#include <memory>
+#include <string>
+
+#include "tests/support/HeldCalls.h"
+#include "tests/support/Transcript.h"
+#include "vellum/VLDaemonConnection.h"
+
+namespace skein {
+
+// An item-update sender of the scripted daemon's. Like the daemon it holds its receiver
+// until it is invalidated or dies.
+class ScriptedSender final : public VLItemNotificationSender,
+                             public std::enable_shared_from_this<ScriptedSender> {
+ public:
+  // `name` stands in the transcript's lines.
+  ScriptedSender(std::string name, Transcript& transcript, CallLedger& ledger)
+      : boosts(ledger), watches(ledger), _name(std::move(name)), _transcript(transcript) {}
+
+  std::shared_ptr<VLItemNotificationSending> remoteObjectProxyWithErrorHandler(
+      std::function<void(NSErrorPtr)> errorHandler) override;
+  void boostPriority(Reply<> reply) override { boost(std::move(reply), nullptr); }
+  void watchItemAtURL(const NSURLPtr& url, std::uint64_t options,
+                      Reply<NSErrorPtr> gatherReply) override {
+    watch(url, options, std::move(gatherReply), nullptr);
+  }
+  void invalidate() override;
+
+  HeldCalls<> boosts;
+  HeldCalls<NSErrorPtr> watches;
+  std::shared_ptr<VLItemNotificationReceiving> receiver;
+
+ private:
+  class Proxy;
+  void boost(Reply<> reply, ErrorHandler errorHandler);
+  void watch(const NSURLPtr& url, std::uint64_t options, Reply<NSErrorPtr> reply,
+             ErrorHandler errorHandler);
+
+  const std::string _name;
+  Transcript& _transcript;
+};
+
+// The daemon and the connection to it. Calls go into the transcript with their arguments
+// and are held. Any thread.
+class ScriptedDaemon final : public VLDaemonConnection {
+ public:
+  ScriptedDaemon(Transcript& transcript, CallLedger& ledger)
+      : pages(ledger),
+        folderPages(ledger),
+        ranks(ledger),
+        workingSetChanges(ledger),
+        senders(ledger),
+        _transcript(transcript),
+        _ledger(ledger) {}
+
+  std::shared_ptr<VLDaemon> remoteObjectProxyWithErrorHandler(
+      std::function<void(NSErrorPtr)> errorHandler) override;
+
+  // A sender to answer `senders` with, named "sender N" from 1 on.
+  std::shared_ptr<ScriptedSender> makeSender();
+
+  HeldCalls<NSFileProviderItems, std::uint64_t, NSErrorPtr> pages;
+  HeldCalls<NSFileProviderItems, std::uint64_t, NSErrorPtr> folderPages;
+  HeldCalls<std::uint64_t, NSErrorPtr> ranks;
+  HeldCalls<NSFileProviderItems, std::vector<VLFileObjectID>, std::optional<NSData>, NSErrorPtr>
+      workingSetChanges;
+  HeldCalls<std::shared_ptr<VLItemNotificationSender>, NSErrorPtr> senders;
+
+ private:
+  class Proxy;
+
+  Transcript& _transcript;
+  CallLedger& _ledger;
+  std::atomic<int> _senders{0};
+};
+
+}  // namespace skein

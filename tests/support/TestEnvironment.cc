@@ -1,0 +1,34 @@
+#include "tests/support/TestEnvironment.h"
+
+#include <gtest/gtest.h>
+
+#include "vellum/VLErrors.h"
+
+namespace skein {
+
+TestEnvironment::TestEnvironment(std::shared_ptr<Executor> other)
+    : logSections(other ? other : executor),
+      environment{log,
+                  other ? std::move(other) : executor,
+                  notificationCenter,
+                  framework.manager,
+                  framework.accounts,
+                  framework.containers,
+                  framework.daemon,
+                  framework.documents,
+                  framework.queryItems,
+                  logSections,
+                  rootURL} {
+  framework.containers.add(VLUbiquitousDefaultContainerID, storeURL());
+  _previousFaultHandler =
+      setFaultHandler([](std::string_view text) { ADD_FAILURE() << "a fault: " << text; });
+}
+
+TestEnvironment::~TestEnvironment() {
+  do {
+    framework.ledger.drop(vl_errorDaemonUnreachable("the test has ended"));
+  } while (executor->runAll() > 0);
+  setFaultHandler(std::move(_previousFaultHandler));
+}
+
+}  // namespace skein
