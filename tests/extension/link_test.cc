@@ -23,7 +23,7 @@ TEST_F(Link, IsSetUpOnceWithoutWaitingForTheWatch) {
   EXPECT_EQ(env.transcript.take(), Lines{});
   EXPECT_EQ(env.run(), (Lines{"sender 1 boostPriority", "sender 1 watch file:///store/f 19",
                               "set up: no error"}));
-  EXPECT_EQ(sender->receiver, enumerator);
+  EXPECT_EQ(sender->receiver(), enumerator);
   setUp();
   EXPECT_EQ(env.run(), Lines{"set up: no error"});
   sender->watches.next()->reply(nullptr);
@@ -179,7 +179,7 @@ TEST_F(Link, TheEnumeratorDiesAfterInvalidateAndWithTheLastHolderWithoutIt) {
   EXPECT_FALSE(weak.expired()) << "the daemon holds its receiver";
   // The daemon's end of the link dies: nothing else may hold the enumerator.
   const auto boost = sender->boosts.next();
-  sender->receiver = nullptr;
+  sender->releaseReceiver();
   EXPECT_TRUE(weak.expired());
   boost->fail(kVellum9);
   EXPECT_EQ(env.runCalls(), Lines{});

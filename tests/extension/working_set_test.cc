@@ -91,7 +91,7 @@ TEST_F(WorkingSet, RepliesErrorsAreTranslatedTheConnectionsAreNot) {
   const NSErrorPtr connection = error(VLVellumErrorDomain, 2);
   const auto listing = list();
   const auto batch = changes(token("t"));
-  env.framework.ledger.drop(connection);
+  env.framework.dropConnection(connection);
   EXPECT_EQ(listing->error, connection);
   EXPECT_EQ(batch->error, connection);
   EXPECT_EQ(listing->finishes + batch->finishes, 2);

@@ -27,7 +27,18 @@ std::shared_ptr<VLItemNotificationSending> ScriptedSender::remoteObjectProxyWith
 
 void ScriptedSender::invalidate() {
   _transcript.add(_name + " invalidate");
-  receiver = nullptr;
+  releaseReceiver();
+}
+
+void ScriptedSender::holdReceiver(std::shared_ptr<VLItemNotificationReceiving> receiver) {
+  // The old one goes after the lock: it may hold this sender's last reference.
+  MutexLock lock(_mutex);
+  _receiver.swap(receiver);
+}
+
+std::shared_ptr<VLItemNotificationReceiving> ScriptedSender::receiver() const {
+  MutexLock lock(_mutex);
+  return _receiver;
 }
 
 void ScriptedSender::boost(Reply<> reply, ErrorHandler errorHandler) {
@@ -77,7 +88,7 @@ class ScriptedDaemon::Proxy final : public VLDaemon {
         [receiver = std::move(receiver), reply = std::move(reply)](
             std::shared_ptr<VLItemNotificationSender> sender, NSErrorPtr error) mutable {
           if (auto* own = dynamic_cast<ScriptedSender*>(sender.get())) {
-            own->receiver = std::move(receiver);
+            own->holdReceiver(std::move(receiver));
           }
           reply(std::move(sender), std::move(error));
         },
@@ -101,8 +112,22 @@ std::shared_ptr<VLDaemon> ScriptedDaemon::remoteObjectProxyWithErrorHandler(
 }
 
 std::shared_ptr<ScriptedSender> ScriptedDaemon::makeSender() {
-  return std::make_shared<ScriptedSender>("sender " + std::to_string(++_senders), _transcript,
-                                          _ledger);
+  MutexLock lock(_mutex);
+  auto sender = std::make_shared<ScriptedSender>("sender " + std::to_string(_senders.size() + 1),
+                                                 _transcript, _ledger);
+  _senders.push_back(sender);
+  return sender;
+}
+
+void ScriptedDaemon::releaseReceivers() {
+  std::vector<std::weak_ptr<ScriptedSender>> senders;
+  {
+    MutexLock lock(_mutex);
+    senders = _senders;
+  }
+  for (const auto& weak : senders) {
+    if (const auto sender = weak.lock()) sender->releaseReceiver();
+  }
 }
 
 }  // namespace skein

@@ -1,8 +1,8 @@
 #pragma once
 
-#include <atomic>
 #include <memory>
 #include <string>
+#include <vector>
 
 #include "tests/support/HeldCalls.h"
 #include "tests/support/Transcript.h"
@@ -28,9 +28,13 @@ class ScriptedSender final : public VLItemNotificationSender,
   }
   void invalidate() override;
 
+  void holdReceiver(std::shared_ptr<VLItemNotificationReceiving> receiver) SKEIN_EXCLUDES(_mutex);
+  // The daemon's end of the link died.
+  void releaseReceiver() { holdReceiver(nullptr); }
+  std::shared_ptr<VLItemNotificationReceiving> receiver() const SKEIN_EXCLUDES(_mutex);
+
   HeldCalls<> boosts;
   HeldCalls<NSErrorPtr> watches;
-  std::shared_ptr<VLItemNotificationReceiving> receiver;
 
  private:
   class Proxy;
@@ -40,6 +44,8 @@ class ScriptedSender final : public VLItemNotificationSender,
 
   const std::string _name;
   Transcript& _transcript;
+  mutable Mutex _mutex;
+  std::shared_ptr<VLItemNotificationReceiving> _receiver SKEIN_GUARDED_BY(_mutex);
 };
 
 // The daemon and the connection to it. Calls go into the transcript with their arguments
@@ -59,7 +65,10 @@ class ScriptedDaemon final : public VLDaemonConnection {
       std::function<void(NSErrorPtr)> errorHandler) override;
 
   // A sender to answer `senders` with, named "sender N" from 1 on.
-  std::shared_ptr<ScriptedSender> makeSender();
+  std::shared_ptr<ScriptedSender> makeSender() SKEIN_EXCLUDES(_mutex);
+
+  // The connection died: every sender lets go of its receiver.
+  void releaseReceivers() SKEIN_EXCLUDES(_mutex);
 
   HeldCalls<NSFileProviderItems, std::uint64_t, NSErrorPtr> pages;
   HeldCalls<NSFileProviderItems, std::uint64_t, NSErrorPtr> folderPages;
@@ -73,7 +82,8 @@ class ScriptedDaemon final : public VLDaemonConnection {
 
   Transcript& _transcript;
   CallLedger& _ledger;
-  std::atomic<int> _senders{0};
+  Mutex _mutex;
+  std::vector<std::weak_ptr<ScriptedSender>> _senders SKEIN_GUARDED_BY(_mutex);
 };
 
 }  // namespace skein

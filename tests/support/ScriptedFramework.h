@@ -125,6 +125,12 @@ struct ScriptedFramework {
         queryItems(transcript),
         manager(transcript, ledger) {}
 
+  // Every unanswered call's error handler runs, here, and receivers are let go of.
+  void dropConnection(const NSErrorPtr& error) {
+    ledger.drop(error);
+    daemon.releaseReceivers();
+  }
+
   CallLedger ledger;
   ScriptedAccounts accounts;
   ScriptedContainers containers;

@@ -26,7 +26,7 @@ TestEnvironment::TestEnvironment(std::shared_ptr<Executor> other)
 
 TestEnvironment::~TestEnvironment() {
   do {
-    framework.ledger.drop(vl_errorDaemonUnreachable("the test has ended"));
+    framework.dropConnection(vl_errorDaemonUnreachable("the test has ended"));
   } while (executor->runAll() > 0);
   setFaultHandler(std::move(_previousFaultHandler));
 }
