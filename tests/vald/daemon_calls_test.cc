@@ -1,0 +1,355 @@
+// What the daemon answers: listings, tokens, lookups, accounts, containers, faults.
+#include <unistd.h>
+
+#include <fstream>
+
+#include "linux/vald/ApplicationsWatcher.h"
+#include "linux/vald/ChangeToken.h"
+#include "linux/vald/FaultingDaemon.h"
+#include "platform/fileprovider/NSFileProviderError.h"
+#include "tests/vald/TestDaemon.h"
+#include "vellum/VLErrors.h"
+
+namespace skein::vald {
+namespace {
+
+struct Changes {
+  NSFileProviderItems updated;
+  std::vector<VLFileObjectID> deleted;
+  std::optional<NSData> token;
+  NSErrorPtr error;
+};
+
+class DaemonCalls : public testing::Test {
+ protected:
+  std::tuple<NSFileProviderItems, std::uint64_t, NSErrorPtr> list(
+      std::optional<VLFileObjectID> folder, std::uint8_t order, std::uint64_t offset,
+      std::uint64_t limit) {
+    return d.call<NSFileProviderItems, std::uint64_t, NSErrorPtr>(
+        [&](LocalDaemon& daemon, auto reply) {
+          daemon.enumerateItemsInFolder(folder, order, offset, limit, std::move(reply));
+        });
+  }
+  Changes changes(std::optional<NSData> token, std::uint64_t limit = 200) {
+    auto [updated, deleted, next, error] =
+        d.call<NSFileProviderItems, std::vector<VLFileObjectID>, std::optional<NSData>, NSErrorPtr>(
+            [&](LocalDaemon& daemon, auto reply) {
+              daemon.enumerateWorkingSetChangesFromChangeToken(token, limit, std::move(reply));
+            });
+    return {updated, deleted, next, error};
+  }
+  std::tuple<VLQueryItemPtr, NSErrorPtr> query(const std::string& path) {
+    return d.call<VLQueryItemPtr, NSErrorPtr>([&](LocalDaemon& daemon, auto reply) {
+      daemon.queryItemForURL(NSURL::fileURLWithPath(path), true, std::move(reply));
+    });
+  }
+  NSErrorPtr logIn(LocalAccount account) {
+    return std::get<0>(d.call<NSErrorPtr>(
+        [&](LocalDaemon& daemon, auto reply) { daemon.logIn(account, std::move(reply)); }));
+  }
+  void logOut() {
+    d.call<NSErrorPtr>([](LocalDaemon& daemon, auto reply) { daemon.logOut(std::move(reply)); });
+  }
+  std::optional<LocalAccount> account() {
+    return std::get<0>(d.call<std::optional<LocalAccount>, NSErrorPtr>(
+        [](LocalDaemon& daemon, auto reply) { daemon.account(std::move(reply)); }));
+  }
+  std::vector<VLContainer::Properties> containers() {
+    return std::get<0>(d.call<std::vector<VLContainer::Properties>, NSErrorPtr>(
+        [](LocalDaemon& daemon, auto reply) { daemon.containers(std::move(reply)); }));
+  }
+  void writeEntry(const std::string& name, const std::string& lines) {
+    std::ofstream(d.applications.path + '/' + name) << "[Desktop Entry]\n" << lines;
+  }
+
+  TestDaemon d;
+};
+
+bool isLoggedOut(const NSErrorPtr& error) {
+  return error && error->domain() == VLVellumErrorDomain && error->code() == 2;
+}
+bool isExpired(const NSErrorPtr& error) {
+  return error && error->domain() == NSFileProviderErrorDomain && error->code() == -1002;
+}
+
+// Hears what subscribers are told.
+class Events final : public LocalDaemonEvents {
+ public:
+  void accountDidChange(std::optional<LocalAccount> account) override {
+    accounts.push_back(std::move(account));
+  }
+  void containerListDidChange() override { ++containerChanges; }
+  std::vector<std::optional<LocalAccount>> accounts;
+  int containerChanges = 0;
+};
+
+TEST_F(DaemonCalls, ListsInBoundedPagesAndRefusesWhatMakesNoSense) {
+  for (int i = 0; i < 5; ++i) d.store->addFile("f" + std::to_string(i), d.store->root());
+  auto [items, next, error] = list(std::nullopt, 0, 0, 2);
+  EXPECT_EQ(items.size(), 2u);
+  EXPECT_EQ(next, 2u);
+  std::tie(items, next, error) = list(std::nullopt, 1, 4, 2);
+  EXPECT_EQ(items.size(), 1u);
+  EXPECT_EQ(next, 0u);
+  list(std::nullopt, 0, 0, 1'000'000);
+  EXPECT_EQ(d.store->lastLimit, 1000u);
+
+  EXPECT_TRUE(std::get<2>(list(std::nullopt, 2, 0, 200)));
+  EXPECT_TRUE(std::get<2>(list(std::nullopt, 0, 0, 0)));
+  EXPECT_TRUE(std::get<2>(list(std::nullopt, 0, ~0ULL, 200)));
+  EXPECT_TRUE(std::get<2>(list(VLFileObjectID::folderOrAliasWithRawID(99), 0, 0, 200)));
+}
+
+TEST_F(DaemonCalls, ChangesReplayFromAnyTokenUntilTheSameTokenComesBack) {
+  const Changes empty = changes(std::nullopt);
+  ASSERT_TRUE(empty.token);
+  EXPECT_GT(empty.token->length(), 17u);
+  EXPECT_EQ(changes(empty.token).token, empty.token);
+
+  const auto a = d.store->addFile("a", d.store->root());
+  const auto b = d.store->addFile("b", d.store->root());
+  d.store->touch(a);
+  d.store->remove(b);
+  const Changes first = changes(empty.token, 1);
+  ASSERT_EQ(first.updated.size(), 1u);
+  EXPECT_EQ(first.updated[0]->itemIdentifier(), a.asString());
+  EXPECT_NE(first.token, empty.token);
+  const Changes second = changes(first.token, 1);
+  EXPECT_EQ(second.deleted, std::vector<VLFileObjectID>{b});
+  EXPECT_EQ(changes(second.token).token, second.token);
+  const Changes whole = changes(std::nullopt);
+  EXPECT_EQ(whole.updated.size(), 1u);
+  EXPECT_EQ(whole.deleted.size(), 1u);
+  EXPECT_EQ(whole.token, second.token);
+
+  // The journal forgets: old tokens expire, the start of the history never does.
+  d.store->forgetUpTo(4);
+  EXPECT_TRUE(isExpired(changes(first.token).error));
+  EXPECT_FALSE(changes(second.token).error);
+  EXPECT_FALSE(changes(std::nullopt).error);
+}
+
+TEST_F(DaemonCalls, TokensOfAnotherJournalOrNoneOfOursAreExpired) {
+  d.store->addFile("a", d.store->root());
+  const NSData token = *changes(std::nullopt).token;
+  for (std::size_t at = 0; at < token.length(); ++at) {
+    std::vector<std::uint8_t> bytes(token.bytes(), token.bytes() + token.length());
+    bytes[at] ^= 0x80;
+    EXPECT_TRUE(isExpired(changes(NSData(bytes)).error)) << at;
+    bytes.resize(at);
+    EXPECT_TRUE(isExpired(changes(NSData(bytes)).error)) << at;
+  }
+  // An index that was put back from a copy has not come to this rank yet.
+  EXPECT_TRUE(isExpired(changes(changeTokenFromRank(2, d.store->journal)).error));
+  d.store->journal = "another";
+  EXPECT_TRUE(isExpired(changes(token).error));
+}
+
+TEST_F(DaemonCalls, LookupsStayInsideTheDriveAndFollowNoLinks) {
+  const auto folder = d.store->addFolder("folder", d.store->root());
+  d.store->addFile("x", folder);
+  std::filesystem::create_directory(d.drive.path + "/folder");
+  std::filesystem::create_directory_symlink("folder", d.drive.path + "/link");
+  d.store->addFile("x", d.store->addFolder("link", d.store->root()));
+
+  EXPECT_TRUE(std::get<0>(query(d.drive.path)));
+  EXPECT_TRUE(std::get<0>(query(d.drive.path + "/folder/x")));
+  for (const std::string path : {"/folder/missing", "/link/x", "/folder/../folder/x", "//folder",
+                                 "/./folder", "-beside/folder"}) {
+    const auto [item, error] = query(d.drive.path + path);
+    EXPECT_FALSE(item) << path;
+    ASSERT_TRUE(error) << path;
+    EXPECT_EQ(error->domain(), NSCocoaErrorDomain);
+    EXPECT_EQ(error->code(), NSFileNoSuchFileError);
+    EXPECT_FALSE(error->localizedDescription().empty());
+  }
+}
+
+TEST_F(DaemonCalls, AnAccountSurvivesAReopeningAndChangesAreTold) {
+  const auto first = account();
+  ASSERT_TRUE(first);
+  EXPECT_EQ(first->name, "somebody");
+  EXPECT_TRUE(first->perAppAccountIdentifier);
+  d.open();
+  EXPECT_EQ(account(), first);
+
+  auto events = std::make_shared<Events>();
+  d.call<NSErrorPtr>(
+      [&](LocalDaemon& daemon, auto reply) { daemon.subscribe(events, std::move(reply)); });
+  const LocalAccount plain{"A. B\xC3\xA9", std::nullopt};
+  EXPECT_FALSE(logIn(plain));
+  EXPECT_FALSE(logIn(plain));  // nothing new to tell
+  logOut();
+  logOut();
+  EXPECT_EQ(events->accounts, (std::vector<std::optional<LocalAccount>>{plain, std::nullopt}));
+  d.open();
+  EXPECT_EQ(account(), std::nullopt);
+  logIn(plain);
+  d.open();
+  EXPECT_EQ(account(), plain);
+  for (const std::string& name : {std::string(), std::string("a\nb"), std::string(256, 'a')}) {
+    EXPECT_TRUE(logIn({name, "x"}));
+    EXPECT_TRUE(logIn({"x", name}));
+  }
+  EXPECT_EQ(account(), plain);
+
+  d.settings["account"] = "in\n";
+  d.open();
+  EXPECT_EQ(account(), std::nullopt);
+  EXPECT_EQ(d.log.lines.size(), 1u);
+}
+
+TEST_F(DaemonCalls, LoggedOutEndsListingsAndLinksButNoLookups) {
+  auto receiver = std::make_shared<Receiver>();
+  const auto getSender = [&] {
+    return d.call<std::shared_ptr<VLItemNotificationSender>, NSErrorPtr>(
+        [&](LocalDaemon& daemon, auto reply) {
+          daemon.getItemUpdateSenderWithReceiver(receiver, std::move(reply));
+        });
+  };
+  const auto sender = std::get<0>(getSender());
+  NSErrorPtr broken;
+  dynamic_cast<LinkBreaking&>(*sender).setLinkBrokenHandler([&](NSErrorPtr e) { broken = e; });
+  logOut();
+  EXPECT_TRUE(isLoggedOut(broken));
+  EXPECT_TRUE(isLoggedOut(std::get<1>(getSender())));
+  EXPECT_TRUE(isLoggedOut(std::get<2>(list(std::nullopt, 0, 0, 200))));
+  EXPECT_TRUE(isLoggedOut(changes(std::nullopt).error));
+  EXPECT_TRUE(isLoggedOut(
+      std::get<1>(d.call<std::uint64_t, NSErrorPtr>([](LocalDaemon& daemon, auto reply) {
+        daemon.currentNotifRankWithReply(std::move(reply));
+      }))));
+  EXPECT_TRUE(std::get<0>(query(d.drive.path)));
+
+  logIn({"x", std::nullopt});  // whether that is enough is the client's to say
+  EXPECT_FALSE(std::get<2>(list(std::nullopt, 0, 0, 200)));
+}
+
+TEST_F(DaemonCalls, ContainersComeFromTheDriveAndFromDesktopEntries) {
+  writeEntry("b.desktop", "Name=Notes\nIcon=notes\nX-Skein-Containers=org.b;../up;.hid;org.c;\n");
+  writeEntry("c.desktop", "Name=Later\nX-Skein-Containers=org.b;com.tessel.Skein.default\n");
+  writeEntry("d.desktop", "Name=Gone\nHidden=true\nX-Skein-Containers=org.d\n");
+  writeEntry("e.desktop", "Name=No more\nX-Skein-Containers");
+  std::filesystem::create_directory(d.drive.path + "/Documents");
+  std::filesystem::create_directory_symlink("Documents", d.drive.path + "/Desktop");
+  auto events = std::make_shared<Events>();
+  d.call<NSErrorPtr>(
+      [&](LocalDaemon& daemon, auto reply) { daemon.subscribe(events, std::move(reply)); });
+  d.daemon->refreshContainers();
+  d.daemon->refreshContainers();
+  d.executor->runAll();
+  d.daemon->refreshContainers();
+  const auto found = containers();
+  EXPECT_EQ(events->containerChanges, 1);
+
+  ASSERT_EQ(found.size(), 5u);
+  EXPECT_EQ(found[0].documentsURL->path(), d.drive.path);
+  EXPECT_EQ(found[1].documentsURL->path(), d.drive.path + "/Documents");
+  EXPECT_FALSE(found[2].documentsURL);  // a link is no folder of the drive
+  EXPECT_EQ(found[3].containerID, "org.b");
+  EXPECT_EQ(found[3].displayName, "Notes");
+  EXPECT_EQ(found[3].icon, "notes");
+  EXPECT_EQ(found[3].documentsURL->path(), d.state.path + "/org.b/Documents");
+  EXPECT_TRUE(std::filesystem::is_directory(d.state.path + "/org.b/Documents"));
+  EXPECT_EQ(found[4].displayName, "Notes (org.c)");
+  ASSERT_EQ(d.store->containers.size(), 2u);
+  EXPECT_EQ(d.store->containers[1].containerID, "org.c");
+
+  std::filesystem::remove(d.applications.path + "/b.desktop");
+  d.daemon->refreshContainers();
+  d.executor->runAll();
+  EXPECT_EQ(containers()[3].displayName, "Later");
+  EXPECT_EQ(events->containerChanges, 2);
+  EXPECT_TRUE(std::filesystem::is_directory(d.state.path + "/org.c/Documents"));
+}
+
+TEST_F(DaemonCalls, ApplicationFoldersAreWatchedBeforeAndAfterTheyExist) {
+  const std::string later = d.applications.path + "/share/applications";
+  Mutex mutex;
+  CondVar heard;
+  int calls = 0;
+  ApplicationsWatcher watcher(
+      {later}, std::chrono::milliseconds(0),
+      [&] {
+        MutexLock lock(mutex);
+        ++calls;
+        heard.notifyAll();
+      },
+      d.log);
+  const auto wait = [&](int atLeast) {
+    const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(20);
+    MutexLock lock(mutex);
+    while (calls < atLeast && heard.waitUntil(mutex, deadline)) {
+    }
+    EXPECT_GE(calls, atLeast);
+    return calls;
+  };
+  int before = wait(1);  // what changed before the watch stood
+  std::filesystem::create_directories(later);
+  before = wait(before + 1);
+  // The folder may have come while it was looked for: the entry is heard of either way.
+  std::ofstream(later + "/x.desktop") << "x";
+  before = wait(before + 1);
+}
+
+TEST_F(DaemonCalls, FaultsComeAsOftenAsTheyWereAskedForAndOnlyWhenAllowed) {
+  int drops = 0;
+  std::vector<std::chrono::milliseconds> slept;
+  const auto faulting = [&](bool allowed) {
+    return std::make_shared<FaultingDaemon>(
+        FaultingDaemon::Parts{d.daemon, d.executor, allowed,
+                              [&](auto time) { slept.push_back(time); }, [&] { ++drops; }});
+  };
+  const auto inject = [&](const std::shared_ptr<FaultingDaemon>& daemon, FaultInjection fault) {
+    return std::get<0>(d.call<NSErrorPtr>(
+        [&](LocalDaemon& to, auto reply) { to.injectFault(fault, std::move(reply)); },
+        daemon.get()));
+  };
+  const auto status = [&](const std::shared_ptr<FaultingDaemon>& daemon) {
+    return std::get<1>(d.call<LocalDaemonStatus, NSErrorPtr>(
+        [](LocalDaemon& to, auto reply) { to.status(std::move(reply)); }, daemon.get()));
+  };
+  FaultInjection fault{"status", FaultInjection::Action::AnswerError, "X", 7, 0, 2};
+
+  const auto closed = faulting(false);
+  const NSErrorPtr refusal = inject(closed, fault);
+  ASSERT_TRUE(refusal);
+  EXPECT_NE(refusal->localizedDescription().find("SKEIN_ALLOW_FAULTS=1"), std::string::npos);
+  EXPECT_FALSE(status(closed));
+
+  const auto open = faulting(true);
+  EXPECT_FALSE(inject(open, fault));
+  fault.action = FaultInjection::Action::Delay;
+  fault.delayMilliseconds = 30;
+  fault.times = 1;
+  EXPECT_FALSE(inject(open, fault));
+  for (int i = 0; i < 2; ++i) {
+    const NSErrorPtr error = status(open);
+    ASSERT_TRUE(error);
+    EXPECT_EQ(error->domain(), "X");
+    EXPECT_EQ(error->code(), 7);
+  }
+  EXPECT_FALSE(status(open));
+  EXPECT_EQ(slept.size(), 1u);
+  EXPECT_FALSE(status(open));
+
+  fault.action = FaultInjection::Action::DropConnection;
+  EXPECT_FALSE(inject(open, fault));
+  open->status([](const LocalDaemonStatus&, const NSErrorPtr&) { FAIL() << "answered"; });
+  d.executor->runAll();
+  EXPECT_EQ(drops, 1);
+  fault.method = "nonsense";
+  EXPECT_TRUE(inject(open, fault));
+  fault.method = "status";
+  fault.times = 0;
+  EXPECT_TRUE(inject(open, fault));
+}
+
+TEST_F(DaemonCalls, StopRepliesAndAsksTheProcessToEnd) {
+  EXPECT_EQ(d.stops, 0);
+  d.call<NSErrorPtr>([](LocalDaemon& daemon, auto reply) { daemon.stop(std::move(reply)); });
+  EXPECT_EQ(d.stops, 1);
+}
+
+}  // namespace
+}  // namespace skein::vald

@@ -1,0 +1,246 @@
+// What update senders push, and when they stop.
+#include "tests/vald/TestDaemon.h"
+#include "vellum/VLErrors.h"
+
+namespace skein::vald {
+namespace {
+
+using Names = std::vector<std::string>;
+using SenderPtr = std::shared_ptr<VLItemNotificationSender>;
+
+class Senders : public testing::Test {
+ protected:
+  explicit Senders(SenderLimits limits = {}) : d(limits) {}
+
+  SenderPtr make() {
+    auto [sender, error] = d.call<SenderPtr, NSErrorPtr>([this](LocalDaemon& daemon, auto reply) {
+      daemon.getItemUpdateSenderWithReceiver(receiver, std::move(reply));
+    });
+    EXPECT_FALSE(error);
+    return sender;
+  }
+
+  // Sends the watch; the gathering is done when the executor has run.
+  void watch(const SenderPtr& sender, VLFileObjectID folder, std::uint64_t options = 19) {
+    sender->watchItemAtURL(NSURL::fileURLWithPath(*d.store->pathForID(folder, nullptr)), options,
+                           [this](NSErrorPtr error) { gathered.push_back(std::move(error)); });
+  }
+
+  Names pushed() {
+    d.executor->runAll();
+    return receiver->seen();
+  }
+
+  static std::string dead(VLFileObjectID id) { return "-" + id.asString(); }
+
+  TestDaemon d;
+  FakeStore& store = *d.store;
+  std::shared_ptr<Receiver> receiver = std::make_shared<Receiver>();
+  std::vector<NSErrorPtr> gathered;
+  const VLFileObjectID folder = store.addFolder("a", store.root());
+  const VLFileObjectID other = store.addFolder("ab", store.root());
+};
+
+TEST_F(Senders, PushTheFoldersOwnChildrenAndItselfAndWhatMovesInAndOut) {
+  const SenderPtr sender = make();
+  watch(sender, folder);
+  d.executor->runAll();
+  ASSERT_EQ(gathered, std::vector<NSErrorPtr>{nullptr});
+  EXPECT_EQ(store.watches[folder], 1);
+
+  const auto below = store.addFolder("below", folder);
+  store.addFile("deep", below);
+  const auto file = store.addFile("file", folder);
+  const auto stranger = store.addFile("stranger", other);
+  store.touch(folder);
+  EXPECT_EQ(pushed(), (Names{below.asString(), file.asString(), folder.asString()}));
+  receiver->reply();
+
+  store.move(file, other);
+  store.move(stranger, folder);
+  store.remove(below);
+  EXPECT_EQ(pushed(), (Names{dead(file), stranger.asString(), dead(below)}));
+  receiver->reply();
+
+  // Back again before the push: it never left.
+  store.move(file, folder);
+  store.move(file, other);
+  store.move(file, folder);
+  EXPECT_EQ(pushed(), (Names{file.asString()}));
+}
+
+TEST_F(Senders, HoldOnePushAtATimeAndCoalesceWhatWaits) {
+  const SenderPtr sender = make();
+  watch(sender, folder);
+  const auto first = store.addFile("1", folder);
+  EXPECT_EQ(pushed(), (Names{first.asString()}));
+
+  const auto second = store.addFile("2", folder);
+  const auto third = store.addFile("3", folder);
+  store.touch(second);
+  store.touch(second);
+  store.remove(third);
+  store.touch(first);
+  EXPECT_EQ(pushed(), Names());  // the first push is unanswered
+  receiver->reply();
+  d.executor->runAll();
+  ASSERT_EQ(receiver->pushes.size(), 1u);
+  EXPECT_EQ(receiver->pushes[0][0]->properties().size, 2u);  // the latest state
+  EXPECT_EQ(receiver->seen(), (Names{second.asString(), dead(third), first.asString()}));
+
+  for (int i = 0; i < 450; ++i) store.addFile("many" + std::to_string(i), folder);
+  std::size_t total = 0;
+  for (const std::size_t expected : {200, 200, 50}) {
+    receiver->reply();
+    d.executor->runAll();
+    ASSERT_EQ(receiver->pushes.size(), 1u);
+    EXPECT_EQ(receiver->pushes[0].size(), expected);
+    total += receiver->seen().size();
+  }
+  EXPECT_EQ(total, 450u);
+}
+
+TEST_F(Senders, CollectFromTheVeryCallThatStartsTheWatch) {
+  const SenderPtr sender = make();
+  watch(sender, folder);
+  // The client lists at once, without waiting for the gathering.
+  const auto file = store.addFile("file", folder);
+  const auto passing = store.addFile("passing", other);
+  store.move(passing, folder);
+  store.move(passing, other);
+  EXPECT_TRUE(gathered.empty());
+  EXPECT_EQ(pushed(), (Names{file.asString(), dead(passing)}));
+}
+
+TEST_F(Senders, WatchASubtreeByWhereFoldersAre) {
+  const auto deep = store.addFolder("deep", store.addFolder("x", folder));
+  const SenderPtr sender = make();
+  watch(sender, folder, 23);
+  d.executor->runAll();
+  const auto file = store.addFile("file", deep);
+  store.addFile("stranger", other);  // whose path begins alike
+  EXPECT_EQ(pushed(), (Names{file.asString()}));
+  receiver->reply();
+  store.move(file, other);
+  store.touch(file);
+  EXPECT_EQ(pushed(), (Names{dead(file)}));
+  receiver->reply();
+  store.remove(store.addFile("gone", deep));
+  store.remove(deep);
+  EXPECT_EQ(pushed().size(), 2u);
+}
+
+TEST_F(Senders, RefuseOtherOptionsAndPlacesAndASecondWatch) {
+  const SenderPtr sender = make();
+  watch(sender, folder, 4);
+  sender->watchItemAtURL(nullptr, 19, [this](NSErrorPtr error) { gathered.push_back(error); });
+  sender->watchItemAtURL(NSURL::fileURLWithPath(d.drive.path + "/missing"), 19,
+                         [this](NSErrorPtr error) { gathered.push_back(error); });
+  d.executor->runAll();
+  ASSERT_EQ(gathered.size(), 3u);
+  EXPECT_NE(gathered[0]->localizedDescription().find("options"), std::string::npos);
+  EXPECT_NE(gathered[1]->localizedDescription().find("url"), std::string::npos);
+  EXPECT_EQ(gathered[2]->code(), NSFileNoSuchFileError);
+
+  watch(sender, folder);  // a failed watch may be tried again
+  watch(sender, other);
+  d.executor->runAll();
+  ASSERT_EQ(gathered.size(), 5u);
+  EXPECT_FALSE(gathered[3]);
+  ASSERT_TRUE(gathered[4]);
+}
+
+TEST_F(Senders, PushNothingAfterInvalidateOrTheLastReference) {
+  for (const bool dropped : {false, true}) {
+    receiver = std::make_shared<Receiver>();
+    SenderPtr sender = make();
+    watch(sender, folder);
+    d.executor->runAll();
+    store.addFile(dropped ? "a1" : "a2", folder);
+    d.executor->runAll();
+    store.addFile(dropped ? "b1" : "b2", folder);  // waits for the reply
+    if (dropped) {
+      sender.reset();
+    } else {
+      sender->invalidate();
+    }
+    receiver->reply();
+    store.addFile(dropped ? "c1" : "c2", folder);
+    EXPECT_EQ(pushed().size(), 1u);
+    EXPECT_EQ(receiver.use_count(), 1);
+    EXPECT_EQ(d.senders.count(), 0u);
+    EXPECT_EQ(store.watches[folder], 0);
+  }
+}
+
+class BoundedSenders : public Senders {
+ protected:
+  BoundedSenders() : Senders({2, 5}) {}
+
+  // Breaks of the link, as the server hears of them.
+  void listen(const SenderPtr& sender) {
+    auto& link = dynamic_cast<LinkBreaking&>(*sender);
+    link.setLinkBrokenHandler([this](NSErrorPtr error) { broken.push_back(std::move(error)); });
+  }
+  std::vector<NSErrorPtr> broken;
+};
+
+TEST_F(BoundedSenders, BreakTheLinkOfAReceiverThatStopped) {
+  for (const std::uint64_t options : {19, 23}) {
+    broken.clear();
+    receiver = std::make_shared<Receiver>();
+    const SenderPtr sender = make();
+    listen(sender);
+    std::vector<NSErrorPtr> proxyHeard;
+    const auto proxy = sender->remoteObjectProxyWithErrorHandler(
+        [&](NSErrorPtr error) { proxyHeard.push_back(std::move(error)); });
+    watch(sender, folder, options);
+    d.executor->runAll();
+    for (int i = 0; i < 7; ++i) {
+      store.addFile(std::to_string(options) + std::to_string(i), folder);
+      d.executor->runAll();
+    }
+    EXPECT_TRUE(broken.empty());  // one under way, five waiting, and one may be in the push
+    for (int i = 7; i < 10; ++i) {
+      store.addFile(std::to_string(options) + std::to_string(i), folder);
+      d.executor->runAll();
+    }
+    ASSERT_EQ(broken.size(), 1u);
+    EXPECT_EQ(broken[0]->domain(), VLVellumErrorDomain);
+    EXPECT_EQ(proxyHeard, broken);
+    EXPECT_EQ(receiver->pushes.size(), 1u);
+    receiver->reply();
+    d.executor->runAll();
+    EXPECT_EQ(receiver->pushes.size(), 1u);
+    EXPECT_EQ(receiver.use_count(), 1);
+    EXPECT_EQ(store.watches[folder], 0);
+    // Who asks too late hears of it too.
+    listen(sender);
+    d.executor->runAll();
+    EXPECT_EQ(broken.size(), 2u);
+  }
+}
+
+TEST_F(BoundedSenders, BreakWhatTheStoresOverflowConcerns) {
+  const auto deep = store.addFolder("deep", folder);
+  const auto broke = [&](VLFileObjectID watched, std::uint64_t options,
+                         std::optional<VLFileObjectID> overflow) {
+    broken.clear();
+    const SenderPtr sender = make();
+    listen(sender);
+    watch(sender, watched, options);
+    d.executor->runAll();
+    d.senders.storeDidOverflow(overflow);
+    d.executor->runAll();
+    return !broken.empty();
+  };
+  EXPECT_TRUE(broke(folder, 19, folder));
+  EXPECT_TRUE(broke(deep, 19, folder));
+  EXPECT_TRUE(broke(folder, 23, deep));
+  EXPECT_TRUE(broke(folder, 19, std::nullopt));
+  EXPECT_FALSE(broke(folder, 19, deep));
+  EXPECT_FALSE(broke(other, 23, folder));
+}
+
+}  // namespace
+}  // namespace skein::vald
