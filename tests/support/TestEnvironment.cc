@@ -6,12 +6,13 @@
 
 namespace skein {
 
-TestEnvironment::TestEnvironment(std::shared_ptr<Executor> other)
+TestEnvironment::TestEnvironment(std::shared_ptr<Executor> other,
+                                 NSFileProviderManager* otherManager)
     : logSections(other ? other : executor),
       environment{log,
                   other ? std::move(other) : executor,
                   notificationCenter,
-                  framework.manager,
+                  otherManager != nullptr ? *otherManager : framework.manager,
                   framework.accounts,
                   framework.containers,
                   framework.daemon,

@@ -16,8 +16,10 @@ namespace skein {
 // unanswered ends as in a dying process.
 class TestEnvironment {
  public:
-  // With the manual executor, `executor`, unless another one is given.
-  explicit TestEnvironment(std::shared_ptr<Executor> other = nullptr);
+  // With the manual executor, `executor`, unless another one is given, and with the
+  // framework's own manager unless another one is.
+  explicit TestEnvironment(std::shared_ptr<Executor> other = nullptr,
+                           NSFileProviderManager* otherManager = nullptr);
   ~TestEnvironment();
 
   // Runs what is posted, and answers what was recorded since the last time.
