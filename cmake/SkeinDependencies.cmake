@@ -11,6 +11,7 @@ endmacro()
 
 skein_find(CapnProto "capnproto libcapnp-dev")
 skein_find(SQLite3 libsqlite3-dev)
+skein_find(OpenSSL libssl-dev)
 skein_find(CLI11 libcli11-dev)
 skein_find(nlohmann_json nlohmann-json3-dev)
 pkg_check_modules(GIO IMPORTED_TARGET gio-2.0 gio-unix-2.0)

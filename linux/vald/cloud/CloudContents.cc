@@ -1,0 +1,227 @@
+#include "linux/vald/cloud/CloudContents.h"
+
+#include <dirent.h>
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <filesystem>
+#include <optional>
+#include <utility>
+#include <vector>
+
+#include "linux/vald/cloud/CloudErrors.h"
+#include "linux/vald/files/FileErrors.h"
+
+namespace skein::vald {
+namespace {
+
+std::string shardOf(const std::string& object) { return object.substr(0, 2); }
+std::string pathOf(const std::string& object) { return shardOf(object) + "/" + object; }
+
+FileDescriptor openFolder(int folder, const char* name) {
+  return FileDescriptor(openat(folder, name, O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+}
+
+// The names in a folder, but "." and "..". Empty with errno set when it cannot be read.
+std::vector<std::string> entries(int folder) {
+  std::vector<std::string> names;
+  const int copy = openat(folder, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+  DIR* directory = copy >= 0 ? fdopendir(copy) : nullptr;
+  if (directory == nullptr) {
+    if (copy >= 0) close(copy);
+    return names;
+  }
+  errno = 0;
+  while (const dirent* entry = readdir(directory)) {
+    const std::string name = entry->d_name;
+    if (name != "." && name != "..") names.push_back(name);
+  }
+  closedir(directory);
+  return names;
+}
+
+}  // namespace
+
+CloudContents::Hold::Hold(Hold&& other) noexcept
+    : _owner(std::exchange(other._owner, nullptr)), _hash(other._hash) {}
+
+CloudContents::Hold& CloudContents::Hold::operator=(Hold&& other) noexcept {
+  std::swap(_owner, other._owner);
+  std::swap(_hash, other._hash);
+  return *this;
+}
+
+CloudContents::Hold::~Hold() {
+  if (_owner != nullptr) _owner->releaseHold(_hash);
+}
+
+Outcome<std::unique_ptr<CloudContents>> CloudContents::open(const std::string& folder,
+                                                            FileLayer& files) {
+  std::error_code failure;
+  std::filesystem::create_directories(folder, failure);
+  if (failure) return fileError(failure.value(), "can't make the cloud's folder", folder);
+  const FileDescriptor top(::open(folder.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  if (!top) return fileError(errno, "can't open the cloud's folder", folder);
+  if (fchmod(top.get(), 0700) != 0) {
+    return fileError(errno, "can't close to other users the cloud's folder", folder);
+  }
+  for (const char* name : {"objects", "incoming"}) {
+    const int code = files.makeFolder(top.get(), name, 0700);
+    if (code != 0 && code != EEXIST) {
+      return fileError(code, "can't make the cloud's folder", folder + "/" + name);
+    }
+  }
+  FileDescriptor objects = openFolder(top.get(), "objects");
+  FileDescriptor incoming = openFolder(top.get(), "incoming");
+  if (!objects || !incoming) return fileError(errno, "can't open the cloud's folder", folder);
+  for (const std::string& name : entries(incoming.get())) {
+    if (const int code = files.unlink(incoming.get(), name)) {
+      return fileError(code, "can't remove", folder + "/incoming/" + name);
+    }
+  }
+  if (const int code = files.sync(top.get())) return fileError(code, "can't make durable", folder);
+  return std::unique_ptr<CloudContents>(
+      new CloudContents(folder, files, std::move(objects), std::move(incoming)));
+}
+
+Outcome<CloudContents::Added> CloudContents::add(int file, const std::string& name,
+                                                 StreamObserver& observer) {
+  std::string incoming;
+  {
+    MutexLock lock(_mutex);
+    incoming = std::to_string(_nextIncoming++);
+  }
+  FileDescriptor copy;
+  if (const int code = _files.createFile(_incoming.get(), incoming, 0600, copy)) {
+    return fileError(code, "can't upload", name);
+  }
+  // A clone stands still while its original may change: it is what is hashed.
+  const bool cloned = _files.cloneContents(file, copy.get()) == 0;
+  auto contents = cloned ? hashContents(copy.get(), name, observer)
+                         : copyContents(_files, file, copy.get(), name, observer);
+  NSErrorPtr error = contents.error();
+  Hold hold;
+  if (error == nullptr) {
+    hold = takeHold(contents->hash);
+    if (!contains(*contents)) {
+      error = settle(incoming, copy.get(), *contents);
+      if (error == nullptr) return Added{*contents, std::move(hold)};
+    }
+  }
+  // Not needed, or not complete. A failure to remove it is mended at the next opening.
+  _files.unlink(_incoming.get(), incoming);
+  if (error != nullptr) return error;
+  return Added{*contents, std::move(hold)};
+}
+
+NSErrorPtr CloudContents::settle(const std::string& incoming, int file,
+                                 const HashedContents& contents) {
+  const std::string object = contents.hash.asString();
+  if (const int code = _files.setMode(file, 0400)) {
+    return fileError(code, "can't write to the cloud", objectPath(object));
+  }
+  if (const int code = _files.sync(file)) {
+    return fileError(code, "can't write to the cloud", objectPath(object));
+  }
+  FileDescriptor shard = openFolder(_objects.get(), shardOf(object).c_str());
+  if (!shard) {
+    int code = _files.makeFolder(_objects.get(), shardOf(object), 0700);
+    if (code == 0 || code == EEXIST) code = _files.sync(_objects.get());
+    if (code != 0) return fileError(code, "can't make a folder for", objectPath(object));
+    shard = openFolder(_objects.get(), shardOf(object).c_str());
+    if (!shard) return fileError(errno, "can't open the folder of", objectPath(object));
+  }
+  int code = _files.renameOver(_incoming.get(), incoming, shard.get(), object);
+  if (code == 0) code = _files.sync(shard.get());
+  return code == 0 ? nullptr : fileError(code, "can't write to the cloud", objectPath(object));
+}
+
+std::string CloudContents::objectPath(const std::string& object) const {
+  return _folder + "/objects/" + pathOf(object);
+}
+
+bool CloudContents::contains(const HashedContents& contents) const {
+  struct stat status {};
+  return fstatat(_objects.get(), pathOf(contents.hash.asString()).c_str(), &status,
+                 AT_SYMLINK_NOFOLLOW) == 0 &&
+         S_ISREG(status.st_mode) && static_cast<std::uint64_t>(status.st_size) == contents.size;
+}
+
+std::optional<CloudContents::Hold> CloudContents::hold(const HashedContents& contents) {
+  Hold hold = takeHold(contents.hash);
+  if (!contains(contents)) return std::nullopt;
+  return hold;
+}
+
+Outcome<FileDescriptor> CloudContents::read(const ContentHash& hash) const {
+  const std::string object = hash.asString();
+  FileDescriptor file(
+      openat(_objects.get(), pathOf(object).c_str(), O_RDONLY | O_NOFOLLOW | O_CLOEXEC));
+  if (!file) return fileError(errno, "can't read from the cloud", objectPath(object));
+  return file;
+}
+
+NSErrorPtr CloudContents::verify(const ContentHash& hash, StreamObserver& observer) const {
+  auto file = read(hash);
+  if (!file) return file.error();
+  const auto found = hashContents(file->get(), hash.asString(), observer);
+  if (!found) return found.error();
+  return found->hash == hash ? nullptr : corruptError(hash.asString());
+}
+
+Outcome<CloudContents::Garbage> CloudContents::collectGarbage(
+    const std::function<bool(const ContentHash&)>& isReferred) {
+  Garbage garbage;
+  for (const std::string& shard : entries(_objects.get())) {
+    if (NSErrorPtr error = collectShard(shard, isReferred, garbage)) return error;
+  }
+  return garbage;
+}
+
+NSErrorPtr CloudContents::collectShard(const std::string& shard,
+                                       const std::function<bool(const ContentHash&)>& isReferred,
+                                       Garbage& garbage) {
+  const FileDescriptor folder = openFolder(_objects.get(), shard.c_str());
+  if (!folder)
+    return fileError(errno, "can't read the cloud's folder", _folder + "/objects/" + shard);
+  for (const std::string& name : entries(folder.get())) {
+    const auto hash = ContentHash::parse(name);
+    struct stat status {};
+    if (!hash || fstatat(folder.get(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) != 0) continue;
+    if (!beginCollecting(*hash)) continue;
+    const int code = isReferred(*hash) ? -1 : _files.unlink(folder.get(), name);
+    endCollecting(*hash);
+    if (code > 0) return fileError(code, "can't remove from the cloud", objectPath(name));
+    if (code < 0) continue;
+    ++garbage.files;
+    garbage.bytes += static_cast<std::uint64_t>(status.st_size);
+  }
+  return nullptr;
+}
+
+CloudContents::Hold CloudContents::takeHold(const ContentHash& hash) {
+  MutexLock lock(_mutex);
+  while (_collecting.contains(hash)) _collected.wait(_mutex);
+  ++_holds[hash];
+  return {this, hash};
+}
+
+void CloudContents::releaseHold(const ContentHash& hash) {
+  MutexLock lock(_mutex);
+  if (const auto held = _holds.find(hash); --held->second == 0) _holds.erase(held);
+}
+
+bool CloudContents::beginCollecting(const ContentHash& hash) {
+  MutexLock lock(_mutex);
+  return !_holds.contains(hash) && _collecting.insert(hash).second;
+}
+
+void CloudContents::endCollecting(const ContentHash& hash) {
+  MutexLock lock(_mutex);
+  _collecting.erase(hash);
+  _collected.notifyAll();
+}
+
+}  // namespace skein::vald

@@ -1,0 +1,143 @@
+#include "linux/vald/cloud/CloudDatabase.h"
+
+#include <sqlite3.h>
+
+#include <string>
+
+#include "vellum/VLErrors.h"
+
+namespace skein::vald {
+namespace {
+
+// The domain of SQLite's own codes, which say more than any POSIX code would.
+constexpr char kDatabaseErrorDomain[] = "SkeinDatabaseErrorDomain";
+
+NSErrorPtr databaseError(sqlite3* database) {
+  return NSError::errorWithDomain(
+      kDatabaseErrorDomain, sqlite3_extended_errcode(database),
+      {{NSLocalizedDescriptionKey,
+        std::string("The cloud's records failed: ") + sqlite3_errmsg(database) + "."}});
+}
+
+}  // namespace
+
+CloudStatement::CloudStatement(sqlite3* database, std::string_view sql) : _database(database) {
+  if (sqlite3_prepare_v2(database, sql.data(), static_cast<int>(sql.size()), &_statement,
+                         nullptr) != SQLITE_OK) {
+    fail();
+  }
+}
+
+CloudStatement::~CloudStatement() { sqlite3_finalize(_statement); }
+
+void CloudStatement::fail() {
+  if (_error == nullptr) _error = databaseError(_database);
+}
+
+CloudStatement& CloudStatement::bind(int position, std::int64_t value) {
+  if (_error == nullptr && sqlite3_bind_int64(_statement, position, value) != SQLITE_OK) fail();
+  return *this;
+}
+
+CloudStatement& CloudStatement::bind(int position, std::string_view text) {
+  if (_error == nullptr && sqlite3_bind_text64(_statement, position, text.data(), text.size(),
+                                               SQLITE_TRANSIENT, SQLITE_UTF8) != SQLITE_OK) {
+    fail();
+  }
+  return *this;
+}
+
+CloudStatement& CloudStatement::bindBytes(int position, std::string_view bytes) {
+  if (_error == nullptr && sqlite3_bind_blob64(_statement, position, bytes.data(), bytes.size(),
+                                               SQLITE_TRANSIENT) != SQLITE_OK) {
+    fail();
+  }
+  return *this;
+}
+
+bool CloudStatement::step() {
+  if (_error != nullptr) return false;
+  const int code = sqlite3_step(_statement);
+  if (code != SQLITE_ROW && code != SQLITE_DONE) fail();
+  return code == SQLITE_ROW;
+}
+
+void CloudStatement::reset() { sqlite3_reset(_statement); }
+
+NSErrorPtr CloudStatement::run() {
+  while (step()) {
+  }
+  return _error;
+}
+
+std::int64_t CloudStatement::integer(int column) const {
+  return sqlite3_column_int64(_statement, column);
+}
+
+std::string CloudStatement::text(int column) const {
+  const auto* bytes = static_cast<const char*>(sqlite3_column_blob(_statement, column));
+  const int size = sqlite3_column_bytes(_statement, column);
+  return bytes == nullptr ? std::string() : std::string(bytes, static_cast<std::size_t>(size));
+}
+
+bool CloudStatement::isNull(int column) const {
+  return sqlite3_column_type(_statement, column) == SQLITE_NULL;
+}
+
+Outcome<std::unique_ptr<CloudDatabase>> CloudDatabase::open(
+    const std::string& path, std::initializer_list<const char*> schemas) {
+  sqlite3* handle = nullptr;
+  const int code =
+      sqlite3_open_v2(path.c_str(), &handle,
+                      SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE | SQLITE_OPEN_NOFOLLOW, nullptr);
+  std::unique_ptr<CloudDatabase> database(new CloudDatabase(handle));
+  if (code != SQLITE_OK) return databaseError(handle);
+  sqlite3_busy_timeout(handle, 5000);
+  if (NSErrorPtr error = database->execute("PRAGMA journal_mode=WAL; PRAGMA synchronous=FULL;")) {
+    return error;
+  }
+  const auto version = database->prepare("PRAGMA user_version");
+  if (!version->step()) return version->error();
+  const auto seen = version->integer(0);
+  version->run();
+  const auto newest = static_cast<std::int64_t>(schemas.size());
+  if (seen > newest) {
+    return NSError::errorWithDomain(
+        kDatabaseErrorDomain, SQLITE_SCHEMA,
+        {{NSLocalizedDescriptionKey,
+          "The cloud's records in " + path + " were made by a newer version of this program."}});
+  }
+  for (auto step = seen; step < newest; ++step) {
+    NSErrorPtr error = database->transact([&] {
+      const std::string next = "PRAGMA user_version=" + std::to_string(step + 1);
+      NSErrorPtr failed = database->execute(schemas.begin()[step]);
+      return failed != nullptr ? failed : database->execute(next.c_str());
+    });
+    if (error != nullptr) return error;
+  }
+  return database;
+}
+
+CloudDatabase::~CloudDatabase() { sqlite3_close(_database); }
+
+std::unique_ptr<CloudStatement> CloudDatabase::prepare(std::string_view sql) {
+  return std::make_unique<CloudStatement>(_database, sql);
+}
+
+NSErrorPtr CloudDatabase::transact(const std::function<NSErrorPtr()>& body) {
+  if (NSErrorPtr error = execute("BEGIN IMMEDIATE")) return error;
+  NSErrorPtr error = body();
+  if (error == nullptr) error = execute("COMMIT");
+  if (error != nullptr) execute("ROLLBACK");
+  return error;
+}
+
+NSErrorPtr CloudDatabase::execute(const char* sql) {
+  return sqlite3_exec(_database, sql, nullptr, nullptr, nullptr) == SQLITE_OK
+             ? nullptr
+             : databaseError(_database);
+}
+
+std::int64_t CloudDatabase::lastInsertedRow() const { return sqlite3_last_insert_rowid(_database); }
+
+}  // namespace skein::vald

@@ -1,0 +1,266 @@
+#include "linux/vald/cloud/CloudRecords.h"
+
+#include <algorithm>
+#include <cstring>
+#include <utility>
+
+namespace skein::vald {
+namespace {
+
+// References to contents are counted from the records themselves, so that no count can
+// disagree with them after a crash.
+constexpr char kSchema1[] = R"sql(
+  CREATE TABLE records(
+    document INTEGER PRIMARY KEY, zone TEXT NOT NULL, owner TEXT NOT NULL,
+    hash BLOB NOT NULL, size INTEGER NOT NULL, modified INTEGER NOT NULL, created INTEGER,
+    uploaded INTEGER NOT NULL, revision INTEGER NOT NULL, thumbnail BLOB);
+  CREATE INDEX records_by_hash ON records(hash);
+  CREATE INDEX records_by_zone ON records(owner, zone);
+  CREATE TABLE stamps(
+    document INTEGER PRIMARY KEY, size INTEGER NOT NULL, modified INTEGER NOT NULL,
+    changed INTEGER NOT NULL, inode INTEGER NOT NULL);
+  CREATE TABLE pins(document INTEGER PRIMARY KEY);
+  CREATE TABLE work(number INTEGER PRIMARY KEY, path BLOB NOT NULL);
+)sql";
+
+constexpr char kColumns[] =
+    "SELECT document, zone, owner, hash, size, modified, created, uploaded, revision, thumbnail "
+    "FROM records ";
+
+// Numbers of 64 bits without a sign keep their bits.
+std::int64_t key(VLFileObjectID document) { return static_cast<std::int64_t>(document.rawID()); }
+std::int64_t nanoseconds(NSDate date) { return date.time_since_epoch().count(); }
+NSDate date(std::int64_t nanoseconds) { return NSDate(std::chrono::nanoseconds(nanoseconds)); }
+
+std::string_view bytesOf(const ContentHash& hash) {
+  return {reinterpret_cast<const char*>(hash.bytes().data()), hash.bytes().size()};
+}
+
+CloudRecord recordOf(const CloudStatement& row) {
+  CloudRecord record;
+  record.document = VLFileObjectID::documentWithRawID(static_cast<std::uint64_t>(row.integer(0)));
+  record.zone = {row.text(1), row.text(2)};
+  ContentHash::Bytes hash{};
+  const std::string bytes = row.text(3);
+  std::memcpy(hash.data(), bytes.data(), std::min(bytes.size(), hash.size()));
+  record.contents = {ContentHash(hash), static_cast<std::uint64_t>(row.integer(4))};
+  record.modified = date(row.integer(5));
+  if (!row.isNull(6)) record.created = date(row.integer(6));
+  record.uploaded = date(row.integer(7));
+  record.revision = row.integer(8);
+  if (!row.isNull(9)) record.thumbnail = row.text(9);
+  return record;
+}
+
+Outcome<std::vector<CloudRecord>> allOf(CloudStatement& statement) {
+  std::vector<CloudRecord> records;
+  while (statement.step()) records.push_back(recordOf(statement));
+  if (NSErrorPtr error = statement.error()) return error;
+  return records;
+}
+
+bool countsForQuota(const CloudRecord& record) {
+  return record.zone.ownerName == CKCurrentUserDefaultName;
+}
+
+}  // namespace
+
+Outcome<std::unique_ptr<CloudRecords>> CloudRecords::open(const std::string& path) {
+  auto database = CloudDatabase::open(path, {kSchema1});
+  if (!database) return database.error();
+  std::unique_ptr<CloudRecords> records(new CloudRecords(std::move(*database)));
+  if (NSErrorPtr error = records->measure()) return error;
+  return records;
+}
+
+NSErrorPtr CloudRecords::measure() {
+  MutexLock lock(_mutex);
+  const auto sum = _database->prepare("SELECT COALESCE(SUM(size), 0) FROM records WHERE owner = ?");
+  if (!sum->bind(1, std::string_view(CKCurrentUserDefaultName)).step()) return sum->error();
+  _usedBytes = static_cast<std::uint64_t>(sum->integer(0));
+  return nullptr;
+}
+
+Outcome<CloudRecord> CloudRecords::put(CloudRecord record, const UploadStamp& stamp,
+                                       const CloudContents::Hold& /*hold*/) {
+  MutexLock lock(_mutex);
+  const auto before = find(record.document);
+  if (!before) return before.error();
+  record.revision = 1;
+  record.thumbnail = std::nullopt;
+  if (*before) {
+    const bool same = (*before)->contents.hash == record.contents.hash;
+    record.revision = (*before)->revision + (same ? 0 : 1);
+    if (same) record.thumbnail = (*before)->thumbnail;
+    if (same) record.uploaded = (*before)->uploaded;
+    record.zone = (*before)->zone;
+  }
+  NSErrorPtr error = _database->transact([&]() SKEIN_NO_THREAD_SAFETY_ANALYSIS {
+    NSErrorPtr failed = write(record);
+    return failed != nullptr ? failed : writeStamp(record.document, stamp);
+  });
+  if (error != nullptr) return error;
+  if (*before && countsForQuota(**before)) _usedBytes -= (*before)->contents.size;
+  if (countsForQuota(record)) _usedBytes += record.contents.size;
+  return record;
+}
+
+NSErrorPtr CloudRecords::write(const CloudRecord& record) {
+  return _database->prepare("INSERT OR REPLACE INTO records VALUES(?, ?, ?, ?, ?, ?, ?, ?, ?, ?)")
+      ->bind(1, key(record.document))
+      .bind(2, std::string_view(record.zone.zoneName))
+      .bind(3, std::string_view(record.zone.ownerName))
+      .bindBytes(4, bytesOf(record.contents.hash))
+      .bind(5, static_cast<std::int64_t>(record.contents.size))
+      .bind(6, nanoseconds(record.modified))
+      .bind(7, record.created ? std::optional(nanoseconds(*record.created)) : std::nullopt)
+      .bind(8, nanoseconds(record.uploaded))
+      .bind(9, record.revision)
+      .bind(10, record.thumbnail)
+      .run();
+}
+
+Outcome<std::optional<CloudRecord>> CloudRecords::find(VLFileObjectID document) {
+  const auto row = _database->prepare(std::string(kColumns) + "WHERE document = ?");
+  const bool found = row->bind(1, key(document)).step();
+  if (NSErrorPtr error = row->error()) return error;
+  return found ? std::optional(recordOf(*row)) : std::nullopt;
+}
+
+Outcome<std::optional<CloudRecord>> CloudRecords::record(VLFileObjectID document) {
+  MutexLock lock(_mutex);
+  return find(document);
+}
+
+Outcome<std::vector<CloudRecord>> CloudRecords::records(
+    const std::vector<VLFileObjectID>& documents) {
+  MutexLock lock(_mutex);
+  std::vector<CloudRecord> found;
+  const auto row = _database->prepare(std::string(kColumns) + "WHERE document = ?");
+  for (const VLFileObjectID& document : documents) {
+    if (row->bind(1, key(document)).step()) found.push_back(recordOf(*row));
+    if (NSErrorPtr error = row->error()) return error;
+    row->reset();
+  }
+  return found;
+}
+
+Outcome<std::vector<CloudRecord>> CloudRecords::recordsInZone(const CKRecordZoneID& zone) {
+  MutexLock lock(_mutex);
+  const auto rows = _database->prepare(std::string(kColumns) + "WHERE owner = ? AND zone = ?");
+  rows->bind(1, std::string_view(zone.ownerName)).bind(2, std::string_view(zone.zoneName));
+  return allOf(*rows);
+}
+
+NSErrorPtr CloudRecords::remove(VLFileObjectID document) {
+  MutexLock lock(_mutex);
+  const auto before = find(document);
+  if (!before) return before.error();
+  NSErrorPtr error = _database->transact([&]() SKEIN_NO_THREAD_SAFETY_ANALYSIS -> NSErrorPtr {
+    for (const char* table : {"records", "stamps", "pins"}) {
+      const auto statement =
+          _database->prepare(std::string("DELETE FROM ") + table + " WHERE document = ?");
+      if (NSErrorPtr failed = statement->bind(1, key(document)).run()) return failed;
+    }
+    return nullptr;
+  });
+  if (error == nullptr && *before && countsForQuota(**before)) {
+    _usedBytes -= (*before)->contents.size;
+  }
+  return error;
+}
+
+NSErrorPtr CloudRecords::setThumbnail(VLFileObjectID document,
+                                      const std::optional<std::string>& path) {
+  MutexLock lock(_mutex);
+  return _database->prepare("UPDATE records SET thumbnail = ? WHERE document = ?")
+      ->bind(1, path)
+      .bind(2, key(document))
+      .run();
+}
+
+Outcome<std::uint64_t> CloudRecords::references(const ContentHash& hash) {
+  MutexLock lock(_mutex);
+  const auto count = _database->prepare("SELECT COUNT(*) FROM records WHERE hash = ?");
+  if (!count->bindBytes(1, bytesOf(hash)).step()) return count->error();
+  return static_cast<std::uint64_t>(count->integer(0));
+}
+
+std::uint64_t CloudRecords::usedBytes() {
+  MutexLock lock(_mutex);
+  return _usedBytes;
+}
+
+Outcome<std::optional<UploadStamp>> CloudRecords::stamp(VLFileObjectID document) {
+  MutexLock lock(_mutex);
+  const auto row =
+      _database->prepare("SELECT size, modified, changed, inode FROM stamps WHERE document = ?");
+  const bool found = row->bind(1, key(document)).step();
+  if (NSErrorPtr error = row->error()) return error;
+  if (!found) return std::optional<UploadStamp>();
+  return std::optional(UploadStamp{static_cast<std::uint64_t>(row->integer(0)),
+                                   date(row->integer(1)), date(row->integer(2)),
+                                   static_cast<std::uint64_t>(row->integer(3))});
+}
+
+NSErrorPtr CloudRecords::setStamp(VLFileObjectID document,
+                                  const std::optional<UploadStamp>& stamp) {
+  MutexLock lock(_mutex);
+  return writeStamp(document, stamp);
+}
+
+NSErrorPtr CloudRecords::writeStamp(VLFileObjectID document,
+                                    const std::optional<UploadStamp>& stamp) {
+  if (!stamp) {
+    return _database->prepare("DELETE FROM stamps WHERE document = ?")
+        ->bind(1, key(document))
+        .run();
+  }
+  return _database->prepare("INSERT OR REPLACE INTO stamps VALUES(?, ?, ?, ?, ?)")
+      ->bind(1, key(document))
+      .bind(2, static_cast<std::int64_t>(stamp->size))
+      .bind(3, nanoseconds(stamp->modified))
+      .bind(4, nanoseconds(stamp->changed))
+      .bind(5, static_cast<std::int64_t>(stamp->inode))
+      .run();
+}
+
+NSErrorPtr CloudRecords::setPinned(VLFileObjectID document, bool pinned) {
+  MutexLock lock(_mutex);
+  return _database
+      ->prepare(pinned ? "INSERT OR REPLACE INTO pins VALUES(?)"
+                       : "DELETE FROM pins WHERE document = ?")
+      ->bind(1, key(document))
+      .run();
+}
+
+Outcome<bool> CloudRecords::isPinned(VLFileObjectID document) {
+  MutexLock lock(_mutex);
+  const auto row = _database->prepare("SELECT 1 FROM pins WHERE document = ?");
+  const bool pinned = row->bind(1, key(document)).step();
+  if (NSErrorPtr error = row->error()) return error;
+  return pinned;
+}
+
+Outcome<CloudRecords::Work> CloudRecords::beginWork(const std::string& path) {
+  MutexLock lock(_mutex);
+  const auto row = _database->prepare("INSERT INTO work(path) VALUES(?)");
+  if (NSErrorPtr error = row->bindBytes(1, path).run()) return error;
+  return Work{_database->lastInsertedRow(), path};
+}
+
+NSErrorPtr CloudRecords::endWork(const Work& work) {
+  MutexLock lock(_mutex);
+  return _database->prepare("DELETE FROM work WHERE number = ?")->bind(1, work.number).run();
+}
+
+Outcome<std::vector<CloudRecords::Work>> CloudRecords::unfinishedWork() {
+  MutexLock lock(_mutex);
+  std::vector<Work> works;
+  const auto row = _database->prepare("SELECT number, path FROM work ORDER BY number");
+  while (row->step()) works.push_back({row->integer(0), row->text(1)});
+  if (NSErrorPtr error = row->error()) return error;
+  return works;
+}
+
+}  // namespace skein::vald

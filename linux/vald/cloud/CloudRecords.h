@@ -1,0 +1,99 @@
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "base/Mutex.h"
+#include "linux/vald/cloud/CloudContents.h"
+#include "linux/vald/cloud/CloudDatabase.h"
+#include "linux/vald/cloud/UploadStamp.h"
+#include "platform/cloudkit/CloudKit.h"
+#include "vellum/VLFileObjectID.h"
+
+namespace skein::vald {
+
+// The zone of one's own documents, unless they were put into another.
+inline constexpr char kDocumentsZone[] = "documents";
+
+// What the cloud has of a document.
+struct CloudRecord {
+  VLFileObjectID document = VLFileObjectID::documentWithRawID(0);
+  CKRecordZoneID zone{kDocumentsZone, CKCurrentUserDefaultName};
+  HashedContents contents;
+  NSDate modified;
+  std::optional<NSDate> created;
+  NSDate uploaded;
+  std::int64_t revision = 0;             // 1 for the first upload; given by the records
+  std::optional<std::string> thumbnail;  // an asset file's path; gone with a new revision
+
+  // The record's name is the document's identifier.
+  CKRecordID recordID() const { return {document.asString(), zone}; }
+};
+
+// The cloud's records, one per uploaded document, and what this machine knows of them: as
+// which file a document was uploaded, which are pinned, and which files are being evicted or
+// downloaded at the moment. Durable when a call returns. Any thread; calls block.
+//
+// A record is written after its contents are durable and while they are held, so that it
+// never refers to contents that are not there.
+class CloudRecords {
+ public:
+  static Outcome<std::unique_ptr<CloudRecords>> open(const std::string& path);
+
+  // Writes the document's record and the file that it was uploaded as, both or neither.
+  // New contents get the next revision and lose the thumbnail; the same contents keep both
+  // and only get the new times. The contents must be durable: the hold says so.
+  Outcome<CloudRecord> put(CloudRecord record, const UploadStamp& stamp,
+                           const CloudContents::Hold& hold) SKEIN_EXCLUDES(_mutex);
+  // Nil without an error when there is none.
+  Outcome<std::optional<CloudRecord>> record(VLFileObjectID document) SKEIN_EXCLUDES(_mutex);
+  // Those that are there, in any order.
+  Outcome<std::vector<CloudRecord>> records(const std::vector<VLFileObjectID>& documents)
+      SKEIN_EXCLUDES(_mutex);
+  Outcome<std::vector<CloudRecord>> recordsInZone(const CKRecordZoneID& zone)
+      SKEIN_EXCLUDES(_mutex);
+  // Forgets all about the document; its contents become garbage unless others refer to them.
+  NSErrorPtr remove(VLFileObjectID document) SKEIN_EXCLUDES(_mutex);
+  NSErrorPtr setThumbnail(VLFileObjectID document, const std::optional<std::string>& path)
+      SKEIN_EXCLUDES(_mutex);
+
+  // How many records refer to the contents.
+  Outcome<std::uint64_t> references(const ContentHash& hash) SKEIN_EXCLUDES(_mutex);
+  // What one's own documents take, equal contents counted for each: the quota's measure.
+  std::uint64_t usedBytes() SKEIN_EXCLUDES(_mutex);
+
+  // The file as which the document was uploaded; nil while it is evicted, too.
+  Outcome<std::optional<UploadStamp>> stamp(VLFileObjectID document) SKEIN_EXCLUDES(_mutex);
+  NSErrorPtr setStamp(VLFileObjectID document, const std::optional<UploadStamp>& stamp)
+      SKEIN_EXCLUDES(_mutex);
+
+  NSErrorPtr setPinned(VLFileObjectID document, bool pinned) SKEIN_EXCLUDES(_mutex);
+  Outcome<bool> isPinned(VLFileObjectID document) SKEIN_EXCLUDES(_mutex);
+
+  // A file whose eviction or download is under way: what recovery looks at after a crash.
+  struct Work {
+    std::int64_t number = 0;
+    std::string path;  // of the document
+  };
+  Outcome<Work> beginWork(const std::string& path) SKEIN_EXCLUDES(_mutex);
+  NSErrorPtr endWork(const Work& work) SKEIN_EXCLUDES(_mutex);
+  Outcome<std::vector<Work>> unfinishedWork() SKEIN_EXCLUDES(_mutex);
+
+ private:
+  explicit CloudRecords(std::unique_ptr<CloudDatabase> database) : _database(std::move(database)) {}
+
+  NSErrorPtr measure() SKEIN_EXCLUDES(_mutex);
+  Outcome<std::optional<CloudRecord>> find(VLFileObjectID document) SKEIN_REQUIRES(_mutex);
+  NSErrorPtr write(const CloudRecord& record) SKEIN_REQUIRES(_mutex);
+  NSErrorPtr writeStamp(VLFileObjectID document, const std::optional<UploadStamp>& stamp)
+      SKEIN_REQUIRES(_mutex);
+
+  Mutex _mutex;
+  const std::unique_ptr<CloudDatabase> _database SKEIN_PT_GUARDED_BY(_mutex);
+  std::uint64_t _usedBytes SKEIN_GUARDED_BY(_mutex) = 0;
+};
+
+}  // namespace skein::vald

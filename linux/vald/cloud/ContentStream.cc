@@ -1,0 +1,62 @@
+#include "linux/vald/cloud/ContentStream.h"
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <vector>
+
+#include "linux/vald/files/FileErrors.h"
+
+namespace skein::vald {
+namespace {
+
+// `write` answers an errno.
+template <class Write>
+Outcome<HashedContents> stream(int file, const std::string& name, StreamObserver& observer,
+                               Write write) {
+  if (NSErrorPtr stopped = observer.didPass(0)) return stopped;
+  posix_fadvise(file, 0, 0, POSIX_FADV_SEQUENTIAL);
+  std::vector<char> buffer(StreamObserver::kLargestPiece);
+  ContentHasher hasher;
+  std::uint64_t passed = 0;
+  for (;;) {
+    const std::size_t wanted =
+        std::clamp<std::size_t>(observer.pieceSize(), 1, StreamObserver::kLargestPiece);
+    const ssize_t got = pread(file, buffer.data(), wanted, static_cast<off_t>(passed));
+    if (got < 0) {
+      if (errno == EINTR) continue;
+      return fileError(errno, "can't read", name);
+    }
+    if (got == 0) return HashedContents{hasher.finish(), passed};
+    const auto size = static_cast<std::size_t>(got);
+    observer.willPass(buffer.data(), size);
+    hasher.update(buffer.data(), size);
+    if (const int code = write(buffer.data(), size)) return fileError(code, "can't write", name);
+    passed += size;
+    if (NSErrorPtr stopped = observer.didPass(passed)) return stopped;
+  }
+}
+
+}  // namespace
+
+Outcome<HashedContents> hashContents(int file, const std::string& name, StreamObserver& observer) {
+  return stream(file, name, observer, [](const char*, std::size_t) { return 0; });
+}
+
+Outcome<HashedContents> copyContents(FileLayer& files, int file, int target,
+                                     const std::string& name, StreamObserver& observer) {
+  return stream(file, name, observer, [&](const char* data, std::size_t size) {
+    return files.write(target, {data, size});
+  });
+}
+
+int reserveSpace(FileLayer& files, int file, std::uint64_t size) {
+  if (size == 0) return 0;
+  if (const int refused = files.step(FileStep::Write, "reserve")) return refused;
+  if (fallocate(file, FALLOC_FL_KEEP_SIZE, 0, static_cast<off_t>(size)) == 0) return 0;
+  return errno == EOPNOTSUPP || errno == ENOSYS ? 0 : errno;
+}
+
+}  // namespace skein::vald
