@@ -5,6 +5,7 @@
 #include "base/Executor.h"
 #include "platform/fileprovider/NSFileProviderManager.h"
 #include "platform/foundation/NSNotificationCenter.h"
+#include "platform/launchservices/LSBundleProxy.h"
 #include "platform/log/Log.h"
 #include "support/RootURL.h"
 #include "support/VLLogSection.h"
@@ -12,6 +13,7 @@
 #include "vellum/VLContainer.h"
 #include "vellum/VLDaemonConnection.h"
 #include "vellum/VLDocuments.h"
+#include "vellum/VLFileOperations.h"
 
 namespace skein {
 
@@ -31,6 +33,11 @@ struct Environment {
   VLQueryItemLookup& queryItems;
   VLLogSections& logSections;
   RootURL& rootURL;
+  VLFileOperations& fileOperations;
+  VLFileManager& fileManager;
+  VLOperations& operations;
+  LSBundles& bundles;
+  Log& fileProviderLog;  // fp_current_or_default_log
 };
 
 }  // namespace skein

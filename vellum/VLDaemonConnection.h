@@ -98,6 +98,15 @@ class VLDaemon {
   virtual void getItemUpdateSenderWithReceiver(
       std::shared_ptr<VLItemNotificationReceiving> receiver,
       Reply<std::shared_ptr<VLItemNotificationSender>, NSErrorPtr> reply) = 0;
+
+  // getContainerURLForID:recreateDocumentsIfNeeded:reply:
+  // The documents folder of a container, made again when it is gone and that is wanted. The
+  // two values between are the container's display name and whether the folder was made
+  // just now. What stands here answers NSFeatureUnsupportedError, on the calling thread:
+  // a daemon that offers the call overrides it.
+  virtual void getContainerURLForID(
+      const std::string& containerID, bool recreateDocumentsIfNeeded,
+      Reply<NSURLPtr, std::optional<std::string>, bool, NSErrorPtr> reply);
 };
 
 // The process's connection to vald; it is made anew when it was lost. Any thread.

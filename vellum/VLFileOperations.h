@@ -76,7 +76,7 @@ class VLFileManager {
  public:
   virtual ~VLFileManager() = default;
 
-  // evictUbiquitousItemAtURL:error:
+  // evictUbiquitousItemAtURL:error: NO for nil, and for what is not safely uploaded.
   virtual bool evictUbiquitousItemAtURL(const NSURLPtr& url, NSErrorOut error) = 0;
   // vl_trashItemAtURL:resultingURL:error:
   virtual bool vl_trashItemAtURL(const NSURLPtr& url, NSURLPtr* resultingURL, NSErrorOut error) = 0;

@@ -1,6 +1,7 @@
 // What "%@" prints of a value. A type of another room adds an overload beside itself.
 #pragma once
 
+#include <cstdint>
 #include <memory>
 #include <optional>
 #include <string>
@@ -9,6 +10,7 @@
 
 #include "platform/fileprovider/NSFileProviderItem.h"
 #include "platform/foundation/NSData.h"
+#include "platform/foundation/NSDate.h"
 #include "platform/foundation/NSError.h"
 #include "platform/foundation/NSURL.h"
 
@@ -19,6 +21,10 @@ inline std::string description(const std::string& text) { return text; }
 inline std::string description(const char* text) { return text != nullptr ? text : "(null)"; }
 std::string description(const NSURL& url);
 std::string description(const NSData& data);
+// In whole seconds, UTC: "2026-11-24 21:40:00 +0000".
+std::string description(NSDate date);
+// A number that is an object, as a favourite rank is.
+std::string description(std::int64_t number);
 std::string description(const NSError& error);
 std::string description(const NSFileProviderItem& item);
 

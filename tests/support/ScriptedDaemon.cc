@@ -94,6 +94,12 @@ class ScriptedDaemon::Proxy final : public VLDaemon {
         },
         _errorHandler);
   }
+  void getContainerURLForID(
+      const std::string& containerID, bool recreateDocumentsIfNeeded,
+      Reply<NSURLPtr, std::optional<std::string>, bool, NSErrorPtr> reply) override {
+    say("url of container " + containerID + (recreateDocumentsIfNeeded ? ", recreated" : ""));
+    _daemon.containerURLs.hold(std::move(reply), _errorHandler);
+  }
 
  private:
   void say(const std::string& call) { _daemon._transcript.add("daemon: " + call); }

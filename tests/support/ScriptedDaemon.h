@@ -58,6 +58,7 @@ class ScriptedDaemon final : public VLDaemonConnection {
         ranks(ledger),
         workingSetChanges(ledger),
         senders(ledger),
+        containerURLs(ledger),
         _transcript(transcript),
         _ledger(ledger) {}
 
@@ -76,6 +77,7 @@ class ScriptedDaemon final : public VLDaemonConnection {
   HeldCalls<NSFileProviderItems, std::vector<VLFileObjectID>, std::optional<NSData>, NSErrorPtr>
       workingSetChanges;
   HeldCalls<std::shared_ptr<VLItemNotificationSender>, NSErrorPtr> senders;
+  HeldCalls<NSURLPtr, std::optional<std::string>, bool, NSErrorPtr> containerURLs;
 
  private:
   class Proxy;

@@ -10,6 +10,7 @@
 #include "platform/fileprovider/NSFileProviderManager.h"
 #include "tests/support/HeldCalls.h"
 #include "tests/support/ScriptedDaemon.h"
+#include "tests/support/ScriptedFiles.h"
 #include "tests/support/Transcript.h"
 #include "vellum/VLAccount.h"
 #include "vellum/VLContainer.h"
@@ -123,7 +124,11 @@ struct ScriptedFramework {
         daemon(transcript, ledger),
         documents(transcript),
         queryItems(transcript),
-        manager(transcript, ledger) {}
+        manager(transcript, ledger),
+        fileOperations(transcript, ledger),
+        fileManager(transcript),
+        operations(transcript),
+        bundles(transcript) {}
 
   // Every unanswered call's error handler runs, here, and receivers are let go of.
   void dropConnection(const NSErrorPtr& error) {
@@ -138,6 +143,10 @@ struct ScriptedFramework {
   ScriptedDocuments documents;
   ScriptedQueryItems queryItems;
   ScriptedProviderManager manager;
+  ScriptedFileOperations fileOperations;
+  ScriptedFileManager fileManager;
+  ScriptedOperations operations;
+  ScriptedBundles bundles;
 };
 
 }  // namespace skein

@@ -19,7 +19,12 @@ TestEnvironment::TestEnvironment(std::shared_ptr<Executor> other,
                   framework.documents,
                   framework.queryItems,
                   logSections,
-                  rootURL} {
+                  rootURL,
+                  framework.fileOperations,
+                  framework.fileManager,
+                  framework.operations,
+                  framework.bundles,
+                  fileProviderLog} {
   framework.containers.add(VLUbiquitousDefaultContainerID, storeURL());
   _previousFaultHandler =
       setFaultHandler([](std::string_view text) { ADD_FAILURE() << "a fault: " << text; });

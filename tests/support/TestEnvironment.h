@@ -35,6 +35,8 @@ class TestEnvironment {
 
   Transcript transcript;
   LogCapture log{transcript};
+  // Its lines are told apart by "fp: " before them.
+  LogCapture fileProviderLog{transcript, "fp: "};
   const std::shared_ptr<ManualExecutor> executor = std::make_shared<ManualExecutor>();
   NSNotificationCenter notificationCenter;
   ScriptedFramework framework{transcript};

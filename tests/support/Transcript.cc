@@ -20,7 +20,7 @@ std::string_view tagOf(LogType type) {
 
 void LogCapture::write(LogType type, std::string_view line) {
   EXPECT_TRUE(line.starts_with(tagOf(type))) << line;
-  _transcript.add(std::string(line));
+  _transcript.add(_mark + std::string(line));
 }
 
 }  // namespace skein

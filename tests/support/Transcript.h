@@ -40,13 +40,16 @@ class Transcript {
 // level's fails the test.
 class LogCapture final : public Log {
  public:
-  explicit LogCapture(Transcript& transcript) : _transcript(transcript) {
+  // `mark` stands before each line in the transcript.
+  explicit LogCapture(Transcript& transcript, std::string mark = "")
+      : _transcript(transcript), _mark(std::move(mark)) {
     setEnabled(LogType::Debug, true);
   }
   void write(LogType type, std::string_view line) override;
 
  private:
   Transcript& _transcript;
+  const std::string _mark;
 };
 
 }  // namespace skein
