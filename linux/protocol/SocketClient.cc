@@ -28,6 +28,7 @@ struct SocketClient::Core final : std::enable_shared_from_this<Core>,
   // A message under way. It fails at most once, and only while it is not answered.
   struct Message {
     Fail fail;  // empty: answered, or failed
+    bool failsOnLoop = false;
     std::uint64_t connection = 0;
     kj::Canceler canceler;
     std::list<std::shared_ptr<Message>>::iterator place;
@@ -232,6 +233,10 @@ void SocketClient::Core::finish(const MessagePtr& message, const NSErrorPtr& err
   Fail fail = std::exchange(message->fail, nullptr);
   messages.erase(message->place);
   if (!error) return;
+  if (message->failsOnLoop) {
+    fail(error);
+    return;
+  }
   executor->post([fail = std::move(fail), error]() mutable { fail(error); });
 }
 
@@ -335,6 +340,7 @@ void SocketClient::sendOver(std::uint64_t number, UniqueFunction<kj::Promise<Tas
                             Fail fail, Patience patience) {
   auto message = _core->newMessage(std::move(fail));
   message->connection = number;
+  message->failsOnLoop = true;
   if (number != _core->number || _core->connection.get() == nullptr) {
     _core->finish(message, _core->lastError ? _core->lastError : _core->lostError());
     return;

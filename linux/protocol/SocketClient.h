@@ -73,7 +73,8 @@ class SocketClient {
 
   // The number of the connection that the Send runs on.
   std::uint64_t currentConnection() const;
-  // Sends over connection `number` only; when it is gone, `fail` gets its error.
+  // Sends over connection `number` only; when it is gone, `fail` gets its error. This
+  // `fail` runs on the loop's thread, before whenLost() tells of the same end.
   void sendOver(std::uint64_t number, UniqueFunction<kj::Promise<Task>()> send, Fail fail,
                 Patience patience);
   // Calls `lost` when connection `number` ends, after its messages have failed; at once if

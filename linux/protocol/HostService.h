@@ -1,0 +1,123 @@
+// skein-host as the command line knows it. The same interface stands on both sides of the
+// socket: the host's requests implement it, the connection's proxies do too.
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "linux/protocol/LocalDaemon.h"
+
+namespace skein {
+
+// What a request is about: a path that begins at the drive's root ("/"), bytes, or an item
+// identifier, the reserved ones included.
+struct HostTarget {
+  enum class Kind : std::uint8_t { Path, Identifier };
+  Kind kind = Kind::Path;
+  std::string text = "/";
+
+  static HostTarget path(std::string text) { return {Kind::Path, std::move(text)}; }
+  static HostTarget identifier(std::string text) { return {Kind::Identifier, std::move(text)}; }
+};
+
+enum class HostOrder : std::uint8_t { Name = 0, Date = 1 };
+
+// One item, and where it is.
+struct HostItem {
+  NSFileProviderItemPtr item;
+  std::string path;  // from the drive's root
+  std::string url;   // of the file itself
+};
+
+// What happened to one item since it was last told of.
+struct HostChange {
+  enum class Kind : std::uint8_t { Created, Changed, Deleted };
+  Kind kind = Kind::Changed;
+  std::string identifier;
+  std::string filename;  // of a deleted item: the last one known; may be empty
+  // Set when the name changed.
+  std::optional<std::string> previousFilename;
+  NSFileProviderItemPtr item;  // null when deleted
+};
+
+struct HostChangeBatch {
+  NSFileProviderItems updates;
+  std::vector<std::string> deletions;
+  NSData token;
+  bool moreComing = false;
+};
+
+struct HostStatus {
+  LocalDaemonStatus daemon;
+  std::int64_t processID = 0;
+  std::uint64_t watchedContainers = 0;
+  std::uint64_t enumerators = 0;
+  bool debugLog = false;
+  std::string version;
+};
+
+struct HostDifference {
+  enum class Kind : std::uint8_t {
+    MissingInIndex,
+    MissingInStore,
+    Attributes,
+    Identity,
+    MissingInListing,  // on disk, not enumerated
+    OnlyInListing,     // enumerated, not on disk
+    Listing,           // the folder could not be listed, or an item is told wrongly
+  };
+  Kind kind = Kind::MissingInIndex;
+  std::string path;
+  std::string detail;
+};
+
+// How far a check is; the last one has `finished`.
+struct HostCheckStep {
+  std::vector<HostDifference> differences;
+  std::uint64_t folders = 0;  // so far
+  std::uint64_t items = 0;
+  bool finished = false;
+};
+
+// Something that is taken out bit by bit. next() may be called again before the answer
+// came; answers come in order. Letting go of the stream ends it.
+template <class... Values>
+class HostStream {
+ public:
+  virtual ~HostStream() = default;
+  virtual void next(Reply<Values..., NSErrorPtr> reply) = 0;
+};
+using HostListing = HostStream<NSFileProviderItems, bool>;  // a page; whether it is the last
+using HostWatch = HostStream<std::vector<HostChange>>;      // waits until there is a change
+using HostCheck = HostStream<HostCheckStep>;
+
+// Asynchronous: each reply runs once, on any thread but the caller's, from where further
+// calls may be made. An error comes with empty values.
+class HostService {
+ public:
+  virtual ~HostService() = default;
+
+  // Lists a folder, or with the reserved identifier all folders.
+  virtual void list(HostTarget container, HostOrder order,
+                    Reply<std::shared_ptr<HostListing>, NSErrorPtr> reply) = 0;
+  virtual void item(HostTarget target, Reply<HostItem, NSErrorPtr> reply) = 0;
+  virtual void identifierForPath(std::string path, Reply<std::string, NSErrorPtr> reply) = 0;
+  virtual void pathForIdentifier(std::string identifier, Reply<std::string, NSErrorPtr> reply) = 0;
+  // Replies once what changes from then on is told.
+  virtual void watch(HostTarget container, Reply<std::shared_ptr<HostWatch>, NSErrorPtr> reply) = 0;
+  // One batch of the working set's changes; nil: from the beginning.
+  virtual void changesSince(std::optional<NSData> token,
+                            Reply<HostChangeBatch, NSErrorPtr> reply) = 0;
+
+  virtual void account(Reply<std::optional<LocalAccount>, NSErrorPtr> reply) = 0;
+  virtual void logIn(LocalAccount account, Reply<NSErrorPtr> reply) = 0;
+  virtual void logOut(Reply<NSErrorPtr> reply) = 0;
+  virtual void status(Reply<HostStatus, NSErrorPtr> reply) = 0;
+  virtual void check(Reply<std::shared_ptr<HostCheck>, NSErrorPtr> reply) = 0;
+  virtual void setDebugLog(bool enabled, Reply<NSErrorPtr> reply) = 0;
+};
+
+}  // namespace skein
