@@ -1,0 +1,77 @@
+#include "linux/framework/LocalFramework.h"
+
+#include <utility>
+
+#include "linux/framework/LocalDocuments.h"
+#include "linux/framework/LocalQueryItemLookup.h"
+
+namespace skein {
+namespace {
+
+class LocalAccounts final : public VLAccounts {
+ public:
+  explicit LocalAccounts(std::shared_ptr<DriveState> state) : _state(std::move(state)) {}
+
+  void startAccountTokenChangeObserverIfNeeded() override { _state->postAccountChanges(); }
+  std::shared_ptr<const VLAccount> currentCachedLoggedInAccountWithError(
+      NSErrorOut error) override {
+    return _state->account(error);
+  }
+
+ private:
+  const std::shared_ptr<DriveState> _state;
+};
+
+class LocalContainers final : public VLContainers {
+ public:
+  explicit LocalContainers(std::shared_ptr<DriveState> state) : _state(std::move(state)) {}
+
+  VLContainersByID allContainersByContainerID() override { return _state->containers(); }
+  VLContainersByID allContainers() override {
+    _state->postContainerChanges();
+    return _state->containers();
+  }
+
+ private:
+  const std::shared_ptr<DriveState> _state;
+};
+
+class LocalDaemonConnection final : public VLDaemonConnection {
+ public:
+  explicit LocalDaemonConnection(std::shared_ptr<DaemonClient> client)
+      : _client(std::move(client)) {}
+
+  std::shared_ptr<VLDaemon> remoteObjectProxyWithErrorHandler(
+      std::function<void(NSErrorPtr)> errorHandler) override {
+    return _client->remoteObjectProxyWithErrorHandler(std::move(errorHandler));
+  }
+
+ private:
+  const std::shared_ptr<DaemonClient> _client;
+};
+
+}  // namespace
+
+LocalFramework::LocalFramework(std::shared_ptr<RpcLoop> loop, std::shared_ptr<Executor> executor,
+                               NSNotificationCenter& notificationCenter,
+                               DaemonClient::Options options)
+    : _access{loop, executor, std::make_shared<DaemonClient>(loop, executor, std::move(options))},
+      _state(std::make_shared<DriveState>(_access, notificationCenter)),
+      _accounts(std::make_unique<LocalAccounts>(_state)),
+      _containers(std::make_unique<LocalContainers>(_state)),
+      _connection(std::make_unique<LocalDaemonConnection>(_access.client)),
+      _documents(std::make_unique<LocalDocuments>(_access, _state)),
+      _queryItems(std::make_unique<LocalQueryItemLookup>(_access)) {
+  _state->attach();
+}
+
+DaemonClient::Options LocalFramework::optionsFor(const DrivePaths& paths) {
+  DaemonClient::Options options;
+  options.socketPath = paths.daemonSocket;
+  options.program = daemonProgram(paths.store, paths.daemonSocket, paths.daemonLog);
+  return options;
+}
+
+LocalFramework::~LocalFramework() = default;
+
+}  // namespace skein

@@ -1,0 +1,53 @@
+#pragma once
+
+#include <memory>
+
+#include "linux/framework/DriveState.h"
+#include "linux/framework/SyncCall.h"
+#include "linux/protocol/DaemonClient.h"
+#include "linux/protocol/DrivePaths.h"
+#include "vellum/VLAccount.h"
+#include "vellum/VLContainer.h"
+#include "vellum/VLDaemonConnection.h"
+#include "vellum/VLDocuments.h"
+
+namespace skein {
+
+// The Vellum framework's roles on this system, all over one connection to vald. Any
+// thread. Wired once, in main:
+//
+//   LocalFramework framework(loop, executor, notificationCenter,
+//                            LocalFramework::optionsFor(paths));
+//   Environment environment{log, executor, notificationCenter, providerManager,
+//                           framework.accounts(), framework.containers(), ...};
+class LocalFramework {
+ public:
+  // The center has to outlive the framework. Nothing is sent until something is asked.
+  LocalFramework(std::shared_ptr<RpcLoop> loop, std::shared_ptr<Executor> executor,
+                 NSNotificationCenter& notificationCenter, DaemonClient::Options options);
+  // To reach the drive's vald, and to start it.
+  static DaemonClient::Options optionsFor(const DrivePaths& paths);
+  ~LocalFramework();
+  LocalFramework(const LocalFramework&) = delete;
+  LocalFramework& operator=(const LocalFramework&) = delete;
+
+  VLAccounts& accounts() { return *_accounts; }
+  VLContainers& containers() { return *_containers; }
+  VLDaemonConnection& daemonConnection() { return *_connection; }
+  VLDocuments& documents() { return *_documents; }
+  VLQueryItemLookup& queryItems() { return *_queryItems; }
+
+  // vald with what only this host has.
+  const std::shared_ptr<DaemonClient>& client() const { return _access.client; }
+
+ private:
+  const DaemonAccess _access;
+  const std::shared_ptr<DriveState> _state;
+  const std::unique_ptr<VLAccounts> _accounts;
+  const std::unique_ptr<VLContainers> _containers;
+  const std::unique_ptr<VLDaemonConnection> _connection;
+  const std::unique_ptr<VLDocuments> _documents;
+  const std::unique_ptr<VLQueryItemLookup> _queryItems;
+};
+
+}  // namespace skein

@@ -1,0 +1,54 @@
+#pragma once
+
+#include <memory>
+#include <utility>
+
+#include "base/Executor.h"
+#include "base/Mutex.h"
+#include "linux/protocol/DaemonClient.h"
+
+namespace skein {
+
+// What calls that block go through. All outlive the calls.
+struct DaemonAccess {
+  std::shared_ptr<RpcLoop> loop;
+  std::shared_ptr<Executor> executor;
+  std::shared_ptr<DaemonClient> client;
+};
+
+// An error when the calling thread may not wait for the daemon, as it is the one that
+// would bring the answer; that is a fault too.
+NSErrorPtr errorIfMayNotWait(const DaemonAccess& access);
+
+// Calls start(daemon, reply) and waits until `reply` was called with a value and an error,
+// or the message failed. The wait ends with the message's deadline at the latest. Any
+// thread but the loop's.
+template <class T, class Start>
+std::pair<T, NSErrorPtr> askDaemon(const DaemonAccess& access, Start start) {
+  struct Answer {
+    Mutex mutex;
+    CondVar came;
+    bool there SKEIN_GUARDED_BY(mutex) = false;
+    std::pair<T, NSErrorPtr> value SKEIN_GUARDED_BY(mutex);
+
+    void set(T result, NSErrorPtr error) {
+      MutexLock lock(mutex);
+      value = {std::move(result), std::move(error)};
+      there = true;
+      came.notifyAll();
+    }
+  };
+
+  if (NSErrorPtr error = errorIfMayNotWait(access)) return {T{}, std::move(error)};
+  auto answer = std::make_shared<Answer>();
+  const auto daemon = access.client->remoteObjectProxyWithErrorHandler(
+      [answer](NSErrorPtr error) { answer->set(T{}, std::move(error)); });
+  start(*daemon,
+        [answer](T result, NSErrorPtr error) { answer->set(std::move(result), std::move(error)); });
+  ScopedWait wait(*access.executor);
+  MutexLock lock(answer->mutex);
+  while (!answer->there) answer->came.wait(answer->mutex);
+  return std::move(answer->value);
+}
+
+}  // namespace skein
