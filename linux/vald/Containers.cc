@@ -34,7 +34,22 @@ Containers::Containers(ContainerFolders folders, Log& log)
 }
 
 bool Containers::refresh() {
-  State state = look();
+  return keep({lookForApps(), hasDriveFolder(VLUbiquitousDocumentsFolderName),
+               hasDriveFolder(VLUbiquitousDesktopFolderName)});
+}
+
+bool Containers::refreshDriveFolders() {
+  State state;
+  {
+    MutexLock lock(_mutex);
+    state.apps = _state.apps;
+  }
+  state.hasDocuments = hasDriveFolder(VLUbiquitousDocumentsFolderName);
+  state.hasDesktop = hasDriveFolder(VLUbiquitousDesktopFolderName);
+  return keep(std::move(state));
+}
+
+bool Containers::keep(State state) {
   MutexLock lock(_mutex);
   if (state == _state) return false;
   _state = std::move(state);
@@ -87,10 +102,12 @@ std::vector<StoreRoot> Containers::storeRoots() const {
   return roots;
 }
 
-Containers::State Containers::look() const {
-  State state;
-  state.hasDocuments = isFolder(within(_folders.drive, VLUbiquitousDocumentsFolderName));
-  state.hasDesktop = isFolder(within(_folders.drive, VLUbiquitousDesktopFolderName));
+bool Containers::hasDriveFolder(const char* name) const {
+  return isFolder(within(_folders.drive, name));
+}
+
+std::vector<Containers::Known> Containers::lookForApps() const {
+  std::vector<Known> apps;
   for (AppContainer& app : appContainersInFolders(_folders.applications)) {
     const std::string folder = within(_folders.containers, app.containerID.c_str());
     const std::string documents = within(folder, VLUbiquitousDocumentsFolderName);
@@ -103,9 +120,9 @@ Containers::State Containers::look() const {
       VL_ERROR(_log, "[ERROR] can't make the container folder %@: %@", documents,
                std::generic_category().message(failure));
     }
-    state.apps.push_back(std::move(known));
+    apps.push_back(std::move(known));
   }
-  return state;
+  return apps;
 }
 
 }  // namespace skein::vald

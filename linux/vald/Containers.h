@@ -31,6 +31,9 @@ class Containers {
   // time, which may wait for the disk.
   bool refresh() SKEIN_EXCLUDES(_mutex);
 
+  // The same for Documents and Desktop alone, which costs two questions to the disk.
+  bool refreshDriveFolders() SKEIN_EXCLUDES(_mutex);
+
   // All of them, the drive's own first. Any thread.
   std::vector<VLContainer::Properties> list() const SKEIN_EXCLUDES(_mutex);
 
@@ -52,7 +55,9 @@ class Containers {
     friend bool operator==(const State&, const State&) = default;
   };
 
-  State look() const;
+  bool hasDriveFolder(const char* name) const;
+  std::vector<Known> lookForApps() const;
+  bool keep(State state) SKEIN_EXCLUDES(_mutex);
 
   const ContainerFolders _folders;
   Log& _log;

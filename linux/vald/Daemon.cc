@@ -258,4 +258,14 @@ void Daemon::refreshContainers() {
   });
 }
 
+void Daemon::refreshDriveFolders() {
+  if (_driveRefreshPosted.exchange(true)) return;
+  _containerQueue.async([self = shared_from_this()] {
+    self->_driveRefreshPosted.store(false);
+    if (self->_parts.containers.refreshDriveFolders()) {
+      self->_parts.subscribers.containerListDidChange();
+    }
+  });
+}
+
 }  // namespace skein::vald

@@ -67,6 +67,8 @@ class Daemon final : public LocalDaemon, public std::enable_shared_from_this<Dae
   // Looks at the containers again, soon, and tells the store and the subscribers what
   // differs. Calls that come before it has begun are one. Any thread.
   void refreshContainers();
+  // The same for the drive's own folders alone: for every change of the store.
+  void refreshDriveFolders();
 
  private:
   // Posts `work(daemon, reply)`.
@@ -82,6 +84,7 @@ class Daemon final : public LocalDaemon, public std::enable_shared_from_this<Dae
   SerialQueue _accountQueue;
   SerialQueue _containerQueue;
   std::atomic<bool> _refreshPosted{false};
+  std::atomic<bool> _driveRefreshPosted{false};
 };
 
 }  // namespace skein::vald

@@ -279,7 +279,10 @@ void ItemUpdateSender::pushWasAnswered() {
 
 void ItemUpdateSender::schedule() {
   if (std::exchange(_scheduled, true)) return;
-  _executor->post([self = shared_from_this()] { self->run(); });
+  // A visit that is still to come keeps nobody alive whose client is gone.
+  _executor->post([weak = weak_from_this()] {
+    if (const auto self = weak.lock()) self->run();
+  });
 }
 
 bool ItemUpdateSender::hasTooMuch() const {

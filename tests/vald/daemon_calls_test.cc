@@ -255,11 +255,19 @@ TEST_F(DaemonCalls, ContainersComeFromTheDriveAndFromDesktopEntries) {
   ASSERT_EQ(d.store->containers.size(), 2u);
   EXPECT_EQ(d.store->containers[1].containerID, "org.c");
 
+  std::filesystem::create_directory(d.state.path + "/aside");
+  std::filesystem::rename(d.drive.path + "/Documents", d.state.path + "/aside/Documents");
+  d.daemon->refreshDriveFolders();
+  d.executor->runAll();
+  EXPECT_FALSE(containers()[1].documentsURL);
+  EXPECT_EQ(containers().size(), 5u);
+  EXPECT_EQ(events->containerChanges, 2);
+
   std::filesystem::remove(d.applications.path + "/b.desktop");
   d.daemon->refreshContainers();
   d.executor->runAll();
   EXPECT_EQ(containers()[3].displayName, "Later");
-  EXPECT_EQ(events->containerChanges, 2);
+  EXPECT_EQ(events->containerChanges, 3);
   EXPECT_TRUE(std::filesystem::is_directory(d.state.path + "/org.c/Documents"));
 }
 

@@ -1,0 +1,54 @@
+#include "linux/vald/RunLock.h"
+
+#include <fcntl.h>
+#include <sys/file.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <system_error>
+#include <thread>
+
+#include "linux/protocol/UnixSocket.h"
+#include "vellum/VLErrors.h"
+
+namespace skein::vald {
+namespace {
+
+constexpr std::chrono::milliseconds kBetweenTries{50};
+
+bool somebodyAccepts(const std::string& socketPath) {
+  int code = 0;
+  return static_cast<bool>(connectToUnixSocket(socketPath, code));
+}
+
+}  // namespace
+
+RunLock::Outcome RunLock::take(const std::string& path, const std::string& socketPath,
+                               std::chrono::milliseconds patience, NSErrorOut error) {
+  const auto failed = [&](int code) {
+    error.store(vl_errorWithPOSIXCode(code, "The lock file " + path + " cannot be used: " +
+                                                std::generic_category().message(code) + "."));
+    return Outcome::Failed;
+  };
+  _file = FileDescriptor(open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600));
+  if (!_file) return failed(errno);
+  const auto deadline = std::chrono::steady_clock::now() + patience;
+  while (flock(_file.get(), LOCK_EX | LOCK_NB) != 0) {
+    if (errno != EWOULDBLOCK && errno != EINTR) return failed(errno);
+    if (somebodyAccepts(socketPath) || std::chrono::steady_clock::now() >= deadline) {
+      return Outcome::AlreadyRunning;
+    }
+    std::this_thread::sleep_for(kBetweenTries);
+  }
+  writeProcessID();
+  return Outcome::Taken;
+}
+
+void RunLock::writeProcessID() const {
+  const std::string text = std::to_string(getpid()) + '\n';
+  // For people alone: the lock is what counts, so a full disk stops nothing here.
+  if (ftruncate(_file.get(), 0) != 0) return;
+  [[maybe_unused]] const auto written = pwrite(_file.get(), text.data(), text.size(), 0);
+}
+
+}  // namespace skein::vald

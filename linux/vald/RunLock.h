@@ -1,0 +1,31 @@
+#pragma once
+
+#include <chrono>
+#include <optional>
+#include <string>
+
+#include "linux/protocol/FileDescriptor.h"
+#include "platform/foundation/NSError.h"
+
+namespace skein::vald {
+
+// Held by the one vald of a drive from before it listens until it has ended; the kernel
+// lets go of it with the process, however that ends. A child that is forked holds it too.
+class RunLock {
+ public:
+  enum class Outcome : std::uint8_t { Taken, AlreadyRunning, Failed };
+
+  // Takes the lock of the file at `path`, and writes the process's number there for people.
+  // While another process holds it but nobody accepts on `socketPath`, that one is about
+  // to come or to go: waits for it, until `patience` is over.
+  Outcome take(const std::string& path, const std::string& socketPath,
+               std::chrono::milliseconds patience, NSErrorOut error);
+
+  // Writes the number of the process that goes on with the lock.
+  void writeProcessID() const;
+
+ private:
+  FileDescriptor _file;
+};
+
+}  // namespace skein::vald
