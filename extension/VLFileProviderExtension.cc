@@ -1,11 +1,22 @@
 #include "extension/VLFileProviderExtension.h"
 
 #include "enumeration/EnumeratorSelection.h"
+#include "extension/operations/CreateDirectory.h"
+#include "extension/operations/DefaultApplicationContainer.h"
+#include "extension/operations/DeleteItem.h"
+#include "extension/operations/FavoriteRank.h"
+#include "extension/operations/ImportDocument.h"
+#include "extension/operations/LastUsedDate.h"
+#include "extension/operations/RenameItem.h"
+#include "extension/operations/ReparentItem.h"
+#include "extension/operations/TagData.h"
+#include "extension/operations/TrashItem.h"
+#include "extension/operations/UntrashItem.h"
 
 namespace skein {
 
 VLFileProviderExtension::VLFileProviderExtension(Environment& environment)
-    : _environment(environment), _identity(environment) {}
+    : _environment(environment), _identity(environment), _contents(environment) {}
 
 std::shared_ptr<VLFileProviderExtension> VLFileProviderExtension::init(
     std::shared_ptr<const NSExtensionAttributes> attributes, Environment& environment) {
@@ -63,6 +74,104 @@ std::shared_ptr<NSFileProviderEnumerator>
 VLFileProviderExtension::enumeratorForContainerItemIdentifier(
     const NSFileProviderItemIdentifier& identifier, NSErrorOut error) {
   return skein::enumeratorForContainerItemIdentifier(identifier, error, _identity, _environment);
+}
+
+// Contents.
+
+void VLFileProviderExtension::providePlaceholderAtURL(const NSURLPtr& /*url*/,
+                                                      ErrorCompletion completionHandler) {
+  Contents::providePlaceholder(std::move(completionHandler));
+}
+
+void VLFileProviderExtension::startProvidingItemAtURL(const NSURLPtr& url,
+                                                      std::uint64_t readingOptions,
+                                                      ErrorCompletion completionHandler) {
+  Contents::startProvidingItemAtURL(contents(), url, readingOptions, *_operationQueue,
+                                    std::move(completionHandler));
+}
+
+void VLFileProviderExtension::startProvidingItemAtURL(const NSURLPtr& url,
+                                                      ErrorCompletion completionHandler) {
+  startProvidingItemAtURL(url, /*readingOptions=*/0, std::move(completionHandler));
+}
+
+void VLFileProviderExtension::stopProvidingItemAtURL(const NSURLPtr& url) {
+  _contents.stopProvidingItemAtURL(url);
+}
+
+void VLFileProviderExtension::itemChangedAtURL(const NSURLPtr& url) {
+  _contents.itemChangedAtURL(url);
+}
+
+// Item operations.
+
+void VLFileProviderExtension::importDocumentAtURL(
+    const NSURLPtr& url, const NSFileProviderItemIdentifier& toParentItemIdentifier,
+    ItemCompletion completionHandler) {
+  skein::importDocumentAtURL(request(), url, toParentItemIdentifier, std::move(completionHandler));
+}
+
+void VLFileProviderExtension::createDirectoryWithName(
+    const std::string& name, const NSFileProviderItemIdentifier& inParentItemIdentifier,
+    ItemCompletion completionHandler) {
+  skein::createDirectoryWithName(request(), name, inParentItemIdentifier,
+                                 std::move(completionHandler));
+}
+
+void VLFileProviderExtension::renameItemWithIdentifier(
+    const NSFileProviderItemIdentifier& identifier, const std::string& toName,
+    ItemCompletion completionHandler) {
+  skein::renameItemWithIdentifier(request(), identifier, toName, std::move(completionHandler));
+}
+
+void VLFileProviderExtension::reparentItemWithIdentifier(
+    const NSFileProviderItemIdentifier& identifier,
+    const NSFileProviderItemIdentifier& toParentItemWithIdentifier,
+    std::optional<std::string> newName, ItemCompletion completionHandler) {
+  skein::reparentItemWithIdentifier(request(), identifier, toParentItemWithIdentifier,
+                                    std::move(newName), std::move(completionHandler));
+}
+
+void VLFileProviderExtension::trashItemWithIdentifier(
+    const NSFileProviderItemIdentifier& identifier, ItemCompletion completionHandler) {
+  skein::trashItemWithIdentifier(request(), identifier, std::move(completionHandler));
+}
+
+void VLFileProviderExtension::untrashItemWithIdentifier(
+    const NSFileProviderItemIdentifier& identifier,
+    std::optional<NSFileProviderItemIdentifier> toParentItemIdentifier,
+    ItemCompletion completionHandler) {
+  skein::untrashItemWithIdentifier(request(), identifier, std::move(toParentItemIdentifier),
+                                   std::move(completionHandler));
+}
+
+void VLFileProviderExtension::deleteItemWithIdentifier(
+    const NSFileProviderItemIdentifier& identifier, ErrorCompletion completionHandler) {
+  skein::deleteItemWithIdentifier(request(), identifier, std::move(completionHandler));
+}
+
+void VLFileProviderExtension::setLastUsedDate(std::optional<NSDate> date,
+                                              const NSFileProviderItemIdentifier& forItemIdentifier,
+                                              ItemCompletion completionHandler) {
+  skein::setLastUsedDate(request(), date, forItemIdentifier, std::move(completionHandler));
+}
+
+void VLFileProviderExtension::setTagData(std::optional<NSData> tagData,
+                                         const NSFileProviderItemIdentifier& forItemIdentifier,
+                                         ItemCompletion completionHandler) {
+  skein::setTagData(request(), tagData, forItemIdentifier, std::move(completionHandler));
+}
+
+void VLFileProviderExtension::setFavoriteRank(std::optional<std::int64_t> rank,
+                                              const NSFileProviderItemIdentifier& forItemIdentifier,
+                                              ItemCompletion completionHandler) {
+  skein::setFavoriteRank(request(), rank, forItemIdentifier, std::move(completionHandler));
+}
+
+void VLFileProviderExtension::_defaultApplicationContainerForBundleIdentifier(
+    std::optional<std::string> bundleIdentifier, ItemCompletion completionHandler) {
+  skein::_defaultApplicationContainerForBundleIdentifier(request(), bundleIdentifier,
+                                                         std::move(completionHandler));
 }
 
 }  // namespace skein

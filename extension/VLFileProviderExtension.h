@@ -1,24 +1,24 @@
 #pragma once
 
-#include <map>
 #include <memory>
+#include <optional>
 #include <string>
 
-#include "base/Mutex.h"
 #include "base/SerialQueue.h"
+#include "extension/Contents.h"
 #include "extension/ItemIdentity.h"
+#include "extension/operations/ItemRequest.h"
 #include "platform/fileprovider/NSFileProviderExtension.h"
 #include "platform/foundation/NSOperation.h"
 #include "support/Environment.h"
 
 namespace skein {
 
-class VLFileProvidingOperation;
-
 // The extension's principal class: what a host instantiates by name and calls from its
 // own threads, several operations at once. Every operation is one line that hands it to
 // the room that does it; operations that are not named here behave as the platform's.
-class VLFileProviderExtension final : public NSFileProviderExtension {
+class VLFileProviderExtension final : public NSFileProviderExtension,
+                                      public std::enable_shared_from_this<VLFileProviderExtension> {
  public:
   // init
   // Null, with nothing created or registered, when the superclass refuses `attributes`.
@@ -38,6 +38,45 @@ class VLFileProviderExtension final : public NSFileProviderExtension {
       const NSFileProviderItemIdentifier& identifier, NSErrorOut error) override;
   NSErrorPtr fileProviderErrorFromFSError(const NSErrorPtr& error) override;
 
+  void providePlaceholderAtURL(const NSURLPtr& url, ErrorCompletion completionHandler) override;
+  void startProvidingItemAtURL(const NSURLPtr& url, std::uint64_t readingOptions,
+                               ErrorCompletion completionHandler) override;
+  void startProvidingItemAtURL(const NSURLPtr& url, ErrorCompletion completionHandler) override;
+  void stopProvidingItemAtURL(const NSURLPtr& url) override;
+  void itemChangedAtURL(const NSURLPtr& url) override;
+
+  void importDocumentAtURL(const NSURLPtr& url,
+                           const NSFileProviderItemIdentifier& toParentItemIdentifier,
+                           ItemCompletion completionHandler) override;
+  void createDirectoryWithName(const std::string& name,
+                               const NSFileProviderItemIdentifier& inParentItemIdentifier,
+                               ItemCompletion completionHandler) override;
+  void renameItemWithIdentifier(const NSFileProviderItemIdentifier& identifier,
+                                const std::string& toName,
+                                ItemCompletion completionHandler) override;
+  void reparentItemWithIdentifier(const NSFileProviderItemIdentifier& identifier,
+                                  const NSFileProviderItemIdentifier& toParentItemWithIdentifier,
+                                  std::optional<std::string> newName,
+                                  ItemCompletion completionHandler) override;
+  void trashItemWithIdentifier(const NSFileProviderItemIdentifier& identifier,
+                               ItemCompletion completionHandler) override;
+  void untrashItemWithIdentifier(const NSFileProviderItemIdentifier& identifier,
+                                 std::optional<NSFileProviderItemIdentifier> toParentItemIdentifier,
+                                 ItemCompletion completionHandler) override;
+  void deleteItemWithIdentifier(const NSFileProviderItemIdentifier& identifier,
+                                ErrorCompletion completionHandler) override;
+  void setLastUsedDate(std::optional<NSDate> date,
+                       const NSFileProviderItemIdentifier& forItemIdentifier,
+                       ItemCompletion completionHandler) override;
+  void setTagData(std::optional<NSData> tagData,
+                  const NSFileProviderItemIdentifier& forItemIdentifier,
+                  ItemCompletion completionHandler) override;
+  void setFavoriteRank(std::optional<std::int64_t> rank,
+                       const NSFileProviderItemIdentifier& forItemIdentifier,
+                       ItemCompletion completionHandler) override;
+  void _defaultApplicationContainerForBundleIdentifier(std::optional<std::string> bundleIdentifier,
+                                                       ItemCompletion completionHandler) override;
+
  private:
   explicit VLFileProviderExtension(Environment& environment);
 
@@ -45,14 +84,16 @@ class VLFileProviderExtension final : public NSFileProviderExtension {
   // neither caches nor queues.
   void _accountDidChange();
 
+  // The lookups and the contents, held together with this object: what an asynchronous
+  // operation keeps until it has answered.
+  ItemRequest request() { return {{shared_from_this(), &_identity}, _environment}; }
+  std::shared_ptr<Contents> contents() { return {shared_from_this(), &_contents}; }
+
   Environment& _environment;
   ItemIdentity _identity;
 
   // Destroyed from the last to the first: no queue may outlive what its work refers to.
-  Monitor _lock;
-  // The download under way for a file's path, at most one.
-  std::map<std::string, std::shared_ptr<VLFileProvidingOperation>> _downloadOperationByPath
-      SKEIN_GUARDED_BY(_lock);
+  Contents _contents;
   std::shared_ptr<NSOperationQueue> _operationQueue;
   std::shared_ptr<SerialQueue> _queue;
 };

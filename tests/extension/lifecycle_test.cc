@@ -63,8 +63,8 @@ TEST_F(Lifecycle, ServesLookupsAndEnumeratorsAndRefusesTheRestPlainly) {
   EXPECT_EQ(brief(host.fileProviderErrorFromFSError(exists)), "NSFileProviderErrorDomain -1001");
 
   NSErrorPtr refused;
-  host.trashItemWithIdentifier(
-      one, [&](NSFileProviderItemPtr, NSErrorPtr error) { refused = std::move(error); });
+  host.fetchThumbnailsForItemIdentifiers({one}, NSSize{}, nullptr,
+                                         [&](NSErrorPtr error) { refused = std::move(error); });
   EXPECT_EQ(brief(refused), "NSCocoaErrorDomain 3328");
 }
 
