@@ -70,9 +70,9 @@ void VLFileEnumerator::_linkToSender(const std::shared_ptr<VLItemNotificationSen
     sender->invalidate();
     return;
   }
-  // Weak, since the enumerator keeps the proxy and with it this handler: held strongly, an
-  // enumerator that was let go of without invalidate would keep itself alive, and one whose
-  // sender was replaced by an overlapping setup would live on in the handlers of the first.
+  // Weak: the enumerator keeps the proxy, and the proxy this handler. Held strongly, an
+  // enumerator that was let go of without invalidate would keep itself alive for good. The
+  // watch's reply below is a running request: that one holds the enumerator until it ends.
   const auto errorHandler = [weak = weak_from_this()](NSErrorPtr error) {
     if (const auto self = weak.lock()) self->_handleNotificationError(std::move(error));
   };

@@ -68,6 +68,8 @@ TEST_F(Changes, EachBatchIsOneRankAndNothingIsNone) {
   // The current anchor has rank 0 whatever the rank is, and so has expired by now.
   EXPECT_EQ(currentAnchor(), first);
   EXPECT_TRUE(expired(first));
+  // The reset that came with it begins at rank 0 again.
+  EXPECT_EQ(changes(currentAnchor())->error, nullptr);
 }
 
 TEST_F(Changes, AnExpiredAnchorIsToldThenTheStateIsReset) {

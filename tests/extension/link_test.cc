@@ -112,6 +112,16 @@ TEST_F(Link, AnAccountChangeMattersOnlyWhileUnlinked) {
   EXPECT_EQ(env.transcript.take(), expected);
 }
 
+// What no host may do: the poster would wait for a queue that waits for the poster. Here it
+// shows at once.
+TEST_F(Link, ANotificationPostedWhereTheQueueNeedsThePosterIsADeadlock) {
+  testing::FLAGS_gtest_death_test_style = "threadsafe";
+  link();
+  enumerator->invalidate();  // work on the queue that only this thread runs
+  EXPECT_DEATH(env.notificationCenter.postNotificationName(VLAccountTokenDidChangeNotification),
+               "would wait for ever");
+}
+
 TEST_F(Link, TheContainersAreWatchedAtTheRootAlone) {
   link();
   EXPECT_EQ(observers(VLContainerListDidChangeNotification), 0u);

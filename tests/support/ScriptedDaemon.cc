@@ -114,7 +114,10 @@ class ScriptedDaemon::Proxy final : public VLDaemon {
 
 std::shared_ptr<VLDaemon> ScriptedDaemon::remoteObjectProxyWithErrorHandler(
     std::function<void(NSErrorPtr)> errorHandler) {
-  return std::make_shared<Proxy>(*this, std::move(errorHandler));
+  auto proxy = std::make_shared<Proxy>(*this, std::move(errorHandler));
+  MutexLock lock(_mutex);
+  _proxies.push_back(proxy);
+  return proxy;
 }
 
 std::shared_ptr<ScriptedSender> ScriptedDaemon::makeSender() {

@@ -62,8 +62,9 @@ class ScriptedDaemon final : public VLDaemonConnection {
         _transcript(transcript),
         _ledger(ledger) {}
 
+  // Keeps what it makes, and so the error handlers, as a framework may.
   std::shared_ptr<VLDaemon> remoteObjectProxyWithErrorHandler(
-      std::function<void(NSErrorPtr)> errorHandler) override;
+      std::function<void(NSErrorPtr)> errorHandler) override SKEIN_EXCLUDES(_mutex);
 
   // A sender to answer `senders` with, named "sender N" from 1 on.
   std::shared_ptr<ScriptedSender> makeSender() SKEIN_EXCLUDES(_mutex);
@@ -86,6 +87,7 @@ class ScriptedDaemon final : public VLDaemonConnection {
   CallLedger& _ledger;
   Mutex _mutex;
   std::vector<std::weak_ptr<ScriptedSender>> _senders SKEIN_GUARDED_BY(_mutex);
+  std::vector<std::shared_ptr<VLDaemon>> _proxies SKEIN_GUARDED_BY(_mutex);
 };
 
 }  // namespace skein
