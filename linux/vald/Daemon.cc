@@ -39,6 +39,7 @@ NSErrorPtr expired() {
 Daemon::Daemon(DaemonParts parts)
     : _parts(std::move(parts)),
       _accountQueue("vald-accounts", _parts.executor),
+      _checkQueue("vald-checks", _parts.slowExecutor),
       _containerQueue("vald-containers", _parts.executor) {}
 
 template <class R, class Work>
@@ -190,6 +191,11 @@ void Daemon::logOut(Reply<NSErrorPtr> reply) {
 
 void Daemon::accountChanged() {
   const std::optional<LocalAccount> account = _parts.accounts.current();
+  if (account) {
+    VL_NOTICE(_parts.log, "[NOTICE] %@ logged in", account->name);
+  } else {
+    VL_NOTICE(_parts.log, "[NOTICE] the account logged out");
+  }
   // A client that is linked hears of the change through its link alone.
   _parts.senders.breakAll(
       account ? NSError::errorWithDomain(
@@ -230,8 +236,8 @@ void Daemon::status(Reply<LocalDaemonStatus, NSErrorPtr> reply) {
 
 void Daemon::checkIndex(std::uint64_t limit,
                         Reply<std::vector<IndexDifference>, NSErrorPtr> reply) {
-  answer(std::move(reply), [limit](Daemon& self, auto& answered) {
-    answered(self._parts.store.check(std::min(limit, kMostDifferences)), nullptr);
+  _checkQueue.async([self = shared_from_this(), limit, reply = std::move(reply)]() mutable {
+    reply(self->_parts.store.check(std::min(limit, kMostDifferences)), nullptr);
   });
 }
 
@@ -253,7 +259,9 @@ void Daemon::refreshContainers() {
   _containerQueue.async([self = shared_from_this()] {
     self->_refreshPosted.store(false);
     if (!self->_parts.containers.refresh()) return;
-    self->_parts.store.setContainers(self->_parts.containers.storeRoots());
+    std::vector<StoreRoot> roots = self->_parts.containers.storeRoots();
+    VL_INFO(self->_parts.log, "[INFO] the containers changed, %lu apps have one", roots.size());
+    self->_parts.store.setContainers(std::move(roots));
     self->_parts.subscribers.containerListDidChange();
   });
 }

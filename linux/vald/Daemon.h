@@ -18,11 +18,14 @@ namespace skein::vald {
 // What the daemon works with; each outlives it and what it posted.
 struct DaemonParts {
   std::shared_ptr<Executor> executor;
+  // For what takes minutes, so that it never keeps a listing waiting.
+  std::shared_ptr<Executor> slowExecutor;
   Store& store;
   ItemUpdateSenders& senders;
   Accounts& accounts;
   Containers& containers;
   EventSubscribers& subscribers;
+  Log& log;
   std::string drive;           // the drive's folder, absolute
   std::function<void()> stop;  // asks the process to end; returns at once
 };
@@ -82,6 +85,7 @@ class Daemon final : public LocalDaemon, public std::enable_shared_from_this<Dae
 
   const DaemonParts _parts;
   SerialQueue _accountQueue;
+  SerialQueue _checkQueue;  // one check of the index at a time
   SerialQueue _containerQueue;
   std::atomic<bool> _refreshPosted{false};
   std::atomic<bool> _driveRefreshPosted{false};

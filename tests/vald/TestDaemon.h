@@ -30,8 +30,10 @@ class TemporaryFolder {
 
 class QuietLog final : public Log {
  public:
-  void write(LogType, std::string_view line) override { lines.emplace_back(line); }
-  std::vector<std::string> lines;
+  void write(LogType type, std::string_view line) override {
+    if (type == LogType::Error) errors.emplace_back(line);
+  }
+  std::vector<std::string> errors;
 };
 
 // Keeps what was pushed, and the replies until the test gives them.
@@ -73,8 +75,9 @@ class TestDaemon {
     store.emplace(drive.path, senders, settings);
     accounts.emplace(*store, "somebody", log);
     containers.emplace(ContainerFolders{drive.path, state.path, {applications.path}}, log);
-    daemon = std::make_shared<Daemon>(DaemonParts{executor, *store, senders, *accounts, *containers,
-                                                  subscribers, drive.path, [this] { ++stops; }});
+    daemon = std::make_shared<Daemon>(DaemonParts{executor, executor, *store, senders, *accounts,
+                                                  *containers, subscribers, log, drive.path,
+                                                  [this] { ++stops; }});
   }
 
   // Makes the call that `request(daemon, reply)` makes, and runs everything; the test

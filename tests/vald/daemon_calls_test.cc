@@ -196,7 +196,7 @@ TEST_F(DaemonCalls, AnAccountSurvivesAReopeningAndChangesAreTold) {
   d.settings["account"] = "in\n";
   d.open();
   EXPECT_EQ(account(), std::nullopt);
-  EXPECT_EQ(d.log.lines.size(), 1u);
+  EXPECT_EQ(d.log.errors.size(), 1u);
 }
 
 TEST_F(DaemonCalls, LoggedOutEndsListingsAndLinksButNoLookups) {

@@ -1,4 +1,10 @@
 // What update senders push, and when they stop.
+#include <atomic>
+#include <chrono>
+#include <future>
+#include <map>
+
+#include "base/ThreadPool.h"
 #include "tests/vald/TestDaemon.h"
 #include "vellum/VLErrors.h"
 
@@ -240,6 +246,80 @@ TEST_F(BoundedSenders, BreakWhatTheStoresOverflowConcerns) {
   EXPECT_TRUE(broke(folder, 19, std::nullopt));
   EXPECT_FALSE(broke(folder, 19, deep));
   EXPECT_FALSE(broke(other, 23, folder));
+}
+
+// Replies from another thread, a little later, as a client does.
+class RemoteReceiver final : public VLItemNotificationReceiving {
+ public:
+  explicit RemoteReceiver(std::shared_ptr<Executor> executor) : _executor(std::move(executor)) {}
+
+  void receiveUpdates(const VLQueryItems& items, const std::vector<std::string>&,
+                      const std::vector<std::string>&, Reply<> reply) override {
+    MutexLock lock(_mutex);
+    for (const auto& item : items) _latest[item->fileObjectID()] = item->properties().size;
+    overlapped = overlapped || std::exchange(_unanswered, true);
+    _pushed.notifyAll();
+    _executor->post([this, reply = std::move(reply)]() mutable {
+      {
+        MutexLock replying(_mutex);
+        _unanswered = false;
+      }
+      reply();
+    });
+  }
+  void receiveProgressUpdates(const VLQueryItems&, Reply<>) override {}
+
+  // Whether the item came to this state before the deadline.
+  bool waitFor(VLFileObjectID id, std::uint64_t size) {
+    const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(30);
+    MutexLock lock(_mutex);
+    while (_latest[id] != size) {
+      if (!_pushed.waitUntil(_mutex, deadline)) return _latest[id] == size;
+    }
+    return true;
+  }
+
+  std::atomic<bool> overlapped{false};
+
+ private:
+  const std::shared_ptr<Executor> _executor;
+  Mutex _mutex;
+  CondVar _pushed;
+  bool _unanswered SKEIN_GUARDED_BY(_mutex) = false;
+  std::map<VLFileObjectID, std::uint64_t> _latest SKEIN_GUARDED_BY(_mutex);
+};
+
+TEST(SendersWithThreads, DeliverTheLatestStateOfEveryItemOneByOne) {
+  FakeStore::Settings settings;
+  const auto executor = std::make_shared<ThreadPool>(4, "test");
+  const auto clients = std::make_shared<ThreadPool>(2, "clients");
+  ItemUpdateSenders senders(executor);
+  FakeStore store("/drive", senders, settings);
+  std::vector<VLFileObjectID> files;
+  for (int i = 0; i < 300; ++i) {
+    files.push_back(store.addFile(std::to_string(i), store.root()));
+  }
+  std::vector<std::shared_ptr<RemoteReceiver>> receivers;
+  std::vector<std::shared_ptr<ItemUpdateSender>> watches;
+  for (int i = 0; i < 4; ++i) {
+    receivers.push_back(std::make_shared<RemoteReceiver>(clients));
+    watches.push_back(senders.make(receivers.back(), store, nullptr));
+    std::promise<NSErrorPtr> gathered;
+    watches.back()->watchItemAtURL(NSURL::fileURLWithPath("/drive"), 19,
+                                   [&](NSErrorPtr error) { gathered.set_value(error); });
+    ASSERT_FALSE(gathered.get_future().get());
+  }
+
+  constexpr std::uint64_t kRounds = 50;
+  for (std::uint64_t round = 1; round <= kRounds; ++round) {
+    for (const auto& file : files) store.touch(file);
+    if (round == kRounds / 2) watches.back()->invalidate();
+  }
+  for (int i = 0; i < 3; ++i) {
+    for (const auto& file : files) EXPECT_TRUE(receivers[i]->waitFor(file, kRounds));
+    EXPECT_FALSE(receivers[i]->overlapped);
+  }
+  watches.clear();
 }
 
 }  // namespace
