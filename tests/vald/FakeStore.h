@@ -7,11 +7,12 @@
 #include <string>
 #include <vector>
 
+#include "base/Mutex.h"
 #include "linux/vald/Store.h"
 
 namespace skein::vald {
 
-// On the test's thread alone.
+// On one thread at a time, but for the folder watches.
 class FakeStore final : public Store {
  public:
   // What survives a reopening.
@@ -39,8 +40,8 @@ class FakeStore final : public Store {
   std::uint64_t currentRank() override { return _journal.size(); }
   ChangePage changesSince(std::uint64_t rank, std::uint64_t limit, NSErrorOut error) override;
   std::string journalID() override { return journal; }
-  void retainFolderWatch(VLFileObjectID folder) override { ++watches[folder]; }
-  void releaseFolderWatch(VLFileObjectID folder) override { --watches[folder]; }
+  void retainFolderWatch(VLFileObjectID folder) override { addWatch(folder, 1); }
+  void releaseFolderWatch(VLFileObjectID folder) override { addWatch(folder, -1); }
   void setContainers(std::vector<StoreRoot> roots) override { containers = std::move(roots); }
   void status(LocalDaemonStatus& status) override { status.documents = _nodes.size(); }
   std::vector<IndexDifference> check(std::uint64_t limit) override;
@@ -49,7 +50,8 @@ class FakeStore final : public Store {
   bool settle(std::chrono::milliseconds) override { return true; }
 
   std::string journal = "7d0c5f0e-7a55-4e0f-9a51-0a5b9f9a2f11";
-  std::map<VLFileObjectID, int> watches;
+  // How many watches are retained. Any thread.
+  int watches(VLFileObjectID folder) { return addWatch(folder, 0); }
   std::vector<StoreRoot> containers;
   std::uint64_t lastLimit = 0;  // of the latest listing or change request
 
@@ -59,6 +61,10 @@ class FakeStore final : public Store {
     VLFileObjectID parent;
   };
 
+  int addWatch(VLFileObjectID folder, int count) SKEIN_EXCLUDES(_watchMutex) {
+    MutexLock lock(_watchMutex);
+    return _watches[folder] += count;
+  }
   VLFileObjectID add(const std::string& name, VLFileObjectID parent, VLQueryItem::Kind kind);
   void record(VLQueryItem::Properties item, VLFileObjectID folder, VLFileObjectID previous);
   Page page(const std::map<std::string, VLQueryItemPtr>& sorted, std::uint64_t offset,
@@ -72,6 +78,8 @@ class FakeStore final : public Store {
   std::uint64_t _forgotten = 0;
   std::map<VLFileObjectID, Node> _nodes;
   std::vector<StoreChange> _journal;
+  Mutex _watchMutex;
+  std::map<VLFileObjectID, int> _watches SKEIN_GUARDED_BY(_watchMutex);
 };
 
 }  // namespace skein::vald

@@ -5,6 +5,7 @@
 #include <map>
 
 #include "base/ThreadPool.h"
+#include "linux/vald/ClosableExecutor.h"
 #include "tests/vald/TestDaemon.h"
 #include "vellum/VLErrors.h"
 
@@ -52,7 +53,7 @@ TEST_F(Senders, PushTheFoldersOwnChildrenAndItselfAndWhatMovesInAndOut) {
   watch(sender, folder);
   d.executor->runAll();
   ASSERT_EQ(gathered, std::vector<NSErrorPtr>{nullptr});
-  EXPECT_EQ(store.watches[folder], 1);
+  EXPECT_EQ(store.watches(folder), 1);
 
   const auto below = store.addFolder("below", folder);
   store.addFile("deep", below);
@@ -175,7 +176,7 @@ TEST_F(Senders, PushNothingAfterInvalidateOrTheLastReference) {
     EXPECT_EQ(pushed().size(), 1u);
     EXPECT_EQ(receiver.use_count(), 1);
     EXPECT_EQ(d.senders.count(), 0u);
-    EXPECT_EQ(store.watches[folder], 0);
+    EXPECT_EQ(store.watches(folder), 0);
   }
 }
 
@@ -219,7 +220,7 @@ TEST_F(BoundedSenders, BreakTheLinkOfAReceiverThatStopped) {
     d.executor->runAll();
     EXPECT_EQ(receiver->pushes.size(), 1u);
     EXPECT_EQ(receiver.use_count(), 1);
-    EXPECT_EQ(store.watches[folder], 0);
+    EXPECT_EQ(store.watches(folder), 0);
     // Who asks too late hears of it too.
     listen(sender);
     d.executor->runAll();
@@ -291,7 +292,7 @@ class RemoteReceiver final : public VLItemNotificationReceiving {
 
 TEST(SendersWithThreads, DeliverTheLatestStateOfEveryItemOneByOne) {
   FakeStore::Settings settings;
-  const auto executor = std::make_shared<ThreadPool>(4, "test");
+  const auto executor = std::make_shared<ClosableExecutor>(4, "test");
   const auto clients = std::make_shared<ThreadPool>(2, "clients");
   ItemUpdateSenders senders(executor);
   FakeStore store("/drive", senders, settings);
@@ -320,6 +321,8 @@ TEST(SendersWithThreads, DeliverTheLatestStateOfEveryItemOneByOne) {
     EXPECT_FALSE(receivers[i]->overlapped);
   }
   watches.clear();
+  executor->close();
+  EXPECT_EQ(store.watches(store.root()), 0);
 }
 
 }  // namespace
