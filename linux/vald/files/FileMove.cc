@@ -1,0 +1,177 @@
+// Renaming and moving, and the rule that says which moves there are.
+#include <cerrno>
+
+#include "linux/vald/files/FileErrors.h"
+#include "linux/vald/files/FileNames.h"
+#include "linux/vald/files/FileOperations.h"
+#include "linux/vald/files/TrashInfo.h"
+
+namespace skein::vald {
+namespace {
+
+constexpr unsigned kMostBounces = 10'000;
+
+NSErrorPtr refused(const std::string& words, const std::string& path) {
+  return fileErrorWithWords(NSFileWriteNoPermissionError, EACCES,
+                            "can't move \"" + printable(path) + "\": " + words, path);
+}
+
+// By the folder's own list, since a file system that folds case answers for both.
+bool hasExactName(const DirectoryHandle& folder, const std::string& name) {
+  bool found = false;
+  const int failure = folder.list([&](const std::string& entry) {
+    found = entry == name;
+    return !found;
+  });
+  return found || failure != 0;
+}
+
+}  // namespace
+
+NSErrorPtr FileOperations::refusalOfMove(const StorePlace& from, const std::string& folder,
+                                         const std::string& name, StorePlace& to,
+                                         std::uint64_t& capability) const {
+  capability = 0;
+  const std::string path = from.path();
+  const auto trashed = trashedPath(from.relative);
+  if (from.isRoot()) return refused("it is the drive's own folder", path);
+  if (trashed && trashed->name.empty()) return refused("it belongs to the trash itself", path);
+  if (!_roots.contains(folder)) return refused("the folder is not in the drive", path);
+  if (isAtOrBelow(folder, path)) return refused("a folder can't go into itself", path);
+  if (NSErrorPtr error = _roots.locate(folder, name, to)) return error;
+  if (trashedPath(to.relative)) {
+    return refused("into the trash things go by trashing them alone", path);
+  }
+  struct stat status {};
+  if (const int failure = from.folder.status(from.name, status)) {
+    return fileError(failure, "can't find", path);
+  }
+  const std::uint64_t mount = from.folder.mountOf(from.name);
+  if (mount != to.folder.mountOf()) {
+    return refused(mount != from.folder.mountOf()
+                       ? "a volume is mounted there"
+                       : "the folder is on another volume; bring in a copy and remove this one",
+                   path);
+  }
+  if (trashed) {
+    capability = kMayMoveOutOfTrash;
+  } else if (from.root != to.root) {
+    capability = kMayMoveToAnotherRoot;
+  } else {
+    capability = from.folderRelative == to.folderRelative ? kMayRename : kMayMoveToAnotherFolder;
+  }
+  return nullptr;
+}
+
+std::uint64_t FileOperations::capabilityToMove(const std::string& path, const std::string& to,
+                                               NSErrorOut error) const {
+  StorePlace from;
+  StorePlace place;
+  std::uint64_t capability = 0;
+  NSErrorPtr failure = _roots.locate(path, from);
+  if (!failure) {
+    failure = refusalOfMove(from, parentOfPath(to), nameOfPath(to), place, capability);
+  }
+  if (failure) error.store(failure);
+  return capability;
+}
+
+FileResult FileOperations::rename(const std::string& path, const std::string& newName,
+                                  const FileRequest& request) {
+  StorePlace from;
+  Hold hold;
+  // The name first: what cannot be is refused before anything is waited for.
+  if (NSErrorPtr error = refusalOfName(newName, false)) return {{}, error};
+  const std::string newPath = joinPath(parentOfPath(path), newName);
+  if (NSErrorPtr error = take(path, {path, newPath}, from, hold)) return {{}, error};
+  if (trashedPath(from.relative)) {
+    return {{}, refused("it is in the trash; put it back first", path)};
+  }
+  return moveTo(from, from.folderPath(), newName, false, OperationKind::Rename, request);
+}
+
+FileResult FileOperations::move(const std::string& path, const std::string& folder,
+                                const std::optional<std::string>& newName, bool bounce,
+                                const FileRequest& request) {
+  if (newName) {
+    if (NSErrorPtr error = refusalOfName(*newName, false)) return {{}, error};
+  }
+  std::string name = newName.value_or(nameOfPath(path));
+  StorePlace from;
+  Hold hold;
+  if (NSErrorPtr error = take(path, {path, joinPath(folder, name)}, from, hold)) {
+    return {{}, error};
+  }
+  OperationKind kind = OperationKind::Move;
+  const auto trashed = trashedPath(from.relative);
+  if (trashed && trashed->below.empty()) {
+    kind = OperationKind::PutBack;
+    // In the trash it may have had to be called otherwise.
+    const FileResult before = putBackPath(from.path());
+    if (!newName && !before.error) name = nameOfPath(before.path);
+  }
+  return moveTo(from, folder, name, bounce, kind, request);
+}
+
+FileResult FileOperations::moveTo(const StorePlace& from, const std::string& folder,
+                                  const std::string& name, bool bounce, OperationKind kind,
+                                  const FileRequest& request) {
+  StorePlace to;
+  NSErrorPtr error;
+  for (unsigned number = 1; number <= (bounce ? kMostBounces : 1); ++number) {
+    std::uint64_t capability = 0;
+    error = refusalOfMove(from, folder, numberedName(name, number, ' '), to, capability);
+    if (error) return {{}, error};
+    if (from.path() == to.path()) return {to.path(), nullptr};
+    bool taken = bounce && to.folder.exists(to.name);
+    if (!taken) error = moveOnce(from, to, kind, request, taken);
+    if (!taken) break;
+    error = fileError(EEXIST, "can't move it to", to.path());
+  }
+  return error ? FileResult{{}, error} : FileResult{to.path(), nullptr};
+}
+
+int FileOperations::renameItem(const StorePlace& from, const StorePlace& to) {
+  const int failure =
+      _files.renameWithoutReplacing(from.folder.get(), from.name, to.folder.get(), to.name);
+  if (failure != EEXIST || from.folderRelative != to.folderRelative || from.root != to.root) {
+    return failure;
+  }
+  // Where case is folded, a new spelling of the same name finds the item itself.
+  struct stat one {};
+  struct stat two {};
+  if (from.folder.status(from.name, one) != 0 || to.folder.status(to.name, two) != 0) {
+    return failure;
+  }
+  const bool same = one.st_dev == two.st_dev && one.st_ino == two.st_ino;
+  if (!same || hasExactName(to.folder, to.name)) return failure;
+  return _files.renameOver(from.folder.get(), from.name, to.folder.get(), to.name);
+}
+
+NSErrorPtr FileOperations::moveOnce(const StorePlace& from, const StorePlace& to,
+                                    OperationKind kind, const FileRequest& request, bool& taken) {
+  const char* const doing = kind == OperationKind::Rename ? "can't rename" : "can't move";
+  OperationScope scope(*_journal, kind, request, from.path(), to.path());
+  if (NSErrorPtr error = scope.begin()) return error;
+  int failure = renameItem(from, to);
+  if (failure == EEXIST) {
+    taken = true;
+    scope.discard();
+    return fileError(EEXIST, doing, to.path());
+  }
+  if (failure == 0 && (failure = syncFolders(to.folder, &from.folder)) != 0) {
+    if (_files.renameWithoutReplacing(to.folder.get(), to.name, from.folder.get(), from.name)) {
+      scope.leaveOpen();
+      return fileError(failure, "moved, but perhaps not for good,", to.path());
+    }
+  }
+  if (failure != 0) return fileError(failure, doing, from.path());
+  scope.done();
+  if (kind == OperationKind::PutBack && removeTrashInfo(from) != 0) {
+    // It is back; that the trash forgets it is finished at the next start.
+    scope.leaveOpen();
+  }
+  return nullptr;
+}
+
+}  // namespace skein::vald

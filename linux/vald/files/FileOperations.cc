@@ -1,0 +1,136 @@
+#include "linux/vald/files/FileOperations.h"
+
+#include <cerrno>
+#include <utility>
+
+#include "linux/vald/files/FileErrors.h"
+#include "linux/vald/files/FileNames.h"
+#include "linux/vald/files/TrashInfo.h"
+
+namespace skein::vald {
+
+std::unique_ptr<FileOperations> FileOperations::open(FileOperationsOptions options,
+                                                     FileLayer& files, Log& log, NSErrorOut error) {
+  std::unique_ptr<FileOperations> operations(new FileOperations(std::move(options), files, log));
+  const FileOperationsOptions& own = operations->_options;
+  NSErrorPtr failure = operations->_roots.set(own.roots);
+  if (!failure) failure = operations->_staging.open(own.stateDirectory, files);
+  if (!failure) {
+    operations->_journal = OperationJournal::open(joinPath(own.stateDirectory, "operations.db"),
+                                                  own.provenanceRetention, files, &failure);
+  }
+  if (!failure) failure = operations->recover();
+  if (failure) {
+    error.store(failure);
+    return nullptr;
+  }
+  return operations;
+}
+
+FileOperations::FileOperations(FileOperationsOptions options, FileLayer& files, Log& log)
+    : _options(std::move(options)), _files(files), _log(log) {}
+
+std::chrono::steady_clock::time_point FileOperations::deadline() const {
+  return std::chrono::steady_clock::now() + _options.lockDeadline;
+}
+
+NSErrorPtr FileOperations::take(const std::string& path, std::vector<std::string> paths,
+                                StorePlace& place, Hold& hold) {
+  const auto until = deadline();
+  if (NSErrorPtr error = _coordinator.claim(std::move(paths), until, hold.claim)) return error;
+  if (NSErrorPtr error = _roots.locate(path, place)) return error;
+  if (place.isRoot()) {
+    return fileErrorWithWords(NSFileWriteNoPermissionError, EACCES,
+                              "\"" + printable(path) + "\" is the drive's own folder", path);
+  }
+  const auto trashed = trashedPath(place.relative);
+  if (trashed && trashed->name.empty()) {
+    return fileErrorWithWords(NSFileWriteNoPermissionError, EACCES,
+                              "\"" + printable(path) + "\" belongs to the trash itself", path);
+  }
+  struct stat status {};
+  if (const int failure = place.folder.status(place.name, status)) {
+    return fileError(failure, "can't find", path);
+  }
+  return hold.lock.acquire(place.folder, place.name, place.path(), until);
+}
+
+NSErrorPtr FileOperations::takeNew(const std::string& folder, const std::string& name,
+                                   StorePlace& place, Hold& hold) {
+  // Before anything is waited for or touched.
+  if (NSErrorPtr error = _roots.locate(folder, name, place)) return error;
+  if (trashedPath(place.relative)) {
+    return fileErrorWithWords(NSFileWriteNoPermissionError, EACCES,
+                              "\"" + printable(folder) + "\" is in the trash", folder);
+  }
+  if (NSErrorPtr error = _coordinator.claim({place.path()}, deadline(), hold.claim)) return error;
+  if (NSErrorPtr error = _roots.locate(folder, name, place)) return error;
+  return place.folder.exists(name) ? fileError(EEXIST, "can't make", place.path()) : nullptr;
+}
+
+int FileOperations::syncFolders(const DirectoryHandle& folder, const DirectoryHandle* other) {
+  if (const int failure = _files.sync(folder.get())) return failure;
+  struct stat one {};
+  struct stat two {};
+  if (other == nullptr || folder.status(one) != 0 || other->status(two) != 0) return 0;
+  if (one.st_dev == two.st_dev && one.st_ino == two.st_ino) return 0;
+  return _files.sync(other->get());
+}
+
+FileResult FileOperations::createFolder(const std::string& folder, const std::string& name,
+                                        const FileRequest& request) {
+  StorePlace place;
+  Hold hold;
+  if (NSErrorPtr error = takeNew(folder, name, place, hold)) return {{}, error};
+  const std::string path = place.path();
+  OperationScope scope(*_journal, OperationKind::CreateFolder, request, {}, path);
+  if (NSErrorPtr error = scope.begin()) return {{}, error};
+  int failure = _files.makeFolder(place.folder.get(), name, 0777);
+  if (failure == 0 && (failure = _files.sync(place.folder.get())) != 0) {
+    if (_files.removeFolder(place.folder.get(), name) != 0) scope.leaveOpen();
+  }
+  if (failure != 0) return {{}, fileError(failure, "can't make the folder", path)};
+  scope.done();
+  return {path, nullptr};
+}
+
+FileResult FileOperations::makeAlias(const std::string& folder, const std::string& name,
+                                     const std::string& target, const FileRequest& request) {
+  if (target.empty() || target.front() != '/' || target.find('\0') != std::string::npos) {
+    return {{},
+            fileErrorWithWords(
+                NSFileWriteInvalidFileNameError, EINVAL,
+                "can't make an alias of \"" + printable(target) + "\": an absolute path is needed",
+                {})};
+  }
+  StorePlace place;
+  Hold hold;
+  if (NSErrorPtr error = takeNew(folder, name, place, hold)) return {{}, error};
+  const std::string path = place.path();
+  OperationScope scope(*_journal, OperationKind::MakeAlias, request, target, path);
+  if (NSErrorPtr error = scope.begin()) return {{}, error};
+  int failure = _files.makeLink(target, place.folder.get(), name);
+  if (failure == 0 && (failure = _files.sync(place.folder.get())) != 0) {
+    if (_files.unlink(place.folder.get(), name) != 0) scope.leaveOpen();
+  }
+  if (failure != 0) return {{}, fileError(failure, "can't make the alias", path)};
+  scope.done();
+  return {path, nullptr};
+}
+
+TagResult FileOperations::tags(const std::string& path) const {
+  StorePlace place;
+  if (NSErrorPtr error = _roots.locate(path, place)) return {TagStorage::Failed, {}, error};
+  return readTags(place.folder, place.isRoot() ? "." : place.name, path);
+}
+
+TagResult FileOperations::setTags(const std::string& path, const std::vector<std::string>& names) {
+  FileCoordinator::Claim claim;
+  StorePlace place;
+  NSErrorPtr error = _coordinator.claim({path}, deadline(), claim);
+  if (!error) error = _roots.locate(path, place);
+  if (error) return {TagStorage::Failed, {}, error};
+  return writeTags(_files, place.folder, place.isRoot() ? "." : place.name, path, names);
+}
+
+}  // namespace skein::vald

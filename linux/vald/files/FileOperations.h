@@ -1,0 +1,166 @@
+#pragma once
+
+#include <chrono>
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "linux/vald/files/FileCoordinator.h"
+#include "linux/vald/files/FileLayer.h"
+#include "linux/vald/files/OperationJournal.h"
+#include "linux/vald/files/OperationScope.h"
+#include "linux/vald/files/Staging.h"
+#include "linux/vald/files/StoreRoots.h"
+#include "linux/vald/files/TagAttributes.h"
+#include "linux/vald/files/TreeCopy.h"
+#include "platform/log/Log.h"
+
+namespace skein::vald {
+
+struct FileOperationsOptions {
+  std::vector<std::string> roots;  // the drive's folder and the app containers', absolute
+  std::string stateDirectory;      // the drive's; the journal and the staging live there
+  // How long an operation waits for others, here and in other programs.
+  std::chrono::milliseconds lockDeadline{2000};
+  std::uint64_t provenanceRetention = 100'000;  // entries
+};
+
+// Whose request an operation is: what provenance tells.
+struct FileRequest {
+  std::string origin;            // in words, such as "skein trash (process 4711)"
+  std::string document;          // the item's persistent identifier, where it is known
+  FileProgressHandler progress;  // importing alone
+};
+
+// Where the item is now, or why it is where it was.
+struct FileResult {
+  std::string path;
+  NSErrorPtr error;
+};
+
+// Which kind of move is possible: bits of the mask that the move rule answers with. Any
+// of these allows the move; the rest of the mask is 0.
+enum MoveCapability : std::uint64_t {
+  kMayRename = 1u << 0,  // within the same folder
+  kMayMoveToAnotherFolder = 1u << 3,
+  kMayMoveToAnotherRoot = 1u << 4,  // between the drive and an app's folder, on one volume
+  kMayMoveOutOfTrash = 1u << 5,
+};
+
+// What is done to files in the store. Every operation is journalled before it changes
+// anything and ends before or after, never between; one that was cut off is finished or
+// undone by the next open(). Paths are absolute. Operations on overlapping paths follow
+// each other, others run side by side; all block the calling thread, any thread. A name
+// that is taken is NSCocoaErrorDomain 516 with the colliding URL, a missing item is 4.
+class FileOperations {
+ public:
+  // Opens the roots and the journal, and recovers what was cut off: recovered() tells.
+  // Null with an error. `files` and `log` outlive it.
+  static std::unique_ptr<FileOperations> open(FileOperationsOptions options, FileLayer& files,
+                                              Log& log, NSErrorOut error);
+
+  // App containers come and go.
+  NSErrorPtr setRoots(const std::vector<std::string>& roots) { return _roots.set(roots); }
+  // The entries that open() ended, and how: their paths want a fresh look by the index.
+  const std::vector<OperationEntry>& recovered() const { return _recovered; }
+  OperationJournal& journal() { return *_journal; }
+
+  // Copies a file or a tree from anywhere into a folder; a nil name keeps the source's.
+  FileResult importDocument(const std::string& source, const std::string& folder,
+                            const std::optional<std::string>& name, const FileRequest& request);
+  FileResult createFolder(const std::string& folder, const std::string& name,
+                          const FileRequest& request);
+  // A symbolic link with the target's absolute path, so that it can be moved about; the
+  // target may be outside the store and need not be there.
+  FileResult makeAlias(const std::string& folder, const std::string& name,
+                       const std::string& target, const FileRequest& request);
+  // The name it has already is a success that changes nothing.
+  FileResult rename(const std::string& path, const std::string& newName,
+                    const FileRequest& request);
+  // Out of the trash this is putting back: without a name the item gets the one it had.
+  // `bounce`: a taken name is tried again as "name 2.ext", "name 3.ext" ...
+  FileResult move(const std::string& path, const std::string& folder,
+                  const std::optional<std::string>& newName, bool bounce,
+                  const FileRequest& request);
+  // Removes a file or tree for good. Answers without a path.
+  FileResult remove(const std::string& path, const FileRequest& request);
+  // To the trash at the item's root; the answer is its path in there.
+  FileResult trash(const std::string& path, const FileRequest& request);
+
+  // Where a trashed item, or what lies in one, was before.
+  FileResult putBackPath(const std::string& trashedPath) const;
+  // 0 with an error that says why for what move() would refuse, whatever the name.
+  std::uint64_t capabilityToMove(const std::string& path, const std::string& to,
+                                 NSErrorOut error) const;
+
+  TagResult tags(const std::string& path) const;
+  TagResult setTags(const std::string& path, const std::vector<std::string>& names);
+
+ private:
+  // What an operation holds while it runs.
+  struct Hold {
+    FileCoordinator::Claim claim;
+    DocumentLock lock;
+  };
+
+  FileOperations(FileOperationsOptions options, FileLayer& files, Log& log);
+
+  std::chrono::steady_clock::time_point deadline() const;
+  // Claims `paths`, finds the item and locks it: Cocoa 4 when it is gone. Refuses roots
+  // and the trash's own folders.
+  NSErrorPtr take(const std::string& path, std::vector<std::string> paths, StorePlace& place,
+                  Hold& hold);
+  // Claims a place where something new shall be; refuses taken names and the trash.
+  NSErrorPtr takeNew(const std::string& folder, const std::string& name, StorePlace& place,
+                     Hold& hold);
+  // Syncs the folder that holds the place, and `other` when there is one.
+  int syncFolders(const DirectoryHandle& folder, const DirectoryHandle* other = nullptr);
+
+  // `again`: the staging was on another volume after all; try once more.
+  NSErrorPtr stageAndPlace(const DirectoryHandle& from, const std::string& source,
+                           const StorePlace& place, const FileRequest& request, bool& again);
+  // Deletes what an import left; what stays is the next start's.
+  void discardStaged(const StagingPlace& staged, OperationScope& scope);
+  NSErrorPtr removeAside(const StorePlace& place, const FileRequest& request, bool& again);
+
+  FileResult moveTo(const StorePlace& from, const std::string& folder, const std::string& name,
+                    bool bounce, OperationKind kind, const FileRequest& request);
+  // One try: `taken` when the name is.
+  NSErrorPtr moveOnce(const StorePlace& from, const StorePlace& to, OperationKind kind,
+                      const FileRequest& request, bool& taken);
+  // 0 or an errno; EEXIST when another item has the name.
+  int renameItem(const StorePlace& from, const StorePlace& to);
+  // Finds the destination too. An error when no such move may be.
+  NSErrorPtr refusalOfMove(const StorePlace& from, const std::string& folder,
+                           const std::string& name, StorePlace& to,
+                           std::uint64_t& capability) const;
+
+  NSErrorPtr openTrash(const OpenRoot& root, DirectoryHandle& files, DirectoryHandle& info);
+  NSErrorPtr trashAs(const StorePlace& place, const std::string& trashedName,
+                     const DirectoryHandle& trashed, const DirectoryHandle& info,
+                     const FileRequest& request, bool& taken);
+  // Forgets where a trashed item was, when it is one and is gone. 0 or an errno.
+  int removeTrashInfo(const StorePlace& trashed);
+
+  // Finishes or undoes; nil leaves the entry open for the next start.
+  std::optional<OperationState> recoverEntry(const OperationEntry& entry);
+  std::optional<OperationState> recoverImport(const OperationEntry& entry);
+  std::optional<OperationState> recoverRemoval(const OperationEntry& entry);
+  std::optional<OperationState> recoverTrash(const OperationEntry& entry);
+  std::optional<OperationState> recoverPutBack(const OperationEntry& entry);
+  NSErrorPtr recover();
+  bool exists(const std::string& path) const;
+
+  const FileOperationsOptions _options;
+  FileLayer& _files;
+  Log& _log;
+  StoreRoots _roots;
+  Staging _staging;
+  FileCoordinator _coordinator;
+  std::unique_ptr<OperationJournal> _journal;
+  std::vector<OperationEntry> _recovered;
+};
+
+}  // namespace skein::vald

@@ -1,0 +1,90 @@
+// What a crash left: finished where the change was made, undone where it was not.
+#include <system_error>
+
+#include "linux/vald/files/FileErrors.h"
+#include "linux/vald/files/FileNames.h"
+#include "linux/vald/files/FileOperations.h"
+#include "linux/vald/files/TreeRemoval.h"
+
+namespace skein::vald {
+namespace {
+
+// The folder that held it was taken away meanwhile.
+bool gone(const NSErrorPtr& error) { return error->code() == NSFileNoSuchFileError; }
+
+}  // namespace
+
+NSErrorPtr FileOperations::recover() {
+  NSErrorPtr error;
+  std::vector<OperationEntry> open = _journal->openEntries(&error);
+  if (error) return error;
+  for (OperationEntry& entry : open) {
+    const std::optional<OperationState> state = recoverEntry(entry);
+    if (!state) {
+      VL_ERROR(_log, "[ERROR] can't finish to %@ %@ now; the next start tries again",
+               operationName(entry.kind), printable(entry.path));
+      continue;
+    }
+    entry.state = *state;
+    _journal->end(entry.id, *state);
+    VL_NOTICE(_log, "[NOTICE] %@ of %@ was cut off and is %@", operationName(entry.kind),
+              printable(entry.path.empty() ? entry.destination : entry.path),
+              *state == OperationState::Done ? "finished" : "undone");
+    _recovered.push_back(std::move(entry));
+  }
+  if (const int failure = _staging.clear(_files)) {
+    VL_ERROR(_log, "[ERROR] can't clear the staging folder: %@",
+             std::generic_category().message(failure));
+  }
+  return nullptr;
+}
+
+std::optional<OperationState> FileOperations::recoverEntry(const OperationEntry& entry) {
+  switch (entry.kind) {
+    case OperationKind::Import: return recoverImport(entry);
+    case OperationKind::Remove: return recoverRemoval(entry);
+    case OperationKind::Trash: return recoverTrash(entry);
+    case OperationKind::PutBack: return recoverPutBack(entry);
+    case OperationKind::CreateFolder:
+    case OperationKind::MakeAlias:
+      return exists(entry.destination) ? OperationState::Done : OperationState::Undone;
+    case OperationKind::Rename:
+    case OperationKind::Move:
+      // One step: it was taken or not.
+      return exists(entry.destination) && !exists(entry.path) ? OperationState::Done
+                                                              : OperationState::Undone;
+  }
+  return std::nullopt;
+}
+
+std::optional<OperationState> FileOperations::recoverImport(const OperationEntry& entry) {
+  StagingPlace staged;
+  if (NSErrorPtr error = _staging.find(entry.aside, _roots, staged)) {
+    return gone(error) ? std::optional(OperationState::Undone) : std::nullopt;
+  }
+  if (staged.folder.exists(staged.name)) {
+    if (removeTree(_files, staged.folder, staged.name) != 0) return std::nullopt;
+    return OperationState::Undone;
+  }
+  return exists(entry.destination) ? OperationState::Done : OperationState::Undone;
+}
+
+std::optional<OperationState> FileOperations::recoverRemoval(const OperationEntry& entry) {
+  StagingPlace aside;
+  NSErrorPtr error = _staging.find(entry.aside, _roots, aside);
+  if (error && !gone(error)) return std::nullopt;
+  const bool begun = !error && aside.folder.exists(aside.name);
+  if (begun && removeTree(_files, aside.folder, aside.name) != 0) return std::nullopt;
+  StorePlace place;
+  // Its folder may be gone by now, and with it what could be left.
+  if (_roots.locate(entry.path, place)) return OperationState::Done;
+  if (!begun && place.folder.exists(place.name)) return OperationState::Undone;
+  return removeTrashInfo(place) == 0 ? std::optional(OperationState::Done) : std::nullopt;
+}
+
+bool FileOperations::exists(const std::string& path) const {
+  StorePlace place;
+  return !_roots.locate(path, place) && place.folder.exists(place.name);
+}
+
+}  // namespace skein::vald

@@ -1,0 +1,266 @@
+#include "linux/vald/files/OperationJournal.h"
+
+#include <sqlite3.h>
+
+#include <cerrno>
+#include <utility>
+
+#include "linux/vald/files/FileErrors.h"
+#include "linux/vald/files/FileNames.h"
+
+namespace skein::vald {
+namespace {
+
+constexpr int kVersion = 1;
+constexpr char kTables[] = R"(
+  CREATE TABLE IF NOT EXISTS operation(
+    id INTEGER PRIMARY KEY AUTOINCREMENT, kind INTEGER NOT NULL, state INTEGER NOT NULL,
+    time INTEGER NOT NULL, origin TEXT NOT NULL, document TEXT NOT NULL, path BLOB NOT NULL,
+    destination BLOB NOT NULL, aside BLOB NOT NULL);
+  CREATE INDEX IF NOT EXISTS operationPath ON operation(path);
+  CREATE INDEX IF NOT EXISTS operationDestination ON operation(destination);
+  CREATE INDEX IF NOT EXISTS operationDocument ON operation(document) WHERE document <> '';
+  CREATE INDEX IF NOT EXISTS operationOpen ON operation(state) WHERE state = 0;
+)";
+constexpr char kColumns[] = "id, kind, state, time, origin, document, path, destination, aside";
+constexpr std::int64_t kPruneEvery = 256;
+
+void bindText(sqlite3_stmt* statement, int at, const std::string& text) {
+  sqlite3_bind_text(statement, at, text.data(), static_cast<int>(text.size()), SQLITE_TRANSIENT);
+}
+// Paths are bytes.
+void bindPath(sqlite3_stmt* statement, int at, const std::string& path) {
+  // An empty blob, not NULL, which is what a null pointer would bind.
+  sqlite3_bind_blob(statement, at, path.empty() ? "" : path.data(), static_cast<int>(path.size()),
+                    SQLITE_TRANSIENT);
+}
+std::string column(sqlite3_stmt* statement, int at) {
+  const auto* bytes = static_cast<const char*>(sqlite3_column_blob(statement, at));
+  return bytes == nullptr
+             ? std::string()
+             : std::string(bytes, static_cast<std::size_t>(sqlite3_column_bytes(statement, at)));
+}
+
+// The disk's own words where SQLite has passed them on.
+int posixOf(sqlite3* database, int code) {
+  switch (code & 0xff) {
+    case SQLITE_FULL: return ENOSPC;
+    case SQLITE_READONLY: return EROFS;
+    case SQLITE_PERM: return EACCES;
+    default: {
+      const int system = sqlite3_system_errno(database);
+      return system != 0 ? system : EIO;
+    }
+  }
+}
+
+}  // namespace
+
+const char* operationName(OperationKind kind) {
+  switch (kind) {
+    case OperationKind::Import: return "import";
+    case OperationKind::CreateFolder: return "create folder";
+    case OperationKind::Rename: return "rename";
+    case OperationKind::Move: return "move";
+    case OperationKind::Remove: return "remove";
+    case OperationKind::Trash: return "trash";
+    case OperationKind::PutBack: return "put back";
+    case OperationKind::MakeAlias: return "make alias";
+  }
+  return "unknown";
+}
+
+std::unique_ptr<OperationJournal> OperationJournal::open(const std::string& databasePath,
+                                                         std::uint64_t retention, FileLayer& files,
+                                                         NSErrorOut error) {
+  const auto refuse = [&](const std::string& why) {
+    error.store(fileErrorWithWords(
+        NSFileWriteUnknownError, 0,
+        "can't open the journal of operations \"" + printable(databasePath) + "\": " + why,
+        databasePath));
+    return nullptr;
+  };
+  sqlite3* database = nullptr;
+  const int flags = SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE | SQLITE_OPEN_NOMUTEX;
+  const int opened = sqlite3_open_v2(databasePath.c_str(), &database, flags, nullptr);
+  std::unique_ptr<OperationJournal> journal(new OperationJournal(database, retention, files));
+  if (opened != SQLITE_OK) return refuse(sqlite3_errmsg(database));
+  sqlite3_busy_timeout(database, 5000);
+
+  MutexLock lock(journal->_mutex);
+  int version = 0;
+  int code = journal->run("PRAGMA journal_mode = WAL");
+  if (code == SQLITE_OK) {
+    sqlite3_stmt* statement = nullptr;
+    code = sqlite3_prepare_v2(database, "PRAGMA user_version", -1, &statement, nullptr);
+    if (code == SQLITE_OK && sqlite3_step(statement) == SQLITE_ROW) {
+      version = sqlite3_column_int(statement, 0);
+    }
+    sqlite3_finalize(statement);
+  }
+  if (code == SQLITE_OK && version > kVersion) {
+    return refuse("it was written by a newer version; update this one");
+  }
+  if (code == SQLITE_OK) code = journal->run(kTables);
+  if (code == SQLITE_OK) code = journal->run("PRAGMA user_version = " + std::to_string(kVersion));
+  if (code == SQLITE_OK) {
+    const std::string sql =
+        std::string("INSERT INTO operation(") + (kColumns + 4) + ") VALUES(?, 0, ?, ?, ?, ?, ?, ?)";
+    code = sqlite3_prepare_v3(database, sql.c_str(), -1, SQLITE_PREPARE_PERSISTENT,
+                              &journal->_insert, nullptr);
+  }
+  if (code != SQLITE_OK) return refuse(sqlite3_errmsg(database));
+  return journal;
+}
+
+OperationJournal::OperationJournal(sqlite3* database, std::uint64_t retention, FileLayer& files)
+    : _files(files), _retention(retention), _database(database) {}
+
+OperationJournal::~OperationJournal() {
+  MutexLock lock(_mutex);
+  for (const End& end : _unwritten) write(end);
+  sqlite3_finalize(_insert);
+  sqlite3_close(_database);
+}
+
+int OperationJournal::run(const std::string& sql) {
+  return sqlite3_exec(_database, sql.c_str(), nullptr, nullptr, nullptr);
+}
+
+NSErrorPtr OperationJournal::failure(const char* doing, int code) {
+  const int posix = posixOf(_database, code);
+  const std::int64_t cocoa = posix == ENOSPC   ? NSFileWriteOutOfSpaceError
+                             : posix == EROFS  ? NSFileWriteVolumeReadOnlyError
+                             : posix == EACCES ? NSFileWriteNoPermissionError
+                                               : NSFileWriteUnknownError;
+  return fileErrorWithWords(cocoa, posix,
+                            std::string(doing) + " the journal of operations: " +
+                                sqlite3_errmsg(_database) + "; nothing was changed",
+                            {});
+}
+
+int OperationJournal::insert(OperationEntry& entry) {
+  sqlite3_bind_int(_insert, 1, static_cast<int>(entry.kind));
+  sqlite3_bind_int64(_insert, 2, entry.when.time_since_epoch().count());
+  bindText(_insert, 3, entry.origin);
+  bindText(_insert, 4, entry.document);
+  bindPath(_insert, 5, entry.path);
+  bindPath(_insert, 6, entry.destination);
+  bindPath(_insert, 7, entry.aside);
+  const int code = sqlite3_step(_insert);
+  sqlite3_reset(_insert);
+  if (code != SQLITE_DONE) return code;
+  entry.id = sqlite3_last_insert_rowid(_database);
+  return SQLITE_OK;
+}
+
+int OperationJournal::write(const End& end) {
+  const std::string id = std::to_string(end.id);
+  return end.state
+             ? run("UPDATE operation SET state = " + std::to_string(static_cast<int>(*end.state)) +
+                   " WHERE id = " + id)
+             : run("DELETE FROM operation WHERE id = " + id);
+}
+
+NSErrorPtr OperationJournal::begin(OperationEntry& entry) {
+  if (const int fault = _files.step(FileStep::JournalBegin, operationName(entry.kind))) {
+    return fileError(fault, "can't write the journal of operations for", entry.path);
+  }
+  entry.when = std::chrono::time_point_cast<NSDate::duration>(std::chrono::system_clock::now());
+  MutexLock lock(_mutex);
+  int code = run("PRAGMA synchronous = FULL; BEGIN IMMEDIATE");
+  if (code == SQLITE_OK) {
+    for (const End& end : _unwritten) {
+      if (code == SQLITE_OK) code = write(end);
+    }
+    if (code == SQLITE_OK) code = insert(entry);
+    if (code == SQLITE_OK && entry.id % kPruneEvery == 0) {
+      code = run("DELETE FROM operation WHERE state <> 0 AND id <= " +
+                 std::to_string(entry.id - static_cast<std::int64_t>(_retention)));
+    }
+    if (code == SQLITE_OK) code = run("COMMIT");
+  }
+  if (code == SQLITE_OK) {
+    _unwritten.clear();
+    return nullptr;
+  }
+  NSErrorPtr error = failure("can't write", code);
+  if (sqlite3_get_autocommit(_database) == 0) run("ROLLBACK");
+  return error;
+}
+
+void OperationJournal::finish(End end) {
+  const int fault = _files.step(FileStep::JournalEnd, {});
+  MutexLock lock(_mutex);
+  if (fault == 0 && run("PRAGMA synchronous = NORMAL") == SQLITE_OK && write(end) == SQLITE_OK) {
+    return;
+  }
+  _unwritten.insert(end);
+}
+
+void OperationJournal::end(std::int64_t id, OperationState state) { finish({id, state}); }
+void OperationJournal::discard(std::int64_t id) { finish({id, std::nullopt}); }
+
+std::vector<OperationEntry> OperationJournal::select(const std::string& condition,
+                                                     const std::vector<std::string>& values,
+                                                     NSErrorOut error) {
+  MutexLock lock(_mutex);
+  for (auto end = _unwritten.begin(); end != _unwritten.end();) {
+    end = write(*end) == SQLITE_OK ? _unwritten.erase(end) : std::next(end);
+  }
+  const std::string sql = std::string("SELECT ") + kColumns + " FROM operation WHERE " + condition;
+  sqlite3_stmt* statement = nullptr;
+  int code = sqlite3_prepare_v2(_database, sql.c_str(), -1, &statement, nullptr);
+  std::vector<OperationEntry> entries;
+  if (code == SQLITE_OK) {
+    for (std::size_t at = 0; at < values.size(); ++at) {
+      bindPath(statement, static_cast<int>(at) + 1, values[at]);
+    }
+    while ((code = sqlite3_step(statement)) == SQLITE_ROW) {
+      OperationEntry entry;
+      entry.id = sqlite3_column_int64(statement, 0);
+      entry.kind = static_cast<OperationKind>(sqlite3_column_int(statement, 1));
+      entry.state = static_cast<OperationState>(sqlite3_column_int(statement, 2));
+      entry.when = NSDate(NSDate::duration(sqlite3_column_int64(statement, 3)));
+      entry.origin = column(statement, 4);
+      entry.document = column(statement, 5);
+      entry.path = column(statement, 6);
+      entry.destination = column(statement, 7);
+      entry.aside = column(statement, 8);
+      entries.push_back(std::move(entry));
+    }
+  }
+  if (code != SQLITE_DONE) error.store(failure("can't read", code));
+  sqlite3_finalize(statement);
+  return entries;
+}
+
+std::vector<OperationEntry> OperationJournal::openEntries(NSErrorOut error) {
+  return select("state = 0 ORDER BY id", {}, error);
+}
+
+std::vector<OperationEntry> OperationJournal::historyOfPath(const std::string& path,
+                                                            std::size_t limit, NSErrorOut error) {
+  std::vector<std::string> paths;
+  for (std::string at = path; !at.empty(); at = parentOfPath(at)) paths.push_back(at);
+  std::string places;
+  for (std::size_t at = 1; at <= paths.size(); ++at) {
+    places += (at > 1 ? ", ?" : "?") + std::to_string(at);
+  }
+  // That a folder was made says nothing about what is in it.
+  return select("(path IN (" + places + ") OR destination IN (" + places +
+                    ")) AND (kind <> 2 OR destination = ?1) ORDER BY id DESC LIMIT " +
+                    std::to_string(limit),
+                paths, error);
+}
+
+std::vector<OperationEntry> OperationJournal::historyOfDocument(const std::string& document,
+                                                                std::size_t limit,
+                                                                NSErrorOut error) {
+  if (document.empty()) return {};
+  return select("document <> '' AND document = CAST(?1 AS TEXT) ORDER BY id DESC LIMIT " +
+                    std::to_string(limit),
+                {document}, error);
+}
+
+}  // namespace skein::vald

@@ -1,0 +1,104 @@
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <set>
+#include <string>
+#include <vector>
+
+#include "base/Mutex.h"
+#include "linux/vald/files/FileLayer.h"
+#include "platform/foundation/NSDate.h"
+#include "platform/foundation/NSError.h"
+
+struct sqlite3;
+struct sqlite3_stmt;
+
+namespace skein::vald {
+
+enum class OperationKind : std::uint8_t {
+  Import = 1,
+  CreateFolder = 2,
+  Rename = 3,
+  Move = 4,
+  Remove = 5,
+  Trash = 6,
+  PutBack = 7,
+  MakeAlias = 8,
+};
+// "import", "create folder", ...
+const char* operationName(OperationKind kind);
+
+enum class OperationState : std::uint8_t { Open = 0, Done = 1, Undone = 2 };
+
+// One operation on the store: what was asked, by whom, and what became of it.
+struct OperationEntry {
+  std::int64_t id = 0;
+  OperationKind kind = OperationKind::Import;
+  OperationState state = OperationState::Open;
+  NSDate when{};
+  std::string origin;       // whose request it was, in words
+  std::string document;     // the item's persistent identifier; empty when not known
+  std::string path;         // what it was done to; for an import, where it came from
+  std::string destination;  // where it is afterwards; empty for a removal
+  std::string aside;        // where contents are kept meanwhile; empty when nowhere
+};
+
+// The durable journal of file operations: an SQLite database of its own in the drive's
+// state folder, beside the index, which may be thrown away and made again while this may
+// not. An entry is written and on the disk before anything is changed; its end is
+// written after the change, without waiting for the disk, since an end that a power cut
+// loses is found again by looking at the files. Ended entries stay as the provenance of
+// what went and moved, the newest `retention` of them. Any thread.
+class OperationJournal {
+ public:
+  // Null with an error that names the cause. `files` outlives the journal.
+  static std::unique_ptr<OperationJournal> open(const std::string& databasePath,
+                                                std::uint64_t retention, FileLayer& files,
+                                                NSErrorOut error);
+  ~OperationJournal();
+
+  // Sets the entry's id. An error: nothing was written and nothing may be changed.
+  NSErrorPtr begin(OperationEntry& entry);
+  // An end that cannot be written now is written with the next entry.
+  void end(std::int64_t id, OperationState state);
+  // Forgets an entry that came to nothing before a second try.
+  void discard(std::int64_t id);
+
+  // What a crash left, oldest first.
+  std::vector<OperationEntry> openEntries(NSErrorOut error);
+
+  // What happened to a path, or to a folder that held it, and what brought it there;
+  // newest first.
+  std::vector<OperationEntry> historyOfPath(const std::string& path, std::size_t limit,
+                                            NSErrorOut error);
+  std::vector<OperationEntry> historyOfDocument(const std::string& document, std::size_t limit,
+                                                NSErrorOut error);
+
+ private:
+  OperationJournal(sqlite3* database, std::uint64_t retention, FileLayer& files);
+
+  struct End {
+    std::int64_t id;
+    std::optional<OperationState> state;  // nil: forget the entry
+    friend auto operator<=>(const End&, const End&) = default;
+  };
+  void finish(End end);
+  // 0 or SQLite's code.
+  int run(const std::string& sql) SKEIN_REQUIRES(_mutex);
+  int write(const End& end) SKEIN_REQUIRES(_mutex);
+  int insert(OperationEntry& entry) SKEIN_REQUIRES(_mutex);
+  NSErrorPtr failure(const char* doing, int code) SKEIN_REQUIRES(_mutex);
+  std::vector<OperationEntry> select(const std::string& condition,
+                                     const std::vector<std::string>& values, NSErrorOut error);
+
+  FileLayer& _files;
+  const std::uint64_t _retention;
+  Mutex _mutex;
+  sqlite3* const _database;
+  sqlite3_stmt* _insert SKEIN_GUARDED_BY(_mutex) = nullptr;
+  std::set<End> _unwritten SKEIN_GUARDED_BY(_mutex);
+};
+
+}  // namespace skein::vald

@@ -1,0 +1,253 @@
+#include "linux/vald/files/TreeCopy.h"
+
+#include <fcntl.h>
+#include <sys/xattr.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <string_view>
+
+#include "linux/vald/files/FileErrors.h"
+#include "linux/vald/files/FileNames.h"
+
+namespace skein::vald {
+namespace {
+
+constexpr std::int64_t kChunk = std::int64_t{16} << 20;
+constexpr std::size_t kBuffer = std::size_t{1} << 20;
+constexpr std::uint64_t kTellItems = 64;
+constexpr std::uint64_t kTellBytes = std::uint64_t{8} << 20;
+// Up to here each file is synced by itself; beyond, one sync of the file system is
+// quicker, though it also writes what other programs have pending.
+constexpr std::uint64_t kFewItems = 32;
+// Says which document a file is; a copy is another document.
+constexpr std::string_view kOwnAttributes = "user.skein.";
+
+bool saysImpossible(int number) {
+  return number == EOPNOTSUPP || number == ENOTTY || number == EXDEV || number == EINVAL ||
+         number == ENOSYS || number == EPERM;
+}
+
+}  // namespace
+
+int TreeCopy::advance(std::uint64_t items, std::uint64_t bytes) {
+  _state.doneItems += items;
+  _state.doneBytes += bytes;
+  const bool tell = _state.doneItems - _toldItems >= kTellItems ||
+                    _state.doneBytes - _toldBytes >= kTellBytes ||
+                    _state.doneItems == _state.totalItems;
+  if (!tell || !_progress) return 0;
+  _toldItems = _state.doneItems;
+  _toldBytes = _state.doneBytes;
+  return _progress(_state) ? 0 : ECANCELED;
+}
+
+NSErrorPtr TreeCopy::measure(const DirectoryHandle& folder, const std::string& name,
+                             const std::string& path) {
+  struct stat status {};
+  if (const int failure = folder.status(name, status)) {
+    return fileError(failure, "can't read", path);
+  }
+  ++_state.totalItems;
+  if (S_ISREG(status.st_mode)) _state.totalBytes += static_cast<std::uint64_t>(status.st_size);
+  if (S_ISREG(status.st_mode) || S_ISLNK(status.st_mode)) return nullptr;
+  if (!S_ISDIR(status.st_mode)) {
+    return fileErrorWithWords(NSFileWriteUnknownError, EINVAL,
+                              "can't bring in \"" + printable(path) +
+                                  "\": it is a device, a pipe or a socket; leave it out",
+                              path);
+  }
+  DirectoryHandle below;
+  NSErrorPtr error;
+  int failure = folder.openFolder(name, below);
+  if (failure == 0) {
+    failure = below.list([&](const std::string& child) {
+      error = measure(below, child, joinPath(path, child));
+      return error == nullptr;
+    });
+  }
+  return error || failure == 0 ? error : fileError(failure, "can't read", path);
+}
+
+NSErrorPtr TreeCopy::copy(const DirectoryHandle& from, const std::string& name,
+                          const std::string& path, const DirectoryHandle& to,
+                          const std::string& newName) {
+  struct stat status {};
+  if (const int failure = from.status(name, status)) return fileError(failure, "can't read", path);
+  if (S_ISDIR(status.st_mode)) return copyFolder(from, name, path, status, to, newName);
+  if (S_ISREG(status.st_mode)) return copyFile(from, name, path, to, newName);
+  std::string target;
+  int failure = S_ISLNK(status.st_mode) ? from.readLink(name, target) : EINVAL;
+  if (failure == 0) failure = _files.makeLink(target, to.get(), newName);
+  const timespec times[2] = {status.st_atim, status.st_mtim};
+  if (failure == 0) failure = _files.setTimes(to.get(), newName, times);
+  if (failure == 0) failure = advance(1, 0);
+  return failure == 0 ? nullptr : fileError(failure, "can't bring in", path);
+}
+
+NSErrorPtr TreeCopy::copyFile(const DirectoryHandle& from, const std::string& name,
+                              const std::string& path, const DirectoryHandle& to,
+                              const std::string& newName) {
+  FileDescriptor source;
+  FileDescriptor made;
+  struct stat status {};
+  int failure = from.openFile(name, source);
+  if (failure == 0 && ::fstat(source.get(), &status) != 0) failure = errno;
+  if (failure == 0) failure = _files.createFile(to.get(), newName, 0600, made);
+  if (failure == 0) failure = copyContents(source.get(), made.get(), status);
+  if (failure == 0) failure = copyAttributes(source.get(), made.get());
+  if (failure == 0) failure = _files.setMode(made.get(), (status.st_mode & 0777) | 0400);
+  const timespec times[2] = {status.st_atim, status.st_mtim};
+  if (failure == 0) failure = _files.setTimes(made.get(), {}, times);
+  if (failure == 0) failure = advance(1, 0);
+  return failure == 0 ? nullptr : fileError(failure, "can't bring in", path);
+}
+
+NSErrorPtr TreeCopy::copyFolder(const DirectoryHandle& from, const std::string& name,
+                                const std::string& path, const struct stat& status,
+                                const DirectoryHandle& to, const std::string& newName) {
+  DirectoryHandle source;
+  DirectoryHandle made;
+  int failure = from.openFolder(name, source);
+  if (failure == 0) failure = _files.makeFolder(to.get(), newName, 0700);
+  if (failure == 0) failure = to.openFolder(newName, made);
+  if (failure != 0) return fileError(failure, "can't bring in", path);
+  NSErrorPtr error;
+  failure = source.list([&](const std::string& child) {
+    error = copy(source, child, joinPath(path, child), made, child);
+    return error == nullptr;
+  });
+  if (error) return error;
+  if (failure == 0) failure = copyAttributes(source.get(), made.get());
+  // Also from a read-only medium the owner gets a folder that can be filled and moved.
+  if (failure == 0) failure = _files.setMode(made.get(), (status.st_mode & 0777) | 0700);
+  const timespec times[2] = {status.st_atim, status.st_mtim};
+  if (failure == 0) failure = _files.setTimes(made.get(), {}, times);
+  if (failure == 0) failure = advance(1, 0);
+  return failure == 0 ? nullptr : fileError(failure, "can't bring in", path);
+}
+
+int TreeCopy::copyContents(int from, int to, const struct stat& status) {
+  const auto size = static_cast<std::int64_t>(status.st_size);
+  if (_clones && size > 0) {
+    const int failure = _files.cloneContents(from, to);
+    if (failure == 0) return advance(0, static_cast<std::uint64_t>(size));
+    if (!saysImpossible(failure)) return failure;
+    _clones = false;
+  }
+  if (status.st_blocks * 512 >= size) return copyRange(from, to, 0, size, true);
+  // Holes stay holes.
+  std::int64_t at = 0;
+  while (at < size) {
+    const off_t data = ::lseek(from, at, SEEK_DATA);
+    if (data < 0 && errno == ENXIO) break;
+    if (data < 0) return copyRange(from, to, at, size, true);
+    const off_t hole = ::lseek(from, data, SEEK_HOLE);
+    const std::int64_t end = hole < 0 ? size : hole;
+    if (const int failure = copyRange(from, to, data, end, false)) return failure;
+    at = end;
+  }
+  return _files.setLength(to, size);
+}
+
+int TreeCopy::copyRange(int from, int to, std::int64_t offset, std::int64_t end, bool untilEnd) {
+  // Files of the system's own say that they are empty and are not; only reading tells.
+  bool reads = !_copiesRanges || (untilEnd && end == 0);
+  while (!reads && (untilEnd || offset < end)) {
+    const std::int64_t most = untilEnd ? kChunk : std::min(kChunk, end - offset);
+    std::size_t copied = 0;
+    const int failure = _files.copyRange(from, to, offset, static_cast<std::size_t>(most), copied);
+    if (failure != 0 && !saysImpossible(failure)) return failure;
+    if (failure != 0) {
+      _copiesRanges = false;
+      reads = true;
+      break;
+    }
+    if (copied == 0) return 0;
+    // Begins to write what there is, so that a large file is neither pending in memory as
+    // a whole nor waited for at the end.
+    if (copied == static_cast<std::size_t>(kChunk)) {
+      ::sync_file_range(to, offset, static_cast<off64_t>(copied), SYNC_FILE_RANGE_WRITE);
+    }
+    offset += static_cast<std::int64_t>(copied);
+    if (const int stop = advance(0, copied)) return stop;
+    // A file of the size it was said to have needs no other call to find its end.
+    if (offset == end) return 0;
+  }
+  return reads ? copyByReading(from, to, offset, end, untilEnd) : 0;
+}
+
+int TreeCopy::copyByReading(int from, int to, std::int64_t offset, std::int64_t end,
+                            bool untilEnd) {
+  _buffer.resize(kBuffer);
+  if (::lseek(to, offset, SEEK_SET) < 0) return errno;
+  while (untilEnd || offset < end) {
+    const std::size_t most =
+        untilEnd ? kBuffer : std::min(kBuffer, static_cast<std::size_t>(end - offset));
+    const ssize_t got = ::pread(from, _buffer.data(), most, offset);
+    if (got < 0 && errno == EINTR) continue;
+    if (got < 0) return errno;
+    if (got == 0) break;
+    const auto count = static_cast<std::size_t>(got);
+    if (const int failure = _files.write(to, std::string_view(_buffer).substr(0, count))) {
+      return failure;
+    }
+    offset += got;
+    if (const int stop = advance(0, count)) return stop;
+  }
+  return 0;
+}
+
+int TreeCopy::copyAttributes(int from, int to) {
+  char names[4096];
+  const ssize_t length = ::flistxattr(from, names, sizeof(names));
+  if (length < 0 && errno != ENOTSUP && errno != ENOSYS) return errno;
+  const std::string_view all(names, length > 0 ? static_cast<std::size_t>(length) : 0);
+  for (std::size_t at = 0; at < all.size();) {
+    const std::string name(all.data() + at);
+    at += name.size() + 1;
+    if (!name.starts_with("user.") || name.starts_with(kOwnAttributes)) continue;
+    const ssize_t size = ::fgetxattr(from, name.c_str(), nullptr, 0);
+    if (size < 0) continue;  // gone meanwhile, or not ours to read
+    std::string value(static_cast<std::size_t>(size), '\0');
+    const ssize_t got = ::fgetxattr(from, name.c_str(), value.data(), value.size());
+    if (got < 0) continue;
+    value.resize(static_cast<std::size_t>(got));
+    const int failure = _files.setAttribute(descriptorPath(to), name, value);
+    // A file system without attributes takes the contents all the same.
+    if (failure != 0 && failure != ENOTSUP && failure != EPERM) return failure;
+  }
+  return 0;
+}
+
+NSErrorPtr TreeCopy::sync(const DirectoryHandle& to, const std::string& newName,
+                          const std::string& path) {
+  const int failure =
+      _state.totalItems > kFewItems ? _files.syncAll(to.get()) : syncTree(to, newName);
+  return failure == 0 ? nullptr : fileError(failure, "can't bring in", path);
+}
+
+int TreeCopy::syncTree(const DirectoryHandle& folder, const std::string& name) {
+  struct stat status {};
+  if (const int failure = folder.status(name, status)) return failure;
+  if (S_ISLNK(status.st_mode)) return 0;
+  if (S_ISREG(status.st_mode)) {
+    FileDescriptor file;
+    const int failure = folder.openFile(name, file);
+    return failure != 0 ? failure : _files.sync(file.get());
+  }
+  DirectoryHandle below;
+  int failure = folder.openFolder(name, below);
+  int first = 0;
+  if (failure == 0) {
+    failure = below.list([&](const std::string& child) {
+      first = syncTree(below, child);
+      return first == 0;
+    });
+  }
+  if (failure == 0) failure = first;
+  return failure != 0 ? failure : _files.sync(below.get());
+}
+
+}  // namespace skein::vald

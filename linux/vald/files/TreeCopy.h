@@ -1,0 +1,68 @@
+#pragma once
+
+#include <cstdint>
+#include <functional>
+#include <string>
+#include <vector>
+
+#include "linux/vald/files/DirectoryHandle.h"
+#include "linux/vald/files/FileLayer.h"
+#include "platform/foundation/NSError.h"
+
+namespace skein::vald {
+
+// How far an import has come.
+struct FileProgress {
+  std::uint64_t totalItems = 0;
+  std::uint64_t doneItems = 0;
+  std::uint64_t totalBytes = 0;
+  std::uint64_t doneBytes = 0;
+};
+// False cancels. On the copying thread, every few files or megabytes.
+using FileProgressHandler = std::function<bool(const FileProgress&)>;
+
+// Copies a file or a whole tree into a folder: contents by reference where the file
+// system can, else within the kernel; modification times, permissions (never set-user-id,
+// and always enough for the owner to use the copy), user attributes but this system's own,
+// links as links, holes as holes. Memory does not grow with the tree. One use; one thread.
+class TreeCopy {
+ public:
+  TreeCopy(FileLayer& files, FileProgressHandler progress)
+      : _files(files), _progress(std::move(progress)) {}
+
+  // Counts what is there, before anything is made. An error for what cannot be copied
+  // (devices, pipes, sockets, what may not be read), naming it.
+  NSErrorPtr measure(const DirectoryHandle& folder, const std::string& name,
+                     const std::string& path);
+  // After measure(). On an error a part may have been made; the caller removes it.
+  NSErrorPtr copy(const DirectoryHandle& from, const std::string& name, const std::string& path,
+                  const DirectoryHandle& to, const std::string& newName);
+  // Puts the copy on the disk: a few files each by itself, many all at once.
+  NSErrorPtr sync(const DirectoryHandle& to, const std::string& newName, const std::string& path);
+
+ private:
+  NSErrorPtr copyFile(const DirectoryHandle& from, const std::string& name, const std::string& path,
+                      const DirectoryHandle& to, const std::string& newName);
+  NSErrorPtr copyFolder(const DirectoryHandle& from, const std::string& name,
+                        const std::string& path, const struct stat& status,
+                        const DirectoryHandle& to, const std::string& newName);
+  int copyContents(int from, int to, const struct stat& status);
+  int copyRange(int from, int to, std::int64_t offset, std::int64_t end, bool untilEnd);
+  int copyByReading(int from, int to, std::int64_t offset, std::int64_t end, bool untilEnd);
+  int copyAttributes(int from, int to);
+  // ECANCELED when the handler wants no more.
+  int advance(std::uint64_t items, std::uint64_t bytes);
+  int syncTree(const DirectoryHandle& folder, const std::string& name);
+
+  FileLayer& _files;
+  const FileProgressHandler _progress;
+  FileProgress _state;
+  std::uint64_t _toldItems = 0;
+  std::uint64_t _toldBytes = 0;
+  // Until the file systems say that they cannot.
+  bool _clones = true;
+  bool _copiesRanges = true;
+  std::string _buffer;
+};
+
+}  // namespace skein::vald

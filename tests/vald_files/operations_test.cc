@@ -1,0 +1,280 @@
+// What each operation does, refuses, and remembers.
+#include "linux/vald/files/TrashInfo.h"
+#include "tests/vald_files/FilesFixture.h"
+
+namespace skein::vald {
+namespace {
+
+const FileRequest kRequest{"a test", "d0000000000000001", {}};
+
+TEST(Names, RefuseWhatCannotBeAndNumberWithinTheLimit) {
+  for (const std::string& name :
+       {std::string(), std::string("."), std::string(".."), std::string("a/b"),
+        std::string("a\0b", 3), std::string(256, 'x'), std::string(".skein-import-1"),
+        std::string(".skein-removed-1")}) {
+    const NSErrorPtr refusal = refusalOfName(name, false);
+    EXPECT_EQ(codeOf(refusal), NSFileWriteInvalidFileNameError) << printable(name);
+    EXPECT_FALSE(wordsOf(refusal).empty());
+  }
+  EXPECT_EQ(refusalOfName(std::string(255, 'x'), true), nullptr);
+  EXPECT_EQ(refusalOfName("...", true), nullptr);
+  EXPECT_EQ(refusalOfName(".Trash-1000", false), nullptr);
+  EXPECT_NE(refusalOfName(".Trash-1000", true), nullptr);
+  EXPECT_NE(refusalOfName(".Trash", true), nullptr);
+  EXPECT_EQ(refusalOfName(".Trash-mine", true), nullptr);
+
+  EXPECT_EQ(numberedName("a.txt", 1, ' '), "a.txt");
+  EXPECT_EQ(numberedName("a.tar.gz", 2, ' '), "a 2.tar.gz");
+  EXPECT_EQ(numberedName(".profile", 3, '.'), ".profile.3");
+  const std::string umlauts = numberedName(std::string(250, 'x') + "äöü.txt", 12, ' ');
+  EXPECT_LE(umlauts.size(), kLongestName);
+  EXPECT_EQ(printable(umlauts), umlauts) << "cut within a character";
+}
+
+TEST(Operations, CreateRenameMoveAndSayWhatIsInTheWay) {
+  TestDrive drive;
+  FileOperations& files = drive.open();
+  drive.write("a.txt", "a");
+  EXPECT_EQ(files.createFolder(drive.store, "folder", kRequest).path, drive.at("folder"));
+  EXPECT_EQ(codeOf(files.createFolder(drive.store, "folder", kRequest).error), 516);
+  EXPECT_EQ(urlOf(files.createFolder(drive.store, "folder", kRequest).error), drive.at("folder"));
+  EXPECT_EQ(codeOf(files.createFolder(drive.at("none"), "x", kRequest).error), 4);
+  EXPECT_EQ(codeOf(files.createFolder(drive.outside, "x", kRequest).error), 513);
+
+  EXPECT_EQ(files.rename(drive.at("a.txt"), "A.txt", kRequest).path, drive.at("A.txt"));
+  EXPECT_EQ(files.rename(drive.at("A.txt"), "A.txt", kRequest).path, drive.at("A.txt"));
+  EXPECT_EQ(codeOf(files.rename(drive.at("a.txt"), "b", kRequest).error), 4);
+  EXPECT_EQ(codeOf(files.rename(drive.at("A.txt"), "a/b", kRequest).error), 514);
+  EXPECT_EQ(codeOf(files.rename(drive.at("A.txt"), ".Trash-7", kRequest).error), 514);
+  NSErrorPtr taken = files.rename(drive.at("A.txt"), "folder", kRequest).error;
+  EXPECT_EQ(codeOf(taken), 516);
+  EXPECT_EQ(urlOf(taken), drive.at("folder"));
+  // Two links of one file are two items: none silently swallows the other.
+  std::filesystem::create_hard_link(drive.at("A.txt"), drive.at("link.txt"));
+  EXPECT_EQ(codeOf(files.rename(drive.at("A.txt"), "link.txt", kRequest).error), 516);
+
+  drive.write("folder/A.txt", "other");
+  EXPECT_EQ(codeOf(files.move(drive.at("A.txt"), drive.at("folder"), {}, false, kRequest).error),
+            516);
+  EXPECT_EQ(files.move(drive.at("A.txt"), drive.at("folder"), {}, true, kRequest).path,
+            drive.at("folder/A 2.txt"));
+  EXPECT_EQ(files.move(drive.at("link.txt"), drive.at("folder"), "c", false, kRequest).path,
+            drive.at("folder/c"));
+  EXPECT_EQ(TestDrive::get(drive.at("folder/A.txt")), "other");
+  EXPECT_EQ(TestDrive::get(drive.at("folder/A 2.txt")), "a");
+}
+
+TEST(Operations, TheMoveRuleRefusesWhatMoveRefuses) {
+  TestDrive drive;
+  FileOperations& files = drive.open();
+  drive.write("outer/inner/a", "a");
+  drive.write("b", "b");
+  const std::string trashed = files.trash(drive.at("b"), kRequest).path;
+  const std::string trash = drive.at(trashFolderName(::geteuid()));
+  constexpr std::uint64_t kSignificant = 0x15f9;
+  const auto mask = [&](const std::string& path, const std::string& to) {
+    NSErrorPtr error;
+    const std::uint64_t bits = files.capabilityToMove(path, to, &error);
+    EXPECT_EQ(bits == 0, error != nullptr) << to;
+    EXPECT_EQ(bits & ~kSignificant, 0u);
+    return bits;
+  };
+  EXPECT_EQ(mask(drive.at("outer/inner"), drive.at("outer/x")), kMayRename);
+  EXPECT_EQ(mask(drive.at("outer/inner"), drive.at("inner")), kMayMoveToAnotherFolder);
+  EXPECT_EQ(mask(trashed, drive.at("outer/b")), kMayMoveOutOfTrash);
+
+  const struct {
+    std::string path, folder, name;
+  } refused[] = {
+      {drive.at("outer"), drive.at("outer"), "outer"},
+      {drive.at("outer"), drive.at("outer/inner"), "outer"},
+      {drive.store, drive.at("outer"), "store"},
+      {drive.at("outer"), drive.outside, "outer"},
+      {drive.at("outer"), trash + "/files", "outer"},
+      {drive.at("outer"), drive.store, ".Trash-1"},
+      {trash, drive.at("outer"), ".Trash"},
+      {trash + "/info", drive.at("outer"), "info"},
+  };
+  const auto before = drive.snapshot();
+  for (const auto& move : refused) {
+    EXPECT_EQ(mask(move.path, move.folder + '/' + move.name), 0u) << move.path;
+    const FileResult result = files.move(move.path, move.folder, move.name, true, kRequest);
+    EXPECT_NE(result.error, nullptr) << move.path << " -> " << move.folder;
+  }
+  EXPECT_EQ(drive.snapshot(), before);
+  EXPECT_EQ(codeOf(files.rename(trashed, "x", kRequest).error), 513);
+  EXPECT_EQ(codeOf(files.trash(trashed, kRequest).error), 513);
+  EXPECT_EQ(codeOf(files.remove(drive.store, kRequest).error), 513);
+}
+
+TEST(Operations, NeverFollowALinkOutOfTheStore) {
+  TestDrive drive;
+  FileOperations& files = drive.open();
+  TestDrive::put(drive.outside + "/secret", "s");
+  std::filesystem::create_directory_symlink(drive.outside, drive.at("out"));
+  EXPECT_NE(files.remove(drive.at("out/secret"), kRequest).error, nullptr);
+  EXPECT_NE(files.createFolder(drive.at("out"), "x", kRequest).error, nullptr);
+  EXPECT_NE(files.rename(drive.at("x/../../outside/secret"), "x", kRequest).error, nullptr);
+  EXPECT_NE(files.setTags(drive.at("out/secret"), {"t"}).error, nullptr);
+  EXPECT_EQ(files.remove(drive.at("out"), kRequest).error, nullptr);
+  EXPECT_EQ(TestDrive::get(drive.outside + "/secret"), "s");
+}
+
+TEST(Import, KeepsATreeAsItIsWithProgressAndCancelsWithoutATrace) {
+  TestDrive drive;
+  FileOperations& files = drive.open();
+  const std::string tree = drive.outside + "/tree";
+  for (int number = 0; number < 200; ++number) {
+    TestDrive::put(tree + "/sub/file" + std::to_string(number), std::string(4096, 'x'));
+  }
+  TestDrive::put(tree + "/empty", "");
+  TestDrive::put(tree + "/sparse", "begin");
+  std::filesystem::resize_file(tree + "/sparse", 8 << 20);
+  std::ofstream(tree + "/sparse", std::ios::app) << "end";
+  std::filesystem::create_symlink("nowhere", tree + "/link");
+  ASSERT_EQ(::chmod((tree + "/empty").c_str(), 04751), 0);
+  ASSERT_EQ(::chmod((tree + "/sub").c_str(), 0500), 0);
+  const timespec times[2] = {{1000, 1}, {2000, 2}};
+  ASSERT_EQ(::utimensat(AT_FDCWD, (tree + "/empty").c_str(), times, 0), 0);
+  DirectoryHandle outside;
+  ASSERT_EQ(DirectoryHandle::openRoot(tree, outside), 0);
+  ASSERT_EQ(writeTags(drive.files, outside, "empty", "empty", {"red"}).storage, TagStorage::Kept);
+
+  FileRequest request = kRequest;
+  std::uint64_t calls = 0;
+  request.progress = [&](const FileProgress& progress) {
+    ++calls;
+    return progress.doneItems < 100;
+  };
+  EXPECT_EQ(codeOf(files.importDocument(tree, drive.store, {}, request).error), 3072);
+  EXPECT_TRUE(drive.snapshot(true).empty());
+  EXPECT_TRUE(std::filesystem::is_empty(drive.state + "/staging"));
+
+  FileProgress last;
+  request.progress = [&](const FileProgress& progress) {
+    last = progress;
+    return true;
+  };
+  EXPECT_EQ(files.importDocument(tree + "/", drive.store, "new", request).path, drive.at("new"));
+  EXPECT_EQ(last.doneItems, last.totalItems);
+  EXPECT_EQ(last.totalItems, 205u);
+  struct stat status {};
+  ASSERT_EQ(::stat(drive.at("new/empty").c_str(), &status), 0);
+  EXPECT_EQ(status.st_mode & 07777, 0751u) << "set-user-id does not come along";
+  EXPECT_EQ(status.st_mtim.tv_sec, 2000);
+  EXPECT_EQ(files.tags(drive.at("new/empty")).names, std::vector<std::string>{"red"});
+  EXPECT_EQ(TestDrive::get(drive.at("new/sparse")), TestDrive::get(tree + "/sparse"));
+  ASSERT_EQ(::stat(drive.at("new/sparse").c_str(), &status), 0);
+  EXPECT_LT(status.st_blocks * 512, 1 << 20) << "a hole was filled";
+  ASSERT_EQ(::stat(drive.at("new/sub").c_str(), &status), 0);
+  EXPECT_EQ(status.st_mode & 0777, 0700u);
+  EXPECT_EQ(std::filesystem::read_symlink(drive.at("new/link")), "nowhere");
+
+  EXPECT_EQ(urlOf(files.importDocument(tree, drive.store, "new", kRequest).error), drive.at("new"));
+  EXPECT_EQ(codeOf(files.importDocument(drive.at("new"), drive.at("new/sub"), {}, kRequest).error),
+            513);
+  ASSERT_EQ(::mkfifo((tree + "/pipe").c_str(), 0600), 0);
+  EXPECT_NE(wordsOf(files.importDocument(tree, drive.store, "two", kRequest).error).find("pipe"),
+            std::string::npos);
+  EXPECT_FALSE(drive.exists("two"));
+  EXPECT_EQ(codeOf(files.importDocument(drive.outside + "/no", drive.store, {}, kRequest).error),
+            4);
+}
+
+TEST(Trash, NumbersClashesAndPutsBackUnderTheOldName) {
+  TestDrive drive;
+  FileOperations& files = drive.open();
+  const std::string odd = "50% \xC3\xA4\n\xFF.txt";
+  const std::string longName = std::string(250, 'l') + ".txt";
+  for (const std::string& name : {odd, longName}) {
+    std::vector<std::string> trashed;
+    for (int number = 0; number < 3; ++number) {
+      drive.write("sub/" + name, std::to_string(number));
+      trashed.push_back(files.trash(drive.at("sub/" + name), kRequest).path);
+      ASSERT_FALSE(trashed.back().empty());
+      EXPECT_EQ(files.putBackPath(trashed.back()).path, drive.at("sub/" + name));
+    }
+    EXPECT_FALSE(drive.exists("sub/" + name));
+    EXPECT_EQ(files.move(trashed[1], drive.at("sub"), {}, true, kRequest).path,
+              drive.at("sub/" + name));
+    EXPECT_EQ(TestDrive::get(drive.at("sub/" + name)), "1");
+    const std::string bounced = files.move(trashed[2], drive.at("sub"), {}, true, kRequest).path;
+    EXPECT_EQ(bounced, drive.at("sub/" + numberedName(name, 2, ' ')));
+    EXPECT_EQ(codeOf(files.putBackPath(trashed[2]).error), 4);
+    EXPECT_EQ(files.remove(trashed[0], kRequest).error, nullptr);
+  }
+  const std::string trash = drive.at(trashFolderName(::geteuid()));
+  EXPECT_TRUE(std::filesystem::is_empty(trash + "/info"));
+  struct stat status {};
+  ASSERT_EQ(::stat(trash.c_str(), &status), 0);
+  EXPECT_EQ(status.st_mode & 07777, 0700u);
+
+  // What lies in a trashed folder knows its place too.
+  drive.write("folder/deep/x", "x");
+  const std::string folder = files.trash(drive.at("folder"), kRequest).path;
+  EXPECT_EQ(files.putBackPath(folder + "/deep/x").path, drive.at("folder/deep/x"));
+  EXPECT_EQ(files.move(folder + "/deep/x", drive.store, {}, false, kRequest).path, drive.at("x"));
+  EXPECT_EQ(files.putBackPath(folder).path, drive.at("folder"));
+}
+
+TEST(Trash, BelievesNoInfoThatLeadsOut) {
+  TestDrive drive;
+  FileOperations& files = drive.open();
+  drive.write("a", "a");
+  const std::string trashed = files.trash(drive.at("a"), kRequest).path;
+  const std::string info = drive.at(trashFolderName(::geteuid())) + "/info/a.trashinfo";
+  const auto origin = [&](const std::string& path) {
+    TestDrive::put(info, "[Trash Info]\nPath=" + path + "\nDeletionDate=2026-01-01T00:00:00\n");
+    return files.putBackPath(trashed).path;
+  };
+  EXPECT_EQ(origin("sub/b%20c"), drive.at("sub/b c"));
+  EXPECT_EQ(origin(percentEncoded(drive.at("b"))), drive.at("b"));
+  EXPECT_EQ(origin("../outside/b"), "");
+  EXPECT_EQ(origin("/etc/passwd"), "");
+  EXPECT_EQ(origin("b%00c"), "");
+  EXPECT_EQ(origin("b%2"), "");
+  EXPECT_EQ(parseTrashInfo("Path=a\n"), std::nullopt);
+}
+
+TEST(Provenance, TellsWhoseRequestRemovedAPathAndIsBounded) {
+  TestDrive drive;
+  FileOperations& files = drive.open();
+  drive.write("folder/sub/a", "a");
+  drive.write("b", "b");
+  ASSERT_EQ(files.rename(drive.at("folder"), "renamed", {"one", {}, {}}).error, nullptr);
+  ASSERT_EQ(files.remove(drive.at("renamed"), {"two", "i01", {}}).error, nullptr);
+  drive.files.failAt(2, EACCES);
+  ASSERT_EQ(codeOf(files.remove(drive.at("b"), {"three", {}, {}}).error), 513);
+  drive.files.failAt(0, 0);
+
+  auto history = files.journal().historyOfPath(drive.at("renamed/sub/a"), 10, nullptr);
+  ASSERT_EQ(history.size(), 2u);
+  EXPECT_EQ(history[0].kind, OperationKind::Remove);
+  EXPECT_EQ(history[0].origin, "two");
+  EXPECT_EQ(history[0].state, OperationState::Done);
+  EXPECT_EQ(history[1].destination, drive.at("renamed"));
+  EXPECT_EQ(files.journal().historyOfPath(drive.at("folder/sub/a"), 10, nullptr).size(), 1u);
+  EXPECT_EQ(files.journal().historyOfDocument("i01", 10, nullptr).size(), 1u);
+  history = files.journal().historyOfPath(drive.at("b"), 10, nullptr);
+  ASSERT_EQ(history.size(), 1u);
+  EXPECT_EQ(history[0].state, OperationState::Undone);
+
+  NSErrorPtr error;
+  auto journal = OperationJournal::open(drive.state + "/small.db", 100, drive.files, &error);
+  ASSERT_TRUE(journal) << wordsOf(error);
+  OperationEntry entry;
+  entry.path = "/kept/open";
+  ASSERT_EQ(journal->begin(entry), nullptr);
+  for (int number = 0; number < 600; ++number) {
+    entry.path = "/x";
+    ASSERT_EQ(journal->begin(entry), nullptr);
+    journal->end(entry.id, OperationState::Done);
+  }
+  const std::size_t kept = journal->historyOfPath("/x", 1000, &error).size();
+  EXPECT_GE(kept, 100u);
+  EXPECT_LE(kept, 100u + 256u);
+  EXPECT_EQ(journal->openEntries(&error).size(), 1u);
+}
+
+}  // namespace
+}  // namespace skein::vald
