@@ -1,0 +1,207 @@
+#include "linux/vald/cloud/DownloadTransfer.h"
+
+#include <sys/stat.h>
+
+#include <cerrno>
+#include <utility>
+
+#include "linux/vald/cloud/CloudErrors.h"
+#include "linux/vald/cloud/CloudRecovery.h"
+#include "linux/vald/cloud/FileAttributes.h"
+#include "linux/vald/files/FileErrors.h"
+#include "linux/vald/files/FileNames.h"
+
+namespace skein::vald {
+
+// The transfer's bytes, with the progress told once they have arrived.
+class DownloadTransfer::Stream final : public CloudTransfer {
+ public:
+  explicit Stream(DownloadTransfer& owner)
+      : CloudTransfer(owner._conditions, owner._clock, owner._cancellation, Direction::Down),
+        _owner(owner) {}
+
+  NSErrorPtr didPass(std::uint64_t bytes) override {
+    if (NSErrorPtr error = CloudTransfer::didPass(bytes)) return error;
+    if (_owner._progress) _owner._progress(bytes, _owner._marker->marker.contents.size);
+    return nullptr;
+  }
+
+ private:
+  DownloadTransfer& _owner;
+};
+
+DownloadTransfer::DownloadTransfer(CloudPlaces places, CloudConditions& conditions,
+                                   CloudClock& clock, VLFileObjectID document, std::string path,
+                                   Progress progress)
+    : _places(std::move(places)),
+      _conditions(conditions),
+      _clock(clock),
+      _document(document),
+      _path(std::move(path)),
+      _progress(std::move(progress)) {}
+
+NSErrorPtr DownloadTransfer::run() {
+  if (_cancellation.isCancelled()) return cancelledError();
+  if (NSErrorPtr error = begin()) return error;
+  if (!_marker) return nullptr;
+  const auto work = _places.beginWork(_path);
+  if (!work) return work.error();
+  FileDescriptor part;
+  NSErrorPtr error;
+  if (const int code = createPart(part)) {
+    error = code == ECANCELED ? cancelledError() : fileError(code, "can't download", _path);
+  } else {
+    error = transfer(part);
+    if (error != nullptr) dropPart();
+  }
+  _places.endWork(*work);
+  return error;
+}
+
+NSErrorPtr DownloadTransfer::begin() {
+  if (NSErrorPtr error = _places.roots.locate(_path, _place)) return error;
+  _names.emplace(_place.name);
+  auto marker = openMarker(_place.folder, _names->marker, _path);
+  if (!marker) {
+    const bool missing = marker.error()->code() == NSFileNoSuchFileError;
+    return missing && _place.folder.exists(_place.name) ? nullptr : marker.error();
+  }
+  if (marker->marker.document != _document) {
+    return fileErrorWithWords(NSFileNoSuchFileError, 0,
+                              "\"" + printable(_path) + "\" is another document by now", _path);
+  }
+  for (const std::string* name : {&_names->part, &_names->fresh, &_names->aside}) {
+    if (_place.folder.exists(*name)) {
+      return fileError(EEXIST, "can't download to", joinPath(_place.folderPath(), *name));
+    }
+  }
+  // From here on these names are this system's: recovery may remove what it finds there.
+  if (_place.folder.exists(_place.name)) return resolveBoth();
+  _marker.emplace(std::move(*marker));
+  return nullptr;
+}
+
+NSErrorPtr DownloadTransfer::resolveBoth() {
+  // Another transfer is just finishing, or one could not remove its marker, or somebody
+  // made a file of this name.
+  const auto lock = _places.coordinate(_path);
+  if (!lock) return lock.error();
+  if (_place.folder.exists(_names->marker)) {
+    if (NSErrorPtr error = recoverPlace(_places, _place)) return error;
+  }
+  return _place.folder.exists(_names->marker) ? fileError(EEXIST, "can't download", _path)
+                                              : nullptr;
+}
+
+NSErrorPtr DownloadTransfer::transfer(const FileDescriptor& part) {
+  if (const int code = reserveSpace(_places.files, part.get(), _marker->marker.contents.size)) {
+    return fileError(code, "can't download", _path);
+  }
+  if (NSErrorPtr error = fetch(part)) return error;
+  return finish(part);
+}
+
+NSErrorPtr DownloadTransfer::fetch(const FileDescriptor& part) {
+  const HashedContents& wanted = _marker->marker.contents;
+  const auto source = _places.contents.read(wanted.hash);
+  if (!source) return source.error();
+  Stream stream(*this);
+  // Where the blocks can be shared they only have to be read; a cloud that spoils contents
+  // has to write them.
+  const bool cloned = !_conditions.settings().corrupt &&
+                      _places.files.cloneContents(source->get(), part.get()) == 0;
+  const auto got = cloned ? hashContents(part.get(), _path, stream)
+                          : copyContents(_places.files, source->get(), part.get(), _path, stream);
+  if (!got) return got.error();
+  const bool right = got->hash == wanted.hash && got->size == wanted.size;
+  return right ? nullptr : corruptError("\"" + printable(_path) + "\"");
+}
+
+NSErrorPtr DownloadTransfer::finish(const FileDescriptor& part) {
+  // The contents are on the disk before the lock is taken: that may take long.
+  if (const int code = _places.files.sync(part.get())) {
+    return fileError(code, "can't download", _path);
+  }
+  const auto lock = _places.coordinate(_path);
+  if (!lock) return lock.error();
+  if (NSErrorPtr error = dressPart(part)) return error;
+  if (const int code = namePart()) {
+    return code == ECANCELED ? cancelledError() : fileError(code, "can't download", _path);
+  }
+  // The file is there: nothing after this makes the download fail.
+  removeMarker(part);
+  return nullptr;
+}
+
+NSErrorPtr DownloadTransfer::dressPart(const FileDescriptor& part) {
+  // The marker may have been moved, or got other tags, while the contents came.
+  struct stat before {};
+  struct stat now {};
+  if (fstat(_marker->file.get(), &before) != 0 || _place.folder.status(_names->marker, now) != 0 ||
+      before.st_ino != now.st_ino || before.st_dev != now.st_dev) {
+    return fileErrorWithWords(
+        NSFileNoSuchFileError, ENOENT,
+        "\"" + printable(_path) + "\" was moved or removed while it was downloaded; try again",
+        _path);
+  }
+  const EvictionMarker& marker = _marker->marker;
+  if (NSErrorPtr error =
+          copyFileAttributes(_places.files, _marker->file.get(), part.get(), marker.mode, _path)) {
+    return error;
+  }
+  const timespec times[2] = {now.st_atim, UploadStamp::timeOf(marker.modified)};
+  int code = _places.files.setTimes(part.get(), "", times);
+  if (code == 0) code = _places.files.sync(part.get());
+  return code == 0 ? nullptr : fileError(code, "can't download", _path);
+}
+
+void DownloadTransfer::removeMarker(const FileDescriptor& part) {
+  // Should one of these fail, file and marker stand side by side for the same contents: the
+  // marker is not looked at while the file is there, and goes with the next eviction or
+  // recovery.
+  const int folder = _place.folder.get();
+  if (_places.files.sync(folder) != 0) return;
+  if (_places.files.unlink(folder, _names->marker) != 0) return;
+  struct stat status {};
+  if (fstat(part.get(), &status) != 0) return;
+  // Without a stamp the document is looked at again, and found to be uploaded.
+  _places.records.setStamp(_document, UploadStamp::of(status));
+}
+
+int DownloadTransfer::createPart(FileDescriptor& part) {
+  MutexLock lock(_partMutex);
+  if (_part == Part::Abandoned) return ECANCELED;
+  const int code = _places.files.createFile(_place.folder.get(), _names->part, 0600, part);
+  if (code == 0) _part = Part::There;
+  return code;
+}
+
+int DownloadTransfer::namePart() {
+  MutexLock lock(_partMutex);
+  if (_part == Part::Abandoned) return ECANCELED;
+  const int folder = _place.folder.get();
+  const int code = _places.files.renameWithoutReplacing(folder, _names->part, folder, _place.name);
+  if (code == 0) _part = Part::Named;
+  return code;
+}
+
+void DownloadTransfer::dropPart() {
+  MutexLock lock(_partMutex);
+  if (_part != Part::There) return;
+  _part = Part::Abandoned;
+  // A part that cannot be removed is invisible, and goes with the next recovery.
+  _places.files.unlink(_place.folder.get(), _names->part);
+}
+
+bool DownloadTransfer::abandon() {
+  {
+    MutexLock lock(_partMutex);
+    if (_part == Part::Named) return false;
+    if (_part == Part::There) _places.files.unlink(_place.folder.get(), _names->part);
+    _part = Part::Abandoned;
+  }
+  _cancellation.cancel();
+  return true;
+}
+
+}  // namespace skein::vald

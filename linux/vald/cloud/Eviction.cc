@@ -1,0 +1,226 @@
+#include "linux/vald/cloud/Eviction.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+
+#include <cerrno>
+#include <utility>
+
+#include "linux/vald/cloud/CloudErrors.h"
+#include "linux/vald/cloud/CloudRecovery.h"
+#include "linux/vald/cloud/FileAttributes.h"
+#include "linux/vald/cloud/FileLease.h"
+#include "linux/vald/files/FileErrors.h"
+
+namespace skein::vald {
+namespace {
+
+NSErrorPtr refusal(EvictionRefusal reason, const std::string& path, const std::string& why,
+                   NSErrorPtr underlying = nullptr) {
+  NSErrorUserInfo info{
+      {NSLocalizedDescriptionKey, "\"" + printable(path) + "\" was not evicted: " + why},
+      {NSURLErrorKey, NSURL::fileURLWithPath(path)}};
+  if (underlying != nullptr) info[NSUnderlyingErrorKey] = std::move(underlying);
+  return NSError::errorWithDomain(SkeinEvictionErrorDomain, static_cast<std::int64_t>(reason),
+                                  std::move(info));
+}
+
+NSErrorPtr changedSinceUpload(const std::string& path) {
+  return refusal(EvictionRefusal::ChangedSinceUpload, path,
+                 "it changed since it was uploaded; wait until it is uploaded again");
+}
+
+NSErrorPtr openForWriting(const std::string& path) {
+  return refusal(EvictionRefusal::OpenForWriting, path,
+                 "a program has it open for writing; close it there and try again");
+}
+
+NSErrorPtr nameTaken(const std::string& path, const std::string& name) {
+  return refusal(EvictionRefusal::MarkerNameTaken, path,
+                 "\"" + printable(name) + "\" is in the way; rename it");
+}
+
+}  // namespace
+
+struct Eviction::Subject {
+  explicit Subject(const Request& asked) : request(asked) {}
+
+  const Request& request;
+  StorePlace place;
+  std::optional<MarkerNames> names;
+  FileDescriptor file;
+  FileLease lease;  // after the file, so that it is given up first
+  UploadStamp uploadedAs;
+  CloudRecord record;
+  CloudContents::Hold contents;
+};
+
+NSErrorPtr Eviction::evict(const Request& request) {
+  Subject subject(request);
+  if (NSErrorPtr error = _places.roots.locate(request.path, subject.place)) return error;
+  if (subject.place.isRoot()) {
+    return refusal(EvictionRefusal::NotADocument, request.path, "it is a folder");
+  }
+  subject.names.emplace(subject.place.name);
+  const auto lock = _places.coordinate(request.path);
+  if (!lock) return lock.error();
+  if (NSErrorPtr error = check(subject)) return error;
+
+  const auto work = _places.beginWork(request.path);
+  if (!work) return work.error();
+  NSErrorPtr error = perform(subject);
+  if (error != nullptr) {
+    subject.lease.giveUp();
+    // What is not undone now stays noted and is undone at the next start.
+    if (recoverPlace(_places, subject.place) != nullptr) return error;
+  } else {
+    // A stamp that is left fits no file any more: nothing depends on this.
+    _places.records.setStamp(request.document, std::nullopt);
+  }
+  _places.endWork(*work);
+  return error;
+}
+
+NSErrorPtr Eviction::check(Subject& subject) {
+  // From here on these names are this system's: recovery may remove what it finds there.
+  for (const std::string* name :
+       {&subject.names->fresh, &subject.names->aside, &subject.names->part}) {
+    if (subject.place.folder.exists(*name)) return nameTaken(subject.request.path, *name);
+  }
+  // A marker beside the file is what a crash left, or somebody else's file.
+  if (subject.place.folder.exists(subject.names->marker) &&
+      subject.place.folder.exists(subject.place.name)) {
+    if (NSErrorPtr error = recoverPlace(_places, subject.place)) return error;
+    if (subject.place.folder.exists(subject.names->marker)) {
+      return nameTaken(subject.request.path, subject.names->marker);
+    }
+  }
+  if (NSErrorPtr error = checkFile(subject)) return error;
+  return checkUpload(subject);
+}
+
+NSErrorPtr Eviction::checkFile(Subject& subject) {
+  const std::string& path = subject.request.path;
+  struct stat status {};
+  if (const int code = subject.place.folder.status(subject.place.name, status)) {
+    if (code == ENOENT && subject.place.folder.exists(subject.names->marker)) {
+      return refusal(EvictionRefusal::AlreadyEvicted, path, "its contents are in the cloud alone");
+    }
+    return fileError(code, "can't evict", path);
+  }
+  if (!S_ISREG(status.st_mode)) {
+    return refusal(EvictionRefusal::NotADocument, path, "it is no plain file");
+  }
+  if (status.st_nlink != 1) {
+    return refusal(EvictionRefusal::SeveralNames, path,
+                   "it has " + std::to_string(status.st_nlink) +
+                       " names (hard links), and the others would keep its contents here");
+  }
+  if (const int code = subject.place.folder.openFile(subject.place.name, subject.file)) {
+    return fileError(code, "can't evict", path);
+  }
+  const int code = subject.lease.take(subject.file.get());
+  if (code == EAGAIN) return openForWriting(path);
+  if (code == EACCES) return fileError(code, "can't evict a file of another user,", path);
+  if (code != 0) {
+    return refusal(EvictionRefusal::CannotBeWatched, path,
+                   "its file system cannot tell whether a program is writing to it",
+                   fileError(code, "can't take a lease on", path));
+  }
+  return nullptr;
+}
+
+NSErrorPtr Eviction::checkUpload(Subject& subject) {
+  const std::string& path = subject.request.path;
+  const auto pinned = _places.records.isPinned(subject.request.document);
+  if (!pinned) return pinned.error();
+  if (*pinned) {
+    return refusal(EvictionRefusal::Pinned, path, "it is pinned to this machine; unpin it first");
+  }
+  auto record = _places.records.record(subject.request.document);
+  if (!record) return record.error();
+  const auto stamp = _places.records.stamp(subject.request.document);
+  if (!stamp) return stamp.error();
+  if (!*record || !*stamp) {
+    return refusal(EvictionRefusal::NotUploaded, path, "it is not uploaded yet");
+  }
+  auto contents = _places.contents.hold((*record)->contents);
+  if (!contents) {
+    return refusal(EvictionRefusal::NotUploaded, path,
+                   "the cloud has lost its contents; change it or upload it again");
+  }
+  struct stat status {};
+  if (fstat(subject.file.get(), &status) != 0) return fileError(errno, "can't evict", path);
+  if (UploadStamp::of(status) != **stamp) return changedSinceUpload(path);
+  subject.record = std::move(**record);
+  subject.uploadedAs = **stamp;
+  subject.contents = std::move(*contents);
+  return nullptr;
+}
+
+NSErrorPtr Eviction::perform(Subject& subject) {
+  if (NSErrorPtr error = writeMarker(subject)) return error;
+  if (NSErrorPtr error = setAside(subject)) return error;
+  const int code = _places.files.unlink(subject.place.folder.get(), subject.names->aside);
+  return code == 0 ? nullptr : fileError(code, "can't evict", subject.request.path);
+}
+
+NSErrorPtr Eviction::writeMarker(Subject& subject) {
+  const std::string& path = subject.request.path;
+  struct stat status {};
+  if (fstat(subject.file.get(), &status) != 0) return fileError(errno, "can't evict", path);
+  EvictionMarker marker;
+  marker.document = subject.request.document;
+  marker.contents = subject.record.contents;
+  marker.modified = subject.uploadedAs.modified;
+  marker.created = subject.record.created;
+  marker.mode = status.st_mode & 07777;
+  marker.type = subject.request.type;
+  if (subject.names->shortened) marker.name = subject.place.name;
+
+  const int folder = subject.place.folder.get();
+  FileDescriptor fresh;
+  int code = _places.files.createFile(folder, subject.names->fresh, 0600, fresh);
+  if (code == 0) code = _places.files.write(fresh.get(), marker.asText());
+  if (code != 0) return fileError(code, "can't write the marker of", path);
+  // The owner can always read it, even where the document's mode would not let him.
+  const mode_t mode = (marker.mode & 0777) | S_IRUSR;
+  if (NSErrorPtr error =
+          copyFileAttributes(_places.files, subject.file.get(), fresh.get(), mode, path)) {
+    return error;
+  }
+  code = _places.files.sync(fresh.get());
+  if (code == 0) {
+    code = _places.files.renameWithoutReplacing(folder, subject.names->fresh, folder,
+                                                subject.names->marker);
+  }
+  // The marker must be on the disk before the file goes.
+  if (code == 0) code = _places.files.sync(folder);
+  return code == 0 ? nullptr : fileError(code, "can't write the marker of", path);
+}
+
+NSErrorPtr Eviction::setAside(Subject& subject) {
+  const std::string& path = subject.request.path;
+  const int folder = subject.place.folder.get();
+  const auto stampNow = [&] {
+    struct stat status {};
+    return fstat(subject.file.get(), &status) == 0 ? UploadStamp::of(status) : UploadStamp();
+  };
+  // A tag or a mode that was set while the marker was written is not on the marker.
+  if (stampNow() != subject.uploadedAs) return changedSinceUpload(path);
+  const int code = _places.files.renameWithoutReplacing(folder, subject.place.name, folder,
+                                                        subject.names->aside);
+  if (code != 0) return fileError(code, "can't evict", path);
+  // Is it the file that was looked at, and not one that took its name meanwhile?
+  struct stat aside {};
+  if (subject.place.folder.status(subject.names->aside, aside) != 0 ||
+      !UploadStamp::of(aside).sameButForChanged(subject.uploadedAs)) {
+    return changedSinceUpload(path);
+  }
+  // Gives whoever had found the file by its name just before the time to show.
+  if (const int synced = _places.files.sync(folder)) return fileError(synced, "can't evict", path);
+  if (!subject.lease.isUndisturbed()) return openForWriting(path);
+  return stampNow().sameButForChanged(subject.uploadedAs) ? nullptr : changedSinceUpload(path);
+}
+
+}  // namespace skein::vald
