@@ -132,13 +132,13 @@ struct AnchorAsker final : NSFileProviderChangeObserver {
   void finishEnumeratingChangesUpToSyncAnchor(NSData, bool) override { ask(); }
   void finishEnumeratingWithError(NSErrorPtr) override { ask(); }
   void ask() {
-    std::promise<void> answered;
-    std::thread other([&] {
-      _enumerator.currentSyncAnchorWithCompletionHandler([&](auto) { answered.set_value(); });
-    });
-    EXPECT_EQ(answered.get_future().wait_for(kDeadline), std::future_status::ready)
+    // On the heap and by reference count: when the other thread hangs, it is left to hang.
+    const auto answered = std::make_shared<std::promise<void>>();
+    std::thread([answered, enumerator = _enumerator.shared_from_this()] {
+      enumerator->currentSyncAnchorWithCompletionHandler([&](auto) { answered->set_value(); });
+    }).detach();
+    EXPECT_EQ(answered->get_future().wait_for(kDeadline), std::future_status::ready)
         << "the current anchor waits for the enumerator's lock";
-    other.join();
     // And on this thread the lock is re-entered: an observer may look again.
     again = _enumerator.pendingChangeCount();
   }
@@ -157,12 +157,12 @@ TEST_F(Changes, TheCurrentAnchorNeverWaitsForTheLock) {
 struct Pusher final : NSFileProviderChangeObserver {
   explicit Pusher(VLFileEnumerator& enumerator) : _enumerator(enumerator) {}
   void didUpdateItems(const NSFileProviderItems&) override {
-    std::promise<void> replied;
-    std::thread other(
-        [&] { _enumerator.receiveUpdates({makeItem(2)}, {}, {}, [&] { replied.set_value(); }); });
-    EXPECT_EQ(replied.get_future().wait_for(kDeadline), std::future_status::ready)
+    const auto replied = std::make_shared<std::promise<void>>();
+    std::thread([replied, enumerator = _enumerator.shared_from_this()] {
+      enumerator->receiveUpdates({makeItem(2)}, {}, {}, [replied] { replied->set_value(); });
+    }).detach();
+    EXPECT_EQ(replied->get_future().wait_for(kDeadline), std::future_status::ready)
         << "a batch is reported with the lock held";
-    other.join();
   }
   void didDeleteItemsWithIdentifiers(const std::vector<std::string>&) override {}
   void finishEnumeratingChangesUpToSyncAnchor(NSData upTo, bool) override { anchor = upTo; }

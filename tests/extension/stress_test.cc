@@ -4,6 +4,7 @@
 #include <chrono>
 #include <map>
 #include <set>
+#include <thread>
 
 #include "base/ThreadPool.h"
 #include "tests/extension/FolderFixture.h"
@@ -14,9 +15,10 @@ namespace {
 
 constexpr auto kDeadline = std::chrono::seconds(60);
 constexpr int kPushers = 3;
-constexpr int kPushes = 300;
+constexpr int kActors = kPushers + 3;
+constexpr int kPushes = 800;
 constexpr std::uint64_t kItemsPerPusher = 40;
-constexpr int kFloodEvery = 100;  // one push in so many passes the cap
+constexpr int kFloodEvery = 200;  // one push in so many passes the cap
 
 // A pool that can be waited for until it has nothing to do.
 class CountingPool final : public Executor {
@@ -51,7 +53,7 @@ class CountingPool final : public Executor {
   Mutex _mutex;
   CondVar _idle;
   int _outstanding SKEIN_GUARDED_BY(_mutex) = 0;
-  ThreadPool _pool{4, "stress"};
+  ThreadPool _pool{8, "stress"};
 };
 
 // What the store holds: the version of each live item.
@@ -180,15 +182,22 @@ TEST(Stress, AHostEndsWithWhatTheStoreHolds) {
 
     std::atomic<int> pushersLeft{kPushers};
     std::atomic<int> listed{0}, ended{0};
+    // Nobody begins before all can, or one would be done before the next.
+    std::atomic<int> ready{0};
+    const auto begin = [&ready] {
+      for (++ready; ready < kActors;) std::this_thread::yield();
+    };
     Host host{*enumerator, store};
     host.list();
     for (std::uint64_t pusher = 0; pusher < kPushers; ++pusher) {
       pool->post([&, pusher] {
+        begin();
         pushAll(*enumerator, store, pusher);
         --pushersLeft;
       });
     }
     pool->post([&] {
+      begin();
       while (pushersLeft > 0) {
         host.round();
         EXPECT_LE(enumerator->pendingChangeCount(), 5000u);
@@ -203,6 +212,7 @@ TEST(Stress, AHostEndsWithWhatTheStoreHolds) {
       std::atomic<int>& _count;
     };
     pool->post([&] {
+      begin();
       while (pushersLeft > 0 && listed < 2000) {
         enumerator->enumerateItemsForObserver(std::make_shared<Ending>(ended),
                                               NSFileProviderInitialPageSortedByName());
@@ -210,6 +220,7 @@ TEST(Stress, AHostEndsWithWhatTheStoreHolds) {
       }
     });
     pool->post([&] {
+      begin();
       while (pushersLeft > 0) {
         env.notificationCenter.postNotificationName(VLAccountTokenDidChangeNotification);
         env.notificationCenter.postNotificationName(VLContainerListDidChangeNotification);
