@@ -42,10 +42,11 @@ struct SocketClient::Core final : std::enable_shared_from_this<Core>,
         tasks(*this) {}
   ~Core() { close(); }
 
-  kj::Promise<NSErrorPtr> connected();
-  kj::Promise<NSErrorPtr> connect();
-  NSErrorPtr connectNow(int& code);
-  kj::Promise<NSErrorPtr> startProgramAndConnect();
+  // Ends when there is a connection, or `lastError` says why there is none.
+  kj::Promise<void> connected();
+  kj::Promise<void> connect();
+  void connectNow(int& code);
+  kj::Promise<void> startProgramAndConnect();
   void lose(const NSErrorPtr& error);
   void close();
 
@@ -74,7 +75,7 @@ struct SocketClient::Core final : std::enable_shared_from_this<Core>,
   NSErrorPtr closed;  // set for good by close()
   kj::Promise<void> ending = nullptr;
   bool connecting = false;
-  kj::ForkedPromise<NSErrorPtr> connectingNow = nullptr;
+  kj::ForkedPromise<void> connectingNow = nullptr;
 
   std::list<MessagePtr> messages;
   struct Watcher {
@@ -117,35 +118,32 @@ NSErrorPtr SocketClient::Core::errorFor(const kj::Exception& exception) const {
 
 // --- The connection.
 
-kj::Promise<NSErrorPtr> SocketClient::Core::connected() {
-  if (closed) return closed;
-  if (connection.get() != nullptr) return NSErrorPtr();
+kj::Promise<void> SocketClient::Core::connected() {
+  if (connection.get() != nullptr || closed) return kj::READY_NOW;
   if (!connecting) {
     connecting = true;
-    connectingNow = connect()
-                        .then([this](NSErrorPtr error) {
-                          connecting = false;
-                          return error;
-                        })
-                        .fork();
+    connectingNow = connect().then([this] { connecting = false; }).fork();
   }
   return connectingNow.addBranch();
 }
 
-kj::Promise<NSErrorPtr> SocketClient::Core::connect() {
+kj::Promise<void> SocketClient::Core::connect() {
   int code = 0;
-  NSErrorPtr error = connectNow(code);
-  if (!error || !options.program || (code != ENOENT && code != ECONNREFUSED)) return error;
-  return startProgramAndConnect();
+  connectNow(code);
+  if (code != 0 && options.program && (code == ENOENT || code == ECONNREFUSED)) {
+    return startProgramAndConnect();
+  }
+  return kj::READY_NOW;
 }
 
-NSErrorPtr SocketClient::Core::connectNow(int& code) {
+void SocketClient::Core::connectNow(int& code) {
   FileDescriptor socket = connectToUnixSocket(options.socketPath, code);
   if (!socket) {
     const bool notThere = code == ENOENT || code == ECONNREFUSED;
-    return unreachable(notThere ? "does not run."
-                                : "cannot be reached at " + options.socketPath + ": " +
-                                      std::strerror(code) + ".");
+    lastError = unreachable(notThere ? "does not run."
+                                     : "cannot be reached at " + options.socketPath + ": " +
+                                           std::strerror(code) + ".");
+    return;
   }
   connection = kj::heap<RpcConnection>(loop->io(), std::move(socket), RpcLimits::ofClient());
   server = connection->bootstrap();
@@ -159,25 +157,27 @@ NSErrorPtr SocketClient::Core::connectNow(int& code) {
                })
                .eagerlyEvaluate(nullptr);
   if (connectedHandler) executor->post([handler = connectedHandler] { handler(); });
-  return nullptr;
 }
 
-kj::Promise<NSErrorPtr> SocketClient::Core::startProgramAndConnect() {
-  auto paf = kj::newPromiseAndFulfiller<NSErrorPtr>();
+kj::Promise<void> SocketClient::Core::startProgramAndConnect() {
+  auto paf = kj::newPromiseAndFulfiller<void>();
   auto fulfiller =
-      loop->own(std::make_unique<kj::Own<kj::PromiseFulfiller<NSErrorPtr>>>(kj::mv(paf.fulfiller)));
-  executor->post([fulfiller = std::move(fulfiller), program = *options.program, loop = loop,
+      loop->own(std::make_unique<kj::Own<kj::PromiseFulfiller<void>>>(kj::mv(paf.fulfiller)));
+  auto result = std::make_shared<NSErrorPtr>();
+  executor->post([fulfiller = std::move(fulfiller), result, program = *options.program, loop = loop,
                   executor = executor] {
     ScopedWait wait(*executor);
-    NSErrorPtr error = startProgram(program);
-    loop->post([fulfiller, error = std::move(error)]() mutable {
-      (*fulfiller)->fulfill(std::move(error));
-    });
+    *result = startProgram(program);
+    loop->post([fulfiller] { (*fulfiller)->fulfill(); });
   });
-  return paf.promise.then([this](NSErrorPtr error) {
+  return paf.promise.then([this, result] {
     int code = 0;
-    if (closed) return closed;
-    return error ? error : connectNow(code);
+    if (closed) return;
+    if (*result) {
+      lastError = *result;
+    } else {
+      connectNow(code);
+    }
   });
 }
 
@@ -322,9 +322,9 @@ void SocketClient::send(Send send, Fail fail, Patience patience) {
                patience]() mutable {
     auto message = core->newMessage(std::move(fail));
     auto sending = core->connected().then(
-        [core, message, send = std::move(send)](NSErrorPtr error) mutable -> kj::Promise<Task> {
-          if (error) {
-            core->finish(message, error);
+        [core, message, send = std::move(send)]() mutable -> kj::Promise<Task> {
+          if (core->connection.get() == nullptr) {
+            core->finish(message, core->closed ? core->closed : core->lastError);
             return Task();
           }
           message->connection = core->number;

@@ -78,9 +78,8 @@ struct Outcome {
   std::tuple<Values...> value() {
     auto got = replies->take();
     EXPECT_TRUE(got.has_value()) << "no reply but "
-                                 << (errors->count() > 0
-                                         ? (*errors->take())->localizedDescription()
-                                         : "no error either");
+                                 << (errors->count() > 0 ? (*errors->take())->localizedDescription()
+                                                         : "no error either");
     EXPECT_EQ(errors->count(), 0U);
     return got ? std::move(*got) : std::tuple<Values...>();
   }
