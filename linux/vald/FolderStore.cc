@@ -1,0 +1,455 @@
+#include "linux/vald/FolderStore.h"
+
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstring>
+
+#include "linux/vald/index/IndexFile.h"
+#include "platform/foundation/uuid.h"
+#include "vellum/VLErrors.h"
+
+namespace skein::vald {
+namespace {
+
+constexpr char kJournalID[] = "journal";
+constexpr std::size_t kMostListings = 1024;
+
+NSErrorPtr noSuchFile(const std::string& what) {
+  return NSError::errorWithDomain(NSCocoaErrorDomain, NSFileNoSuchFileError,
+                                  {{NSLocalizedDescriptionKey, what}});
+}
+
+std::string suffixOfRoot(std::uint64_t inode, std::uint32_t generation) {
+  return ".of-" + std::to_string(inode) + "-" + std::to_string(generation);
+}
+
+// An index belongs to one folder. Found beside another (the volume is not mounted, a
+// backup took the folder's place), it is put away under its folder's number, and taken
+// back when that folder is there again.
+std::unique_ptr<SqliteDatabase> openIndexOf(const RootFolder& drive, const std::string& path,
+                                            Log& log, NSErrorOut error) {
+  auto database = openIndexFile(path, log, error);
+  if (!database) return nullptr;
+  const auto inode = static_cast<std::uint64_t>(
+      database->integer("SELECT inode FROM root WHERE container IS NULL"));
+  const auto generation = static_cast<std::uint32_t>(
+      database->integer("SELECT generation FROM root WHERE container IS NULL"));
+  if (inode == 0 || (inode == drive.key.inode && generation == drive.key.generation)) {
+    return database;
+  }
+  database.reset();
+  const std::string suffix = suffixOfRoot(inode, generation);
+  const std::string own = suffixOfRoot(drive.key.inode, drive.key.generation);
+  VL_NOTICE(log, "[NOTICE] %@ is not the folder that the index knows; the index is kept as %@",
+            drive.path, path + suffix);
+  if (!setIndexFileAside(path, suffix)) {
+    error.store(vl_errorWithPOSIXCode(
+        errno, "The index of another folder at " + path + " could not be renamed."));
+    return nullptr;
+  }
+  takeIndexFileBack(path, own);
+  return openIndexFile(path, log, error);
+}
+
+std::string drawJournalID() {
+  uuid_t uuid;
+  uuid_generate(uuid);
+  static constexpr char kDigits[] = "0123456789abcdef";
+  std::string text;
+  for (const unsigned char byte : uuid) {
+    text += kDigits[byte >> 4];
+    text += kDigits[byte & 15];
+  }
+  return text;
+}
+
+}  // namespace
+
+std::unique_ptr<Store> Store::open(StoreOptions options, StoreListener& listener, Log& log,
+                                   NSErrorOut error) {
+  return FolderStore::openFolder(std::move(options), listener, log, error);
+}
+
+std::unique_ptr<FolderStore> FolderStore::openFolder(StoreOptions options, StoreListener& listener,
+                                                     Log& log, NSErrorOut error) {
+  int code = 0;
+  const auto drive = findRoot(options.drive.path, code);
+  if (!drive) {
+    error.store(vl_errorWithPOSIXCode(code, "The drive's folder " + options.drive.path +
+                                                " cannot be opened: " + std::strerror(code) + "."));
+    return nullptr;
+  }
+  auto database = openIndexOf(*drive, options.databasePath, log, error);
+  if (!database) return nullptr;
+  IndexWriter index(*database);
+  auto journalID = index.setting(kJournalID);
+  if (!journalID) {
+    journalID = drawJournalID();
+    index.setSetting(kJournalID, journalID);
+  }
+  if (database->failed()) {
+    error.store(vl_errorWithPOSIXCode(
+        EIO, "The index " + options.databasePath + " cannot be used: " + database->message()));
+    return nullptr;
+  }
+  auto store = std::unique_ptr<FolderStore>(new FolderStore(options, *drive, *journalID));
+  store->_writer =
+      std::make_unique<StoreWriter>(std::move(options), *drive, std::move(database), listener, log);
+  // The roots stand in the index from here on.
+  store->_writer->perform([] {});
+  return store;
+}
+
+FolderStore::FolderStore(StoreOptions options, RootFolder drive, std::string journalID)
+    : _options(std::move(options)),
+      _drive(std::move(drive)),
+      _journalID(std::move(journalID)),
+      _readers(_options.databasePath) {}
+
+bool FolderStore::storeFailure(IndexReaders::Lease& reader, NSErrorOut error) {
+  if (reader && !reader->failed()) return false;
+  error.store(vl_errorWithPOSIXCode(EIO, "The index " + _options.databasePath + " cannot be read" +
+                                             (reader ? ": " + reader->message() : "") + "."));
+  return true;
+}
+
+bool FolderStore::rootIsThere(NSErrorOut error) {
+  struct stat status {};
+  if (::stat(_drive.path.c_str(), &status) == 0 && status.st_ino == _drive.key.inode) return true;
+  error.store(vl_errorWithPOSIXCode(
+      ENOENT, "The drive's folder " + _drive.path +
+                  " is missing: it was deleted, renamed or unmounted. Put it back, or open the "
+                  "drive over another folder."));
+  return false;
+}
+
+// ---- listing
+
+bool FolderStore::ensureRead(const FolderRow& folder, bool isFirstPage, NSErrorOut error) {
+  if (folder.scanned && !(isFirstPage && _writer->isUnwatched(folder.number))) return true;
+  Look look = Look::Unreadable;
+  int code = EIO;
+  auto answer = std::make_shared<std::pair<Look, int>>(look, code);
+  const bool isDone = _writer->perform([this, answer, key = folder.number] {
+    answer->first = _writer->lookAtFolder(key, answer->second);
+  });
+  if (!isDone) {
+    error.store(vl_errorWithPOSIXCode(ETIMEDOUT, "The folder could not be read in time."));
+    return false;
+  }
+  if (answer->first == Look::Seen) return true;
+  if (answer->first == Look::Gone) {
+    error.store(noSuchFile("The folder " + folder.name + " is gone."));
+  } else {
+    error.store(vl_errorWithPOSIXCode(
+        answer->second,
+        "The folder " + folder.name + " cannot be read: " + std::strerror(answer->second) + "."));
+  }
+  return false;
+}
+
+Page FolderStore::list(const FolderRow& folder, SortOrder order, std::uint64_t offset,
+                       std::uint64_t limit, NSErrorOut error) {
+  auto reader = _readers.lease();
+  if (storeFailure(reader, error)) return {};
+  // Counted in the same moment as the page is read. All folders: any change may count.
+  std::uint64_t changes = 0;
+  if (folder.number == kNoFolder) {
+    changes = reader->number("SELECT max(rank) FROM item");
+  } else if (const auto current = reader->folder(folder.number)) {
+    changes = current->changes;
+  }
+  std::optional<ListingPlace> place;
+  if (offset > 0) place = _places.find(folder.number, order, offset, changes);
+  const std::uint64_t most = std::min<std::uint64_t>(limit, 100'000);
+  std::vector<FoundItem> items = reader->page(folder.number, order, place, offset, most + 1);
+  if (storeFailure(reader, error)) return {};
+  Page page;
+  if (items.size() > most) {
+    items.pop_back();
+    if (!items.empty()) {
+      page.nextOffset = offset + items.size();
+      const ItemRow& last = items.back().row;
+      _places.remember(folder.number, order, page.nextOffset, changes,
+                       {order == SortOrder::Date ? difference(0, last.state.modified) : 0,
+                        last.name, last.rank});
+    }
+  }
+  page.items.reserve(items.size());
+  for (const FoundItem& item : items) page.items.push_back(item.item());
+  return page;
+}
+
+Page FolderStore::listFolder(std::optional<VLFileObjectID> folder, SortOrder order,
+                             std::uint64_t offset, std::uint64_t limit, NSErrorOut error) {
+  if (!rootIsThere(error)) return {};
+  std::optional<FolderRow> row;
+  {
+    auto reader = _readers.lease();
+    if (storeFailure(reader, error)) return {};
+    row = folder ? reader->folderWithID(*folder) : reader->folder(kDriveFolder);
+    if (storeFailure(reader, error)) return {};
+  }
+  if (!row) {
+    error.store(noSuchFile("There is no folder " + (folder ? folder->asString() : "") + "."));
+    return {};
+  }
+  if (!ensureRead(*row, offset == 0, error)) return {};
+  return list(*row, order, offset, limit, error);
+}
+
+Page FolderStore::listAllFolders(SortOrder order, std::uint64_t offset, std::uint64_t limit,
+                                 NSErrorOut error) {
+  if (!rootIsThere(error)) return {};
+  return list({}, order, offset, limit, error);
+}
+
+// ---- items and paths
+
+VLQueryItemPtr FolderStore::itemWithID(VLFileObjectID id, NSErrorOut error) {
+  std::optional<FolderRow> drive;
+  {
+    auto reader = _readers.lease();
+    if (storeFailure(reader, error)) return nullptr;
+    if (const auto found = reader->itemWithID(id)) return found->item();
+    drive = reader->folder(kDriveFolder);
+    if (storeFailure(reader, error)) return nullptr;
+  }
+  if (drive && drive->id == id) return itemAtPath(_drive.path, false, error);
+  error.store(noSuchFile("There is no item " + id.asString() + "."));
+  return nullptr;
+}
+
+VLQueryItemPtr FolderStore::itemAtPath(const std::string& path, bool scanFirst, NSErrorOut error) {
+  std::vector<RootRow> roots;
+  std::optional<FolderRow> folder;
+  std::string rest;
+  {
+    auto reader = _readers.lease();
+    if (storeFailure(reader, error)) return nullptr;
+    for (const RootRow& root : reader->roots()) {
+      if (path != root.path && !path.starts_with(root.path + '/')) continue;
+      folder = reader->folder(root.folder);
+      rest = path.size() > root.path.size() ? path.substr(root.path.size() + 1) : "";
+      if (folder && rest.empty()) {
+        if (root.containerID) {
+          const auto found = reader->itemWithID(folder->id);
+          if (found) return found->item();
+        }
+        int code = 0;
+        FileDescriptor handle;
+        FileState state;
+        if (vald::openFolder(_drive, "", _drive.key, handle, code) != Look::Seen ||
+            !readSelf(handle.get(), state)) {
+          rootIsThere(error);
+          return nullptr;
+        }
+        const std::size_t slash = _drive.path.rfind('/');
+        return makeDriveItem(folder->id, _drive.path.substr(slash + 1), state,
+                             folder->scanned ? std::optional(folder->children) : std::nullopt);
+      }
+      break;
+    }
+    if (storeFailure(reader, error)) return nullptr;
+  }
+  const NSErrorPtr missing = noSuchFile("There is no item at " + path + ".");
+  for (std::size_t start = 0; folder;) {
+    const std::size_t end = std::min(rest.find('/', start), rest.size());
+    const std::string name = rest.substr(start, end - start);
+    if (name.empty() || name == "." || name == "..") break;
+    const bool isLast = end == rest.size();
+    if (!ensureRead(*folder, false, error)) return nullptr;
+    if (isLast && scanFirst) {
+      _writer->perform([this, key = folder->number, name] { _writer->lookAtName(key, name); });
+    }
+    auto reader = _readers.lease();
+    const auto found = reader ? reader->itemNamed(folder->number, name) : std::nullopt;
+    if (storeFailure(reader, error)) return nullptr;
+    // A container is at its own path, not where it is shown.
+    if (!found || found->row.containerID) break;
+    if (isLast) return found->item();
+    folder = reader->folder(found->row.folder);
+    start = end + 1;
+  }
+  error.store(missing);
+  return nullptr;
+}
+
+std::optional<std::string> FolderStore::pathOfFolder(IndexReader& reader, FolderKey folder) {
+  std::string below;
+  // A ring cannot be: each step leads to the folder above.
+  for (int depth = 0; depth < 100'000; ++depth) {
+    if (const auto root = reader.root(folder)) return root->path + below;
+    const auto row = reader.folder(folder);
+    if (!row) return std::nullopt;
+    below.insert(0, '/' + row->name);
+    folder = row->parent;
+  }
+  return std::nullopt;
+}
+
+std::optional<std::string> FolderStore::pathForID(VLFileObjectID id, NSErrorOut error) {
+  auto reader = _readers.lease();
+  if (storeFailure(reader, error)) return std::nullopt;
+  std::optional<std::string> path;
+  if (const auto folder = reader->folderWithID(id)) {
+    path = pathOfFolder(*reader.operator->(), folder->number);
+  } else if (const auto found = reader->itemWithID(id)) {
+    path = pathOfFolder(*reader.operator->(), found->row.parent);
+    if (path) *path += '/' + found->row.name;
+  }
+  if (storeFailure(reader, error)) return std::nullopt;
+  if (!path) error.store(noSuchFile("There is no item " + id.asString() + "."));
+  return path;
+}
+
+// ---- the journal
+
+ChangePage FolderStore::changesSince(std::uint64_t rank, std::uint64_t limit, NSErrorOut error) {
+  ChangePage page;
+  auto reader = _readers.lease();
+  if (storeFailure(reader, error)) return page;
+  std::uint64_t oldest = 0;
+  if (const auto text = reader->setting("oldest rank")) oldest = std::stoull(*text);
+  const std::uint64_t newest =
+      std::max({reader->number("SELECT max(rank) FROM item"),
+                reader->number("SELECT max(rank) FROM tombstone"), oldest});
+  // A listing from the start passes through ranks below the oldest; it has seen no item
+  // that died before it began, so it lacks nothing as long as what died since is kept.
+  std::uint64_t began = newest;
+  page.expired = rank > newest;
+  if (rank != 0 && rank < oldest) {
+    MutexLock lock(_mutex);
+    const auto listing = _listings.find(rank);
+    page.expired = listing == _listings.end() || listing->second < oldest;
+    if (!page.expired) began = listing->second;
+  }
+  if (page.expired) return page;
+
+  std::vector<FoundItem> items = reader->itemsAfter(rank, limit);
+  std::vector<Tombstone> dead = reader->tombstonesAfter(rank, limit);
+  if (storeFailure(reader, error)) return page;
+  auto item = items.begin();
+  auto tombstone = dead.begin();
+  page.newestRank = rank;
+  while (page.changes.size() < limit && (item != items.end() || tombstone != dead.end())) {
+    StoreChange change;
+    if (tombstone == dead.end() || (item != items.end() && item->row.rank < tombstone->rank)) {
+      change.rank = item->row.rank;
+      change.item = item->item();
+      change.folder = item->holder.id;
+      ++item;
+    } else {
+      const bool isDrive = tombstone->folder.rawID() == reader->folder(kDriveFolder)->id.rawID();
+      change.rank = tombstone->rank;
+      change.item = makeDeadItem(tombstone->id, tombstone->kind, {tombstone->folder, isDrive});
+      change.folder = tombstone->folder;
+      ++tombstone;
+    }
+    change.previousFolder = change.folder;
+    page.newestRank = change.rank;
+    page.changes.push_back(std::move(change));
+  }
+  if (page.newestRank < oldest && page.newestRank != 0) {
+    MutexLock lock(_mutex);
+    if (_listings.size() >= kMostListings) _listings.erase(_listings.begin());
+    const auto [listing, isNew] = _listings.try_emplace(page.newestRank, began);
+    if (!isNew) listing->second = std::min(listing->second, began);
+  }
+  return page;
+}
+
+// ---- the rest
+
+void FolderStore::retainFolderWatch(VLFileObjectID folder) {
+  _writer->perform([this, folder] { _writer->retain(folder, true); });
+}
+
+void FolderStore::releaseFolderWatch(VLFileObjectID folder) {
+  _writer->perform([this, folder] { _writer->retain(folder, false); });
+}
+
+void FolderStore::setContainers(std::vector<StoreRoot> containers) {
+  _writer->perform(
+      [this, containers = std::move(containers)] { _writer->setContainers(containers); });
+}
+
+std::optional<std::string> FolderStore::setting(const std::string& key) {
+  auto reader = _readers.lease();
+  return reader ? reader->setting("value " + key) : std::nullopt;
+}
+
+void FolderStore::setSetting(const std::string& key, std::optional<std::string> value) {
+  _writer->perform([this, key, value = std::move(value)] { _writer->setSetting(key, value); });
+}
+
+std::vector<IndexDifference> FolderStore::check(std::uint64_t limit) {
+  using Kind = IndexDifference::Kind;
+  // What is under way is no difference.
+  settle(std::chrono::seconds(30));
+  std::vector<IndexDifference> differences;
+  const auto add = [&](Kind kind, const std::string& path, const std::string& detail) {
+    if (differences.size() < limit) differences.push_back({kind, path, detail});
+  };
+  auto reader = _readers.lease();
+  if (!reader) return differences;
+  for (const RootRow& rootRow : reader->roots()) {
+    int error = 0;
+    const auto root = findRoot(rootRow.path, error);
+    if (!root) {
+      add(Kind::MissingInStore, rootRow.path, std::strerror(error));
+      continue;
+    }
+    std::vector<std::pair<FolderKey, std::string>> folders{{rootRow.folder, ""}};
+    while (!folders.empty() && differences.size() < limit) {
+      const auto [key, relative] = std::move(folders.back());
+      folders.pop_back();
+      const auto folder = reader->folder(key);
+      if (!folder) continue;
+      const std::string path = root->path + (relative.empty() ? "" : '/' + relative);
+      FileDescriptor handle;
+      Look look = vald::openFolder(*root, relative, relative.empty() ? root->key : folder->key,
+                                   handle, error);
+      const FolderSnapshot snapshot =
+          look == Look::Seen ? readFolder(handle.get(), Detail::Full) : FolderSnapshot{};
+      if (look != Look::Seen || snapshot.look != Look::Seen) {
+        if (look == Look::Gone) add(Kind::MissingInStore, path, "the folder is gone");
+        continue;
+      }
+      std::vector<ItemRow> rows = reader->children(key);
+      std::erase_if(rows, [](const ItemRow& row) { return row.containerID.has_value(); });
+      auto row = rows.begin();
+      auto entry = snapshot.entries.begin();
+      while (row != rows.end() || entry != snapshot.entries.end()) {
+        if (entry == snapshot.entries.end() || (row != rows.end() && row->name < entry->name)) {
+          add(Kind::MissingInStore, path + '/' + row->name, row->id.asString());
+          ++row;
+          continue;
+        }
+        const std::string entryPath = path + '/' + std::string(entry->name);
+        if (row == rows.end() || entry->name < row->name) {
+          add(Kind::MissingInIndex, entryPath, "the index has no item of this name");
+          ++entry;
+          continue;
+        }
+        if (row->state.kind != entry->state.kind || !row->state.key.names(entry->state.key)) {
+          add(Kind::Identity, entryPath, "the index knows another file by this name");
+        } else if (row->folder == kNoFolder && (row->state.size != entry->state.size ||
+                                                row->state.modified != entry->state.modified)) {
+          add(Kind::Attributes, entryPath, "size or dates differ");
+        }
+        if (row->folder != kNoFolder) {
+          folders.emplace_back(row->folder,
+                               relative.empty() ? row->name : relative + '/' + row->name);
+        }
+        ++row;
+        ++entry;
+      }
+    }
+  }
+  return differences;
+}
+
+}  // namespace skein::vald

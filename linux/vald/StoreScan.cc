@@ -1,0 +1,454 @@
+// The writer's rounds over the store: roots, folders that were read, the bulk load.
+#include <algorithm>
+#include <cerrno>
+#include <cstring>
+
+#include "linux/vald/StoreWriter.h"
+#include "linux/vald/index/IndexFile.h"
+#include "linux/vald/scan/DocumentNumbers.h"
+
+namespace skein::vald {
+namespace {
+
+constexpr char kComplete[] = "scanned once";
+// A bulk load tells so many items one by one; a small folder is all there is to many.
+constexpr std::uint64_t kMostToldInBulk = 5000;
+constexpr int kMostTries = 25;
+
+bool isSameRoot(const FileKey& a, const FileKey& b) {
+  return a.inode == b.inode && a.generation == b.generation;
+}
+
+}  // namespace
+
+// ---- roots and rounds
+
+void StoreWriter::load() {
+  _reload = false;
+  note({});
+  _watcher.clear();
+  _folders.load(_index.folders(), _index.nextFolder());
+  _folders.roots().clear();
+  _unreadable.clear();
+  {
+    MutexLock lock(_mutex);
+    _unwatched.clear();
+  }
+  const auto now = std::chrono::steady_clock::now();
+  _lastTick = now;
+  _lastSlowRound = now;
+  _bulkStart = now;
+  _isBulk = _folders.size() == 0;
+  if (!_isBulk && !hasSecondaryIndexes(*_database)) buildSecondaryIndexes(*_database);
+
+  begin();
+  if (_folders.find(kDriveFolder) == nullptr) {
+    FolderRow row;
+    row.id = VLFileObjectID::folderOrAliasWithRawID(inodeNumber(_drive.key, 0));
+    row.key = _drive.key;
+    _folders.add(std::move(row));
+    _index.putRoot({kDriveFolder, std::nullopt, _drive.path, _drive.key});
+  }
+  _folders.setRoot(kDriveFolder, {_drive, std::nullopt, false});
+  for (const RootRow& root : _index.roots()) {
+    if (!root.containerID) continue;
+    int error = 0;
+    const auto found = findRoot(root.path, error);
+    const bool isThere = found && isSameRoot(found->key, root.key);
+    _folders.setRoot(root.folder, {isThere ? *found : RootFolder{root.path, 0, root.key},
+                                   root.containerID, !isThere});
+  }
+  commit();
+  setContainers(_options.containers);
+  startRound(_isBulk || !_index.setting(kComplete) ? LocalDaemonStatus::Scan::First
+                                                   : LocalDaemonStatus::Scan::Verifying);
+}
+
+void StoreWriter::setContainers(const std::vector<StoreRoot>& containers) {
+  _options.containers = containers;
+  const auto wanted = [&](const TreeRoot& root) {
+    return !root.containerID ||
+           std::any_of(containers.begin(), containers.end(), [&](const StoreRoot& container) {
+             return container.containerID == root.containerID && container.path == root.folder.path;
+           });
+  };
+  std::vector<FolderKey> unwanted;
+  for (const auto& [folder, root] : _folders.roots()) {
+    if (!wanted(root)) unwanted.push_back(folder);
+  }
+  if (!unwanted.empty() && _isBulk) endBulkLoad();
+  begin();
+  for (const FolderKey folder : unwanted) {
+    const Folder* found = _folders.find(folder);
+    if (found != nullptr) {
+      if (const auto row = _index.rowWithID(found->row.id)) _reconciler.buryTree(*row);
+    }
+    _index.eraseRoot(folder);
+    _folders.removeRoot(folder);
+  }
+  std::vector<FolderKey> fresh;
+  for (const StoreRoot& container : containers) {
+    const auto known = std::find_if(
+        _folders.roots().begin(), _folders.roots().end(),
+        [&](const auto& root) { return root.second.containerID == container.containerID; });
+    if (known != _folders.roots().end()) {
+      Folder* folder = _folders.find(known->first);
+      if (folder == nullptr || folder->row.name == container.displayName) continue;
+      for (ItemRow& row : _index.rowsNamed(kDriveFolder, folder->row.name)) {
+        if (row.folder != known->first) continue;
+        row.name = container.displayName;
+        _journal.update(row, kDriveFolder);
+      }
+      folder->row.name = container.displayName;
+      _folders.touch(known->first);
+      continue;
+    }
+    int error = 0;
+    auto found = findRoot(container.path, error);
+    if (!found || !container.containerID) {
+      VL_ERROR(_log, "[ERROR] the documents folder %@ of %@ cannot be opened: %s", container.path,
+               container.displayName, std::strerror(error));
+      continue;
+    }
+    std::uint32_t attempt = 0;
+    VLFileObjectID id = VLFileObjectID::folderOrAliasWithRawID(0);
+    do {
+      id = VLFileObjectID::folderOrAliasWithRawID(inodeNumber(found->key, attempt++));
+    } while (_folders.folderWithID(id) != kNoFolder || _bulkIDs.contains(id.rawID()));
+    FolderRow folder;
+    folder.id = id;
+    folder.name = container.displayName;
+    folder.key = found->key;
+    ItemRow row;
+    row.parent = kDriveFolder;
+    row.name = container.displayName;
+    row.id = id;
+    row.state.kind = ItemKind::Folder;
+    row.state.key = found->key;
+    row.containerID = container.containerID;
+    row.folder = _folders.add(std::move(folder));
+    _index.putRoot({row.folder, container.containerID, container.path, found->key});
+    _folders.setRoot(row.folder, {std::move(*found), container.containerID, false});
+    _journal.insert(row);
+    fresh.push_back(row.folder);
+  }
+  afterDecisions();
+  commit();
+  enqueue(fresh);
+}
+
+void StoreWriter::checkRoots() {
+  bool isBack = false;
+  for (auto& [folder, root] : _folders.roots()) {
+    int error = 0;
+    const auto found = findRoot(root.folder.path, error);
+    const bool isThere = found && isSameRoot(found->key, root.folder.key);
+    if (isThere && root.isLost) {
+      // A volume that is mounted again may come under another device.
+      root.folder.device = found->device;
+      root.folder.key = found->key;
+      isBack = true;
+      VL_NOTICE(_log, "[NOTICE] %@ is back", root.folder.path);
+    } else if (!isThere && !root.isLost) {
+      VL_ERROR(_log,
+               "[ERROR] %@ is missing: deleted, renamed or unmounted. Nothing is taken for "
+               "deleted; the drive goes on when the folder is back",
+               root.folder.path);
+    }
+    root.isLost = !isThere;
+  }
+  if (isBack) startRound(LocalDaemonStatus::Scan::Rescanning);
+}
+
+void StoreWriter::startRound(LocalDaemonStatus::Scan kind) {
+  if (_inRound) {
+    _roundAgain = true;
+    return;
+  }
+  ++_round;
+  _inRound = true;
+  _scanned = 0;
+  _scanKind = kind;
+  std::vector<FolderKey> roots;
+  for (const auto& [folder, root] : _folders.roots()) roots.push_back(folder);
+  // The drive's own folder is read first.
+  std::sort(roots.begin(), roots.end());
+  enqueue(roots);
+  publish();
+}
+
+void StoreWriter::finishRound() {
+  if (_isBulk) endBulkLoad();
+  begin();
+  _reconciler.endRound();
+  afterDecisions();
+  _index.setSetting(kComplete, "1");
+  _inRound = false;
+  _scanKind = LocalDaemonStatus::Scan::Idle;
+  if (!commit()) return;
+  if (std::exchange(_roundAgain, false)) startRound(LocalDaemonStatus::Scan::Rescanning);
+}
+
+void StoreWriter::enqueue(const std::vector<FolderKey>& folders) {
+  std::vector<ScanJob> jobs;
+  for (const FolderKey key : folders) {
+    Folder* folder = _folders.find(key);
+    ScanJob job;
+    const TreeRoot* root = folder != nullptr ? _folders.rootOf(key, job.relativePath) : nullptr;
+    if (root == nullptr || root->isLost) continue;
+    folder->round = _round;
+    job.folder = key;
+    job.root = root->folder;
+    job.key = folder->row.key;
+    jobs.push_back(std::move(job));
+  }
+  _scanner.add(std::move(jobs));
+}
+
+void StoreWriter::enqueueSubfolders(FolderKey folder) {
+  std::vector<FolderKey> subfolders = _index.subfoldersOf(folder);
+  std::erase_if(subfolders, [&](FolderKey subfolder) {
+    const Folder* found = _folders.find(subfolder);
+    return found == nullptr || found->round == _round;
+  });
+  enqueue(subfolders);
+}
+
+// ---- one folder
+
+void StoreWriter::noteWatch(FolderKey folder, bool isWatched) {
+  MutexLock lock(_mutex);
+  if (isWatched) {
+    _unwatched.erase(folder);
+  } else {
+    _unwatched.insert(folder);
+  }
+}
+
+void StoreWriter::noteUnreadable(FolderKey folder, int error) {
+  if (_unreadable.insert(folder).second) {
+    VL_NOTICE(_log, "[NOTICE] the folder %@ cannot be read: %s", _folders.pathOf(folder),
+              std::strerror(error));
+  }
+}
+
+void StoreWriter::afterDecisions() {
+  for (const FolderKey folder : _reconciler.takeRemovedFolders()) {
+    _watcher.unwatch(folder);
+    _unreadable.erase(folder);
+    MutexLock lock(_mutex);
+    _unwatched.erase(folder);
+  }
+  enqueue(_reconciler.takeNewFolders());
+}
+
+void StoreWriter::accept(FolderKey key, const FolderSnapshot& snapshot, bool inRound) {
+  Folder* folder = _folders.find(key);
+  if (folder == nullptr) return;
+  switch (snapshot.look) {
+    case Look::Seen: break;
+    case Look::Gone:
+      // Its parent tells where it went.
+      if (folder->row.parent != kNoFolder) {
+        _later.folders[folder->row.parent].names.insert(folder->row.name);
+      }
+      return;
+    case Look::Unreadable: noteUnreadable(key, snapshot.error); return;
+    case Look::RootLost: checkRoots(); return;
+  }
+  _unreadable.erase(key);
+  const bool isFirst = !folder->row.scanned;
+  if (isFirst) {
+    folder->row.scanned = true;
+    folder->isCountUntold = true;
+    _folders.touch(key);
+  }
+  if (_isBulk) {
+    if (isFirst) loadFolder(key, snapshot);
+    return;
+  }
+  _reconciler.addFolder(key, snapshot);
+  _reconciler.decide(inRound);
+  afterDecisions();
+  if (inRound) enqueueSubfolders(key);
+}
+
+// The bulk load of a folder that nothing is known of.
+void StoreWriter::loadFolder(FolderKey key, const FolderSnapshot& snapshot) {
+  std::vector<FolderKey> subfolders;
+  ItemRow row;
+  row.parent = key;
+  for (const DiskEntry& entry : snapshot.entries) {
+    row.name = entry.name;
+    row.state = entry.state;
+    row.folder = kNoFolder;
+    if (entry.state.kind == ItemKind::Document) {
+      row.id = VLFileObjectID::documentWithRawID(drawDocumentNumber());
+    } else {
+      std::uint32_t attempt = 0;
+      do {
+        row.id = VLFileObjectID::folderOrAliasWithRawID(inodeNumber(entry.state.key, attempt++));
+      } while (_folders.folderWithID(row.id) != kNoFolder || _bulkIDs.contains(row.id.rawID()));
+    }
+    if (entry.state.kind == ItemKind::Alias) _bulkIDs.insert(row.id.rawID());
+    if (entry.state.kind == ItemKind::Folder) {
+      FolderRow folder;
+      folder.id = row.id;
+      folder.parent = key;
+      folder.name = row.name;
+      folder.key = entry.state.key;
+      row.folder = _folders.add(std::move(folder));
+      subfolders.push_back(row.folder);
+    }
+    if (++_bulkItems <= kMostToldInBulk) {
+      _journal.insert(row);
+    } else {
+      _index.insert(row);
+      Folder* parent = _folders.find(key);
+      ++parent->row.children;
+      parent->isCountUntold = true;
+    }
+  }
+  Folder* folder = _folders.find(key);
+  ++folder->row.changes;
+  _folders.touch(key);
+  if (key != kDriveFolder) {
+    const FolderKey parent = folder->row.parent != kNoFolder ? folder->row.parent : kDriveFolder;
+    for (ItemRow& self : _index.rowsNamed(parent, folder->row.name)) {
+      if (self.folder != key) continue;
+      self.state = snapshot.self;
+      _journal.update(self, self.parent);
+    }
+  }
+  enqueue(subfolders);
+}
+
+void StoreWriter::endBulkLoad() {
+  if (!_isBulk) return;
+  if (!commit()) return;
+  _isBulk = false;
+  _bulkIDs.clear();
+  if (!buildSecondaryIndexes(*_database)) {
+    fail();
+    return;
+  }
+  if (_bulkItems > kMostToldInBulk) _listener.storeDidOverflow(std::nullopt);
+}
+
+Look StoreWriter::lookAtFolder(FolderKey key, int& error) {
+  _disk.forget();
+  int descriptor = -1;
+  FolderSnapshot snapshot;
+  snapshot.look = _disk.open(key, descriptor, error);
+  if (snapshot.look == Look::Seen) {
+    noteWatch(key, _watcher.watch(key, descriptor));
+    snapshot = readFolder(descriptor, _isBulk ? Detail::Quick : Detail::Full);
+  } else {
+    snapshot.error = error;
+  }
+  error = snapshot.error;
+  begin();
+  if (Folder* folder = _folders.find(key)) folder->round = _round;
+  accept(key, snapshot, false);
+  if (_inRound && !_isBulk) enqueueSubfolders(key);
+  commit();
+  return snapshot.look;
+}
+
+Look StoreWriter::lookAtName(FolderKey folder, const std::string& name) {
+  if (_isBulk) endBulkLoad();
+  _disk.forget();
+  FileState state;
+  const Look look = _disk.at(folder, name, state);
+  begin();
+  if (look == Look::Seen) _reconciler.addName(folder, name, state);
+  if (look == Look::Gone) _reconciler.addName(folder, name, std::nullopt);
+  _reconciler.decide(false);
+  afterDecisions();
+  commit();
+  return look;
+}
+
+// ---- changes that the watcher saw
+
+void StoreWriter::reconcile(DirtySet& dirty) {
+  begin();
+  // A folder whose way changed in this very batch is found once its own change is decided.
+  for (bool isProgress = true; isProgress && !dirty.folders.empty();) {
+    isProgress = false;
+    _disk.forget();
+    for (auto entry = dirty.folders.begin(); entry != dirty.folders.end();) {
+      const FolderKey key = entry->first;
+      const Folder* folder = _folders.find(key);
+      int descriptor = -1;
+      int error = 0;
+      // A folder that was not read yet will be.
+      const bool isKnown = folder != nullptr && folder->row.scanned;
+      const Look look = isKnown ? _disk.open(key, descriptor, error) : Look::RootLost;
+      if (look == Look::Gone) {
+        ++entry;
+        continue;
+      }
+      if (look == Look::Unreadable) noteUnreadable(key, error);
+      if (look == Look::Seen) {
+        const auto& names = entry->second.names;
+        if (entry->second.whole || (names.size() > 64 && names.size() * 2 > folder->row.children)) {
+          const FolderSnapshot snapshot = readFolder(descriptor, Detail::Full);
+          if (snapshot.look == Look::Seen) {
+            _reconciler.addFolder(key, snapshot);
+          } else {
+            noteUnreadable(key, snapshot.error);
+          }
+        } else {
+          for (const std::string& name : names) {
+            FileState state;
+            const Look there = readEntry(descriptor, name, state, error);
+            if (there == Look::Seen) _reconciler.addName(key, name, state);
+            if (there == Look::Gone) _reconciler.addName(key, name, std::nullopt);
+          }
+        }
+        _reconciler.addSelf(key);
+      }
+      isProgress = true;
+      entry = dirty.folders.erase(entry);
+    }
+    _reconciler.decide(false);
+    afterDecisions();
+  }
+  // What is left is on its way: its parent's change was not seen yet.
+  const bool mayRetry = !dirty.folders.empty() && ++_laterTries < kMostTries;
+  if (mayRetry) {
+    _later.folders.merge(dirty.folders);
+  } else {
+    _laterTries = 0;
+  }
+  commit();
+}
+
+void StoreWriter::retain(VLFileObjectID id, bool isRetained) {
+  const FolderKey key = _folders.folderWithID(id);
+  Folder* folder = _folders.find(key);
+  if (folder == nullptr) return;
+  if (!isRetained) {
+    if (folder->retained > 0) --folder->retained;
+    return;
+  }
+  ++folder->retained;
+  if (_watcher.isWatched(key)) return;
+  int descriptor = -1;
+  int error = 0;
+  _disk.forget();
+  if (_disk.open(key, descriptor, error) != Look::Seen) return;
+  if (!_watcher.watch(key, descriptor)) {
+    const auto victim = _watcher.victim([&](FolderKey candidate) {
+      const Folder* other = _folders.find(candidate);
+      return other == nullptr || (other->retained == 0 && !_folders.roots().contains(candidate));
+    });
+    if (!victim) return;
+    _watcher.unwatch(*victim);
+    noteWatch(*victim, false);
+  }
+  lookAtFolder(key, error);
+}
+
+}  // namespace skein::vald

@@ -1,0 +1,151 @@
+#pragma once
+
+#include <atomic>
+#include <chrono>
+#include <memory>
+#include <string>
+#include <thread>
+#include <unordered_set>
+#include <vector>
+
+#include "base/Mutex.h"
+#include "base/UniqueFunction.h"
+#include "linux/vald/Store.h"
+#include "linux/vald/index/IndexWriter.h"
+#include "linux/vald/scan/Disk.h"
+#include "linux/vald/scan/FolderTable.h"
+#include "linux/vald/scan/Journal.h"
+#include "linux/vald/scan/Reconciler.h"
+#include "linux/vald/scan/Scanner.h"
+#include "linux/vald/watch/Watcher.h"
+
+namespace skein::vald {
+
+// The store's one writer thread: takes what the scanner read and the watcher saw, and
+// brings the index to it, one transaction per batch. Everything that writes goes through
+// perform().
+//
+// The first scan of an empty index is a bulk load without secondary indexes; changes on
+// disk wait for its end, ten seconds at most, since telling which document is which needs
+// them. Every later round over the store (at a restart, after lost events) compares.
+class StoreWriter {
+ public:
+  // `drive`: the drive's folder as it was found. `listener` and `log` outlive this.
+  StoreWriter(StoreOptions options, RootFolder drive, std::unique_ptr<SqliteDatabase> database,
+              StoreListener& listener, Log& log);
+  ~StoreWriter();
+
+  // Runs `work` on the writer thread, outside a transaction, and waits for it. False when
+  // the writer is ending, or `deadline` passed; then `work` may still run.
+  bool perform(Task work, std::chrono::milliseconds deadline = std::chrono::seconds(60))
+      SKEIN_EXCLUDES(_mutex);
+  bool settle(std::chrono::milliseconds deadline) SKEIN_EXCLUDES(_mutex);
+
+  // Inside perform().
+  Look lookAtFolder(FolderKey folder, int& error);
+  Look lookAtName(FolderKey folder, const std::string& name);
+  void setContainers(const std::vector<StoreRoot>& containers);
+  void retain(VLFileObjectID folder, bool isRetained);
+  bool setSetting(const std::string& key, const std::optional<std::string>& value);
+
+  // Any thread.
+  void status(LocalDaemonStatus& status) SKEIN_EXCLUDES(_mutex);
+  std::uint64_t rank() const { return _rank.load(); }
+  std::uint64_t oldestRank() const { return _oldestRank.load(); }
+  bool isUnwatched(FolderKey folder) const SKEIN_EXCLUDES(_mutex);
+  // Why the index cannot be used; empty while it can.
+  std::string failure() const SKEIN_EXCLUDES(_mutex);
+  Watcher& watcher() { return _watcher; }
+
+ private:
+  struct Waiter;
+  using Instant = std::chrono::steady_clock::time_point;
+
+  // Waiting and the turn of work.
+  void run();
+  void wake() SKEIN_EXCLUDES(_mutex);
+  Instant nextDeadline();
+  void serveTasks() SKEIN_EXCLUDES(_mutex);
+  void takeScans();
+  void takeDirt();
+  void answerSettled() SKEIN_EXCLUDES(_mutex);
+  void tick();
+
+  // The store's folders and rounds over them.
+  void load();
+  void adoptRoot(FolderKey folder, RootFolder found, std::optional<std::string> containerID);
+  void checkRoots();
+  void startRound(LocalDaemonStatus::Scan kind);
+  void finishRound();
+  void enqueue(const std::vector<FolderKey>& folders);
+  void enqueueSubfolders(FolderKey folder);
+  void noteWatch(FolderKey folder, bool isWatched) SKEIN_EXCLUDES(_mutex);
+  void noteUnreadable(FolderKey folder, int error);
+  void afterDecisions();
+
+  // One folder that was read.
+  void accept(FolderKey folder, const FolderSnapshot& snapshot, bool inRound);
+  void loadFolder(FolderKey folder, const FolderSnapshot& snapshot);
+  void endBulkLoad();
+  void reconcile(DirtySet& dirty);
+
+  // Transactions.
+  void begin();
+  void setDurability(bool isFull);
+  void note(std::string failure) SKEIN_EXCLUDES(_mutex);
+  bool commit();
+  void fail();
+  void publish() SKEIN_EXCLUDES(_mutex);
+
+  StoreOptions _options;
+  StoreListener& _listener;
+  Log& _log;
+  std::unique_ptr<SqliteDatabase> _database;
+  Watcher _watcher;
+  Scanner _scanner;
+
+  // The writer thread's own.
+  IndexWriter _index;
+  FolderTable _folders;
+  Disk _disk;
+  Journal _journal;
+  Reconciler _reconciler;
+  RootFolder _drive;
+  bool _isBulk = false;
+  std::unordered_set<std::uint64_t> _bulkIDs;  // of aliases; folders are in the table
+  Instant _bulkStart;
+  bool _inTransaction = false;
+  Instant _transactionStart;
+  std::uint64_t _rankAtBegin = 0;
+  std::uint32_t _round = 0;
+  bool _inRound = false;
+  bool _roundAgain = false;
+  std::uint64_t _bulkItems = 0;
+  std::uint64_t _scanned = 0;  // folders, in this round
+  LocalDaemonStatus::Scan _scanKind = LocalDaemonStatus::Scan::Idle;
+  std::unordered_set<FolderKey> _unreadable;
+  DirtySet _later;  // what could not be read yet
+  int _laterTries = 0;
+  Instant _lastTick;
+  Instant _lastSlowRound;
+  bool _isBroken = false;  // the index is damaged: nothing is written any more
+  bool _isFull = false;    // commits wait for the disk
+  bool _reload = false;    // a transaction failed: begin anew at the next tick
+
+  // Shared.
+  mutable Mutex _mutex;
+  CondVar _changed;
+  std::vector<Task> _tasks SKEIN_GUARDED_BY(_mutex);
+  std::vector<std::shared_ptr<Waiter>> _settling SKEIN_GUARDED_BY(_mutex);
+  bool _woken SKEIN_GUARDED_BY(_mutex) = false;
+  bool _stop SKEIN_GUARDED_BY(_mutex) = false;
+  bool _ended SKEIN_GUARDED_BY(_mutex) = false;
+  std::unordered_set<FolderKey> _unwatched SKEIN_GUARDED_BY(_mutex);
+  std::string _failure SKEIN_GUARDED_BY(_mutex);
+  LocalDaemonStatus _status SKEIN_GUARDED_BY(_mutex);
+  std::atomic<std::uint64_t> _rank{0};
+  std::atomic<std::uint64_t> _oldestRank{0};
+  std::thread _thread;
+};
+
+}  // namespace skein::vald

@@ -1,0 +1,96 @@
+#pragma once
+
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "base/Mutex.h"
+#include "linux/vald/index/IndexWriter.h"
+#include "linux/vald/index/ItemMaking.h"
+#include "linux/vald/index/ListingPlaces.h"
+
+namespace skein::vald {
+
+// An item with what surrounds it.
+struct FoundItem {
+  ItemRow row;
+  ItemHolder holder;
+  std::optional<std::uint64_t> children;
+
+  VLQueryItemPtr item() const { return makeItem(row, holder, children); }
+};
+
+// The read side of the index: one connection, for one thread at a time. Failures are
+// latched in the database.
+class IndexReader {
+ public:
+  explicit IndexReader(std::unique_ptr<SqliteDatabase> database);
+
+  // What is read until end() is of one moment.
+  void begin() { _database->execute("BEGIN"); }
+  void end() { _database->rollback(); }
+  bool failed() const { return _database->failed(); }
+  const std::string& message() const { return _database->message(); }
+
+  std::optional<FolderRow> folder(FolderKey key);
+  std::optional<FolderRow> folderWithID(VLFileObjectID id);
+  std::optional<RootRow> root(FolderKey folder);
+  std::vector<RootRow> roots();
+
+  std::optional<FoundItem> itemWithID(VLFileObjectID id);
+  std::optional<FoundItem> itemNamed(FolderKey folder, std::string_view name);
+  std::vector<ItemRow> children(FolderKey folder);
+
+  // A page of a folder's children, or (folder 0) of all folders: after `place`, or from
+  // `offset` on.
+  std::vector<FoundItem> page(FolderKey folder, SortOrder order,
+                              const std::optional<ListingPlace>& place, std::uint64_t offset,
+                              std::uint64_t limit);
+
+  std::vector<FoundItem> itemsAfter(std::uint64_t rank, std::uint64_t limit);
+  std::vector<Tombstone> tombstonesAfter(std::uint64_t rank, std::uint64_t limit);
+  std::uint64_t number(const char* sql);
+  std::optional<std::string> setting(const std::string& name);
+
+ private:
+  FoundItem found(SqliteStatement& statement);
+  std::vector<FoundItem> all(SqliteStatement& statement);
+
+  std::unique_ptr<SqliteDatabase> _database;
+  SqliteStatement _folder, _folderWithID, _itemWithID, _itemNamed, _itemsAfter, _tombstonesAfter;
+  SqliteStatement _byName, _byAge, _byNameAfter, _byAgeAfter;
+  SqliteStatement _allByName, _allByAge, _allByNameAfter, _allByAgeAfter;
+};
+
+// Read connections, as many as there are callers at once. Any thread.
+class IndexReaders {
+ public:
+  explicit IndexReaders(std::string path) : _path(std::move(path)) {}
+
+  // A reader for the scope of a call; holds one moment of the index.
+  class Lease {
+   public:
+    Lease(IndexReaders& readers, std::unique_ptr<IndexReader> reader);
+    ~Lease();
+    Lease(const Lease&) = delete;
+    Lease& operator=(const Lease&) = delete;
+    // Whether the index could be opened.
+    explicit operator bool() const { return _reader != nullptr; }
+    IndexReader* operator->() { return _reader.get(); }
+
+   private:
+    IndexReaders& _readers;
+    std::unique_ptr<IndexReader> _reader;
+  };
+  Lease lease() SKEIN_EXCLUDES(_mutex);
+
+ private:
+  void giveBack(std::unique_ptr<IndexReader> reader) SKEIN_EXCLUDES(_mutex);
+
+  const std::string _path;
+  Mutex _mutex;
+  std::vector<std::unique_ptr<IndexReader>> _idle SKEIN_GUARDED_BY(_mutex);
+};
+
+}  // namespace skein::vald

@@ -1,0 +1,241 @@
+#include "linux/vald/scan/FolderReader.h"
+
+#include <dirent.h>
+#include <fcntl.h>
+#include <linux/openat2.h>
+#include <sys/stat.h>
+#include <sys/syscall.h>
+#include <sys/sysmacros.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstring>
+#include <limits>
+
+namespace skein::vald {
+namespace {
+
+constexpr unsigned kMask = STATX_BASIC_STATS | STATX_BTIME;
+constexpr int kFolderFlags = O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC;
+
+std::int64_t nanoseconds(const statx_timestamp& time) {
+  std::int64_t result = 0;
+  if (__builtin_mul_overflow(time.tv_sec, std::int64_t{1'000'000'000}, &result) ||
+      __builtin_add_overflow(result, std::int64_t{time.tv_nsec}, &result)) {
+    return time.tv_sec < 0 ? std::numeric_limits<std::int64_t>::min() + 1
+                           : std::numeric_limits<std::int64_t>::max();
+  }
+  return result;
+}
+
+// The inode's generation as the file's handle tells it; 0 when the file system has none.
+std::uint32_t generationOf(int folder, const char* name, int flags, std::uint64_t inode) {
+  alignas(file_handle) char storage[sizeof(file_handle) + MAX_HANDLE_SZ];
+  auto* handle = reinterpret_cast<file_handle*>(storage);
+  handle->handle_bytes = MAX_HANDLE_SZ;
+  int mount = 0;
+  if (name_to_handle_at(folder, name, handle, &mount, flags) != 0) return 0;
+  constexpr int kInode32AndGeneration = 1;
+  std::uint32_t words[2] = {};
+  if (handle->handle_type == kInode32AndGeneration && handle->handle_bytes == sizeof words) {
+    std::memcpy(words, storage + sizeof(file_handle), sizeof words);
+    if (words[0] == inode && words[1] != 0) return words[1];
+  }
+  // Any other layout: the whole handle names the file, so a digest of it tells it from the
+  // next owner of the inode.
+  std::uint32_t digest = 2166136261U;
+  const char* bytes = storage + sizeof(file_handle);
+  for (unsigned i = 0; i < handle->handle_bytes; ++i) {
+    digest = (digest ^ static_cast<unsigned char>(bytes[i])) * 16777619U;
+  }
+  return digest != 0 ? digest : 1;
+}
+
+enum class Kept : std::uint8_t { Yes, No };
+
+Kept fill(const struct statx& status, FileState& state) {
+  if (S_ISREG(status.stx_mode)) {
+    state.kind = ItemKind::Document;
+  } else if (S_ISDIR(status.stx_mode)) {
+    state.kind = ItemKind::Folder;
+  } else if (S_ISLNK(status.stx_mode)) {
+    state.kind = ItemKind::Alias;
+  } else {
+    return Kept::No;
+  }
+  state.key.inode = status.stx_ino;
+  state.key.born = (status.stx_mask & STATX_BTIME) != 0 ? nanoseconds(status.stx_btime) : 0;
+  state.size = state.kind == ItemKind::Folder ? 0 : status.stx_size;
+  state.modified = nanoseconds(status.stx_mtime);
+  state.changed = nanoseconds(status.stx_ctime);
+  return Kept::Yes;
+}
+
+// openat2 with component-wise walking where the kernel, or the path's length, forbids it.
+int openBelow(int root, const std::string& relativePath) {
+  open_how how{};
+  how.flags = static_cast<std::uint64_t>(kFolderFlags);
+  how.resolve = RESOLVE_BENEATH | RESOLVE_NO_SYMLINKS | RESOLVE_NO_MAGICLINKS | RESOLVE_NO_XDEV;
+  int folder = static_cast<int>(syscall(SYS_openat2, root, relativePath.c_str(), &how, sizeof how));
+  if (folder >= 0 || (errno != ENOSYS && errno != ENAMETOOLONG && errno != EPERM)) return folder;
+
+  struct stat rootStatus {};
+  if (fstat(root, &rootStatus) != 0) return -1;
+  FileDescriptor current;
+  for (std::size_t start = 0; start <= relativePath.size();) {
+    const std::size_t end = std::min(relativePath.find('/', start), relativePath.size());
+    FileDescriptor next(::openat(current ? current.get() : root,
+                                 relativePath.substr(start, end - start).c_str(), kFolderFlags));
+    struct stat status {};
+    if (!next || fstat(next.get(), &status) != 0) return -1;
+    if (status.st_dev != rootStatus.st_dev) {
+      errno = EXDEV;
+      return -1;
+    }
+    current = std::move(next);
+    start = end + 1;
+  }
+  return current.release();
+}
+
+Look lookOfError(int error) {
+  // A name that became a symbolic link, or something else, is no folder any more.
+  return error == ENOENT || error == ENOTDIR || error == ELOOP ? Look::Gone : Look::Unreadable;
+}
+
+}  // namespace
+
+bool isHiddenFromStore(std::string_view name) {
+  return name == "." || name == ".." || name.starts_with(".Trash-");
+}
+
+bool readSelf(int folder, FileState& state) {
+  struct statx status {};
+  if (statx(folder, "", AT_EMPTY_PATH, kMask, &status) != 0) return false;
+  if (fill(status, state) == Kept::No) return false;
+  state.key.generation = generationOf(folder, "", AT_EMPTY_PATH, state.key.inode);
+  return true;
+}
+
+std::optional<RootFolder> findRoot(const std::string& path, int& error) {
+  FileDescriptor folder(::open(path.c_str(), kFolderFlags));
+  struct stat status {};
+  RootFolder root{path, 0, {}};
+  FileState state;
+  if (!folder || fstat(folder.get(), &status) != 0 || !readSelf(folder.get(), state)) {
+    error = errno;
+    return std::nullopt;
+  }
+  root.device = status.st_dev;
+  root.key = state.key;
+  return root;
+}
+
+Look openFolder(const RootFolder& root, const std::string& relativePath, const FileKey& key,
+                FileDescriptor& folder, int& error) {
+  FileDescriptor top(::open(root.path.c_str(), kFolderFlags));
+  struct statx status {};
+  if (!top || statx(top.get(), "", AT_EMPTY_PATH, kMask, &status) != 0) {
+    error = errno;
+    return Look::RootLost;
+  }
+  // An unlinked folder may be open still; it is empty, and that means nothing.
+  if (status.stx_ino != root.key.inode || status.stx_nlink == 0 ||
+      makedev(status.stx_dev_major, status.stx_dev_minor) != root.device) {
+    error = ENOENT;
+    return Look::RootLost;
+  }
+  if (relativePath.empty()) {
+    folder = std::move(top);
+    return Look::Seen;
+  }
+  FileDescriptor found(openBelow(top.get(), relativePath));
+  if (!found) {
+    error = errno;
+    return lookOfError(error);
+  }
+  FileState state;
+  if (!readSelf(found.get(), state)) {
+    error = errno;
+    return Look::Unreadable;
+  }
+  if (!state.key.names(key)) {
+    error = ENOENT;
+    return Look::Gone;
+  }
+  folder = std::move(found);
+  return Look::Seen;
+}
+
+Look readEntry(int folder, const std::string& name, FileState& state, int& error) {
+  if (isHiddenFromStore(name)) return Look::Gone;
+  struct statx status {};
+  if (statx(folder, name.c_str(), AT_SYMLINK_NOFOLLOW | AT_NO_AUTOMOUNT, kMask, &status) != 0) {
+    error = errno;
+    return error == ENOENT ? Look::Gone : Look::Unreadable;
+  }
+  if (fill(status, state) == Kept::No) return Look::Gone;
+  state.key.generation = generationOf(folder, name.c_str(), 0, state.key.inode);
+  return Look::Seen;
+}
+
+FolderSnapshot readFolder(int folder, Detail detail) {
+  FolderSnapshot snapshot;
+  const auto fail = [&](int error) {
+    snapshot.look = Look::Unreadable;
+    snapshot.error = error;
+    snapshot.entries.clear();
+    return std::move(snapshot);
+  };
+  // Its own state first: what changes while it is read shows next time.
+  if (!readSelf(folder, snapshot.self)) return fail(errno);
+
+  alignas(dirent64) char buffer[32 * 1024];
+  struct Place {
+    std::size_t offset;
+    std::size_t length;
+  };
+  std::vector<Place> places;
+  for (;;) {
+    const ssize_t count = getdents64(folder, buffer, sizeof buffer);
+    if (count < 0) return fail(errno);
+    if (count == 0) break;
+    for (ssize_t at = 0; at < count;) {
+      const auto* entry = reinterpret_cast<const dirent64*>(buffer + at);
+      at += entry->d_reclen;
+      const std::string_view name(entry->d_name);
+      if (isHiddenFromStore(name)) continue;
+      if (entry->d_type == DT_SOCK || entry->d_type == DT_FIFO || entry->d_type == DT_CHR ||
+          entry->d_type == DT_BLK) {
+        continue;
+      }
+      places.push_back({snapshot.names.size(), name.size()});
+      snapshot.names.insert(snapshot.names.end(), name.begin(), name.end());
+      snapshot.names.push_back('\0');
+    }
+  }
+
+  snapshot.entries.reserve(places.size());
+  for (const Place& place : places) {
+    const char* name = snapshot.names.data() + place.offset;
+    struct statx status {};
+    if (statx(folder, name, AT_SYMLINK_NOFOLLOW | AT_NO_AUTOMOUNT, kMask, &status) != 0) {
+      if (errno == ENOENT) continue;  // gone since; its deletion is told by itself
+      return fail(errno);
+    }
+    DiskEntry entry{{name, place.length}, {}};
+    if (fill(status, entry.state) == Kept::No) continue;
+    if (detail == Detail::Full || entry.state.kind != ItemKind::Document ||
+        entry.state.key.born == 0) {
+      entry.state.key.generation = generationOf(folder, name, 0, entry.state.key.inode);
+    }
+    snapshot.entries.push_back(entry);
+  }
+  std::sort(snapshot.entries.begin(), snapshot.entries.end(),
+            [](const DiskEntry& a, const DiskEntry& b) { return a.name < b.name; });
+  snapshot.look = Look::Seen;
+  return snapshot;
+}
+
+}  // namespace skein::vald

@@ -1,0 +1,126 @@
+// How documents keep their numbers.
+//
+// The disk tells names and inodes; which document is which is ours to settle. A file is
+// known by its inode and generation (FileKey). Where that does not settle it:
+//
+//  1. A known file at another name is the same document: it was renamed or moved.
+//  2. A name that now holds another file keeps its document when the old file is gone, or
+//     lives on only under a backup's or a temporary name (BackupNames), or under the name
+//     of a young document: it was saved. The backup gets a number of its own. When the old
+//     file lives on under any other name, it is the document, and the name's is new.
+//  3. A young document (it came within the last minute) that is renamed over another hands
+//     its file over and dies: the name keeps its document. An old document renamed over
+//     another moves, and the replaced one dies.
+//  4. Two names that exchanged their files keep their documents when one of them is young;
+//     two old ones moved.
+//  5. A document that vanished keeps its number for the grace window: what comes to its
+//     name within it takes the number up. The deletion is journalled at once all the same.
+//     So does a document that left its name for a backup's within the window.
+//  6. Two hard links are two documents. When the first goes while the second is young, the
+//     number goes with it: that was a rename.
+//  7. A file that comes back (its tombstone is still kept) takes its number up again.
+//
+// Folders and aliases are their inodes: rules 1 and 7 hold for them, and nothing else.
+#pragma once
+
+#include <chrono>
+#include <functional>
+#include <string>
+#include <unordered_map>
+#include <unordered_set>
+#include <vector>
+
+#include "linux/vald/scan/Disk.h"
+#include "linux/vald/scan/Journal.h"
+
+namespace skein::vald {
+
+// Makes the index equal to what was seen of the disk. Differences are gathered first and
+// decided together, since one save touches several names. On the writer thread, inside a
+// transaction, with the secondary indexes built.
+class Reconciler {
+ public:
+  using Clock = std::function<std::int64_t()>;  // milliseconds since 1970
+
+  Reconciler(IndexWriter& index, Journal& journal, FolderTable& folders, Disk& disk,
+             std::chrono::milliseconds graceWindow, Clock clock);
+
+  // Gathers how a folder, read as a whole, differs from the index.
+  void addFolder(FolderKey folder, const FolderSnapshot& snapshot);
+  // Gathers how one name differs. `state` nil: there is nothing.
+  void addName(FolderKey folder, const std::string& name, const std::optional<FileState>& state);
+  // The folder's own dates, or its count of children, may have changed.
+  void addSelf(FolderKey folder) { _selves.insert(folder); }
+
+  // Decides what was gathered. While a round goes over the whole store, what vanished or
+  // was replaced waits for its end: the file may yet turn up in a folder still to be read.
+  void decide(bool inRound);
+  void endRound();
+
+  // Removes a folder's item and everything below it.
+  void buryTree(const ItemRow& row);
+  void forget();
+
+  // Folders that came since this was last asked: they are to be scanned.
+  std::vector<FolderKey> takeNewFolders() { return std::exchange(_newFolders, {}); }
+  // Folders that went.
+  std::vector<FolderKey> takeRemovedFolders() { return std::exchange(_removedFolders, {}); }
+
+ private:
+  struct Place {
+    FolderKey folder = kNoFolder;
+    std::string name;
+  };
+  struct Difference {
+    Place place;
+    FileState state;
+  };
+  struct Departure {
+    std::int64_t when = 0;
+    VLFileObjectID id = VLFileObjectID::documentWithRawID(0);
+  };
+  enum class Whereabouts : std::uint8_t { StillThere, Gone, Displaced, Unknown };
+
+  void decideOnce(bool inRound);
+  void compare(const ItemRow& row, FileState state);
+  void appeared(const Difference& difference);
+  void replaced(const Difference& difference);
+  void vanished(const ItemRow& seen);
+  void refreshSelves();
+
+  bool handBack(const Place& place, const FileState& state, const std::optional<ItemRow>& mover);
+  bool returned(const Place& place, const FileState& state);
+  void insertNew(const Place& place, const FileState& state);
+  void move(ItemRow row, const Place& place, const FileState& state);
+  void retarget(ItemRow row, const FileState& state);
+  void recordDeparture(const ItemRow& row, const Place& to);
+
+  std::optional<ItemRow> rowAt(const Place& place);
+  std::optional<ItemRow> moverTo(const Place& place, const FileState& state);
+  Whereabouts whereabouts(const ItemRow& row, FileState& there);
+  bool nameKeeps(const ItemRow& row, const FileState& there, const Place& candidate);
+  bool isYoung(const ItemRow& row) const;
+  VLFileObjectID newID(const FileState& state);
+
+  IndexWriter& _index;
+  Journal& _journal;
+  FolderTable& _folders;
+  Disk& _disk;
+  const std::int64_t _grace;
+  const Clock _clock;
+
+  std::vector<Difference> _appeared;
+  std::vector<Difference> _deciding;  // what appeared, of the decisions under way
+  std::vector<Difference> _replaced;
+  std::vector<ItemRow> _vanished;
+  std::vector<ItemRow> _vanishedInRound;
+  std::vector<Place> _replacedInRound;
+  std::unordered_set<FolderKey> _selves;
+  std::vector<FolderKey> _newFolders;
+  std::vector<FolderKey> _removedFolders;
+  // Documents that left a name for a backup's, by folder and name.
+  std::unordered_map<std::string, Departure> _departures;
+  std::int64_t _now = 0;
+};
+
+}  // namespace skein::vald
