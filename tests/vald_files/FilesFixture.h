@@ -31,7 +31,7 @@ class TestDrive {
  public:
   // `stateBase`: where the state lies; another volume makes staging happen in the store.
   explicit TestDrive(const std::string& stateBase = {}) {
-    top = fresh(::testing::TempDir());
+    top = fresh(base());
     store = top + "/store";
     outside = top + "/outside";
     state = stateBase.empty() ? top + "/state" : fresh(stateBase);
@@ -45,6 +45,11 @@ class TestDrive {
     operations.reset();
     std::filesystem::remove_all(top);
     std::filesystem::remove_all(state);
+  }
+
+  // Where user attributes are more likely to be than in a temporary folder in memory.
+  static std::string base() {
+    return ::getenv("TEST_TMPDIR") != nullptr ? ::testing::TempDir() : "/var/tmp";
   }
 
   FileOperations& open() {
@@ -84,7 +89,8 @@ class TestDrive {
   }
 
   // All that a person could tell of the store: each path's kind, mode, contents and tags,
-  // and files' times. Without what the index leaves out, and dates of deletion.
+  // and files' times. Without dates of deletion,
+  // and, unless asked for, what the next start clears away.
   std::map<std::string, std::string> snapshot(bool withStaging = false) {
     std::map<std::string, std::string> all;
     DirectoryHandle root;
@@ -105,11 +111,18 @@ class TestDrive {
     return std::filesystem::canonical(name).native();
   }
 
+  // It tells of an item that is gone, so nobody sees it.
+  bool isOrphanInfo(const std::string& relative) const {
+    if (!relative.ends_with(".trashinfo")) return false;
+    const std::string name = nameOfPath(relative).substr(0, nameOfPath(relative).size() - 10);
+    return !exists(joinPath(parentOfPath(parentOfPath(relative)), "files/" + name));
+  }
+
   void look(const DirectoryHandle& folder, const std::string& below, bool withStaging,
             std::map<std::string, std::string>& all) {
     folder.list([&](const std::string& name) {
-      if (!withStaging && isStagingName(name)) return true;
       const std::string relative = joinPath(below, name);
+      if (!withStaging && (isStagingName(name) || isOrphanInfo(relative))) return true;
       struct stat status {};
       EXPECT_EQ(folder.status(name, status), 0);
       std::ostringstream text;

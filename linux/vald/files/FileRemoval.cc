@@ -51,7 +51,7 @@ NSErrorPtr FileOperations::removeAside(const StorePlace& place, const FileReques
 
   // From here on it is removed; what cannot be deleted now is deleted at the next start.
   failure = removeTree(_files, aside.folder, aside.name);
-  if (failure == 0) failure = removeTrashInfo(place);
+  if (const int forgetting = removeTrashInfo(place)) failure = forgetting;
   if (failure != 0) {
     VL_ERROR(_log,
              "[ERROR] removed %@, but can't delete all of %@ (%@); the next start tries again",
