@@ -54,7 +54,8 @@ NSErrorPtr DownloadTransfer::run() {
     error = transfer(part);
     if (error != nullptr) dropPart();
   }
-  _places.endWork(*work);
+  // What is left there stays noted, for the next start.
+  if (!leftSomething()) _places.endWork(*work);
   return error;
 }
 
@@ -157,15 +158,24 @@ NSErrorPtr DownloadTransfer::dressPart(const FileDescriptor& part) {
 
 void DownloadTransfer::removeMarker(const FileDescriptor& part) {
   // Should one of these fail, file and marker stand side by side for the same contents: the
-  // marker is not looked at while the file is there, and goes with the next eviction or
-  // recovery.
+  // next start, eviction or download finds that and finishes.
   const int folder = _place.folder.get();
-  if (_places.files.sync(folder) != 0) return;
-  if (_places.files.unlink(folder, _names->marker) != 0) return;
+  int code = _places.files.sync(folder);
+  if (code == 0) code = _places.files.unlink(folder, _names->marker);
+  if (code != 0) {
+    MutexLock lock(_partMutex);
+    _leftSomething = true;
+    return;
+  }
   struct stat status {};
   if (fstat(part.get(), &status) != 0) return;
   // Without a stamp the document is looked at again, and found to be uploaded.
   _places.records.setStamp(_document, UploadStamp::of(status));
+}
+
+bool DownloadTransfer::leftSomething() {
+  MutexLock lock(_partMutex);
+  return _leftSomething;
 }
 
 int DownloadTransfer::createPart(FileDescriptor& part) {
@@ -187,17 +197,19 @@ int DownloadTransfer::namePart() {
 
 void DownloadTransfer::dropPart() {
   MutexLock lock(_partMutex);
-  if (_part != Part::There) return;
+  if (_part == Part::There) removePart();
+}
+
+void DownloadTransfer::removePart() {
   _part = Part::Abandoned;
-  // A part that cannot be removed is invisible, and goes with the next recovery.
-  _places.files.unlink(_place.folder.get(), _names->part);
+  if (_places.files.unlink(_place.folder.get(), _names->part) != 0) _leftSomething = true;
 }
 
 bool DownloadTransfer::abandon() {
   {
     MutexLock lock(_partMutex);
     if (_part == Part::Named) return false;
-    if (_part == Part::There) _places.files.unlink(_place.folder.get(), _names->part);
+    if (_part == Part::There) removePart();
     _part = Part::Abandoned;
   }
   _cancellation.cancel();

@@ -49,12 +49,14 @@ class DownloadTransfer {
   NSErrorPtr fetch(const FileDescriptor& part);
   NSErrorPtr finish(const FileDescriptor& part);
   NSErrorPtr dressPart(const FileDescriptor& part);
-  void removeMarker(const FileDescriptor& part);
+  void removeMarker(const FileDescriptor& part) SKEIN_EXCLUDES(_partMutex);
 
   // 0 or an errno; ECANCELED when it was abandoned before.
   int createPart(FileDescriptor& part) SKEIN_EXCLUDES(_partMutex);
   int namePart() SKEIN_EXCLUDES(_partMutex);
   void dropPart() SKEIN_EXCLUDES(_partMutex);
+  void removePart() SKEIN_REQUIRES(_partMutex);
+  bool leftSomething() SKEIN_EXCLUDES(_partMutex);
 
   const CloudPlaces _places;
   CloudConditions& _conditions;
@@ -74,6 +76,8 @@ class DownloadTransfer {
   enum class Part : std::uint8_t { None, There, Named, Abandoned };
   Mutex _partMutex;
   Part _part SKEIN_GUARDED_BY(_partMutex) = Part::None;
+  // A part or a marker that could not be removed.
+  bool _leftSomething SKEIN_GUARDED_BY(_partMutex) = false;
 };
 
 }  // namespace skein::vald
