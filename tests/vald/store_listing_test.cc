@@ -1,0 +1,202 @@
+// What is listed, how, and under which names; containers; the index itself.
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <filesystem>
+#include <fstream>
+
+#include "tests/vald/StoreFixture.h"
+
+namespace skein::vald {
+namespace {
+
+class StoreListing : public StoreFixture {
+ protected:
+  std::vector<std::string> names(std::optional<VLFileObjectID> folder, SortOrder order,
+                                 std::uint64_t limit) {
+    std::vector<std::string> names;
+    std::uint64_t offset = 0;
+    do {
+      NSErrorPtr error;
+      const Page page = store->listFolder(folder, order, offset, limit, &error);
+      EXPECT_EQ(error, nullptr);
+      for (const VLQueryItemPtr& item : page.items) names.push_back(item->filename());
+      offset = page.nextOffset;
+    } while (offset != 0);
+    return names;
+  }
+};
+
+TEST_F(StoreListing, EveryNameOnceInByteOrderWhateverItsBytes) {
+  std::vector<std::string> expected = {"a\nb",
+                                       "\xff\xfe",
+                                       std::string(255, 'n'),
+                                       "Case",
+                                       "case",
+                                       "caf\xc3\xa9",
+                                       "cafe\xcc\x81",
+                                       " blank ",
+                                       "-dash",
+                                       "~",
+                                       "\x01"};
+  for (const std::string& name : expected) write(name);
+  std::sort(expected.begin(), expected.end());
+  for (int pass = 0; pass < 2; ++pass) {
+    pass == 0 ? open() : reopen();
+    EXPECT_EQ(names(std::nullopt, SortOrder::Name, 3), expected);
+    for (const std::string& name : expected) {
+      const VLQueryItemPtr found = item(name);
+      ASSERT_NE(found, nullptr);
+      EXPECT_EQ(store->pathForID(found->fileObjectID(), nullptr), at(name));
+    }
+  }
+}
+
+TEST_F(StoreListing, PagesByNameAndByDateAreWholeAtAnyPageSize) {
+  makeFolder("f");
+  std::vector<std::string> byName;
+  for (int i = 0; i < 57; ++i) {
+    const std::string name = "n" + std::to_string(i * 37 % 100);
+    write("f/" + name);
+    // Several of one date, so that names settle the rest.
+    const timespec times[2] = {{1000 + i / 3, 0}, {1000 + i / 3, 0}};
+    utimensat(AT_FDCWD, at("f/" + name).c_str(), times, 0);
+    byName.push_back(name);
+  }
+  open();
+  const VLFileObjectID folder = item("f")->fileObjectID();
+  std::vector<std::string> byDate = byName;
+  std::sort(byDate.begin(), byDate.end(), [&](const std::string& a, const std::string& b) {
+    const auto dateA = *item("f/" + a)->contentModificationDate();
+    const auto dateB = *item("f/" + b)->contentModificationDate();
+    return dateA != dateB ? dateA > dateB : a < b;
+  });
+  std::sort(byName.begin(), byName.end());
+  for (const std::uint64_t limit : {1, 7, 57, 200}) {
+    EXPECT_EQ(names(folder, SortOrder::Name, limit), byName);
+    EXPECT_EQ(names(folder, SortOrder::Date, limit), byDate);
+  }
+  // An offset that no listing led to.
+  const Page cold = store->listFolder(folder, SortOrder::Name, 13, 4, nullptr);
+  EXPECT_EQ(cold.items.front()->filename(), byName[13]);
+  EXPECT_EQ(cold.nextOffset, 17U);
+  EXPECT_EQ(item("f")->childItemCount(), 57U);
+}
+
+TEST_F(StoreListing, AListingUnderWaySkipsNothingWhenItemsBeforeItGo) {
+  for (const char* name : {"a", "b", "c", "d", "e"}) write(name);
+  open();
+  const Page first = store->listFolder(std::nullopt, SortOrder::Name, 0, 2, nullptr);
+  remove("a");
+  settle();
+  const Page second =
+      store->listFolder(std::nullopt, SortOrder::Name, first.nextOffset, 2, nullptr);
+  ASSERT_EQ(second.items.size(), 2U);
+  EXPECT_EQ(second.items[0]->filename(), "c");
+}
+
+TEST_F(StoreListing, OnlyFilesFoldersAndAliasesAndNothingBehindAnAlias) {
+  makeFolder("folder");
+  makeFolder(".Trash-1000/files");
+  write("folder/inside");
+  write(".hidden");
+  ASSERT_EQ(mkfifo(at("pipe").c_str(), 0600), 0);
+  ASSERT_EQ(symlink("/etc", at("alias").c_str()), 0);
+  open();
+  EXPECT_EQ(names(std::nullopt, SortOrder::Name, 10),
+            (std::vector<std::string>{".hidden", "alias", "folder"}));
+  const VLQueryItemPtr alias = item("alias");
+  EXPECT_EQ(alias->properties().kind, VLQueryItem::Kind::Alias);
+  EXPECT_EQ(alias->typeIdentifier(), "inode/symlink");
+  EXPECT_EQ(item("alias/passwd"), nullptr);
+  EXPECT_EQ(item("folder/../.hidden"), nullptr);
+  EXPECT_EQ(item("folder")->typeIdentifier(), "inode/directory");
+  NSErrorPtr error;
+  store->listFolder(alias->fileObjectID(), SortOrder::Name, 0, 10, &error);
+  ASSERT_NE(error, nullptr);
+  EXPECT_EQ(error->code(), NSFileNoSuchFileError);
+  // The folder of the drive goes by the reserved name, for itself and its children.
+  EXPECT_EQ(item("")->itemIdentifier(), NSFileProviderRootContainerItemIdentifier);
+  EXPECT_EQ(item("folder")->parentItemIdentifier(), NSFileProviderRootContainerItemIdentifier);
+  EXPECT_EQ(item("folder/inside")->parentItemIdentifier(), id("folder"));
+  EXPECT_EQ(item("folder/inside")->typeIdentifier(), "application/octet-stream");
+  // Adopting a folder writes nothing into it.
+  EXPECT_EQ(std::distance(std::filesystem::recursive_directory_iterator(root), {}), 7);
+}
+
+TEST_F(StoreListing, ContainersAreListedAtTheRootAndJournalled) {
+  write("doc");
+  const std::string container = root + "-app";
+  std::filesystem::create_directory(container);
+  std::ofstream(container + "/note.txt") << "x";
+  options.containers = {{container, "com.example.Notes", "Notes"}};
+  open();
+  EXPECT_EQ(names(std::nullopt, SortOrder::Name, 10), (std::vector<std::string>{"Notes", "doc"}));
+  const Page page = store->listFolder(std::nullopt, SortOrder::Name, 0, 10, nullptr);
+  const VLQueryItemPtr notes = page.items[0];
+  EXPECT_EQ(notes->properties().containerID, "com.example.Notes");
+  EXPECT_EQ(store->pathForID(notes->fileObjectID(), nullptr), container);
+  const Page inside = store->listFolder(notes->fileObjectID(), SortOrder::Name, 0, 10, nullptr);
+  ASSERT_EQ(inside.items.size(), 1U);
+  const VLFileObjectID note = inside.items[0]->fileObjectID();
+  reopen();
+  EXPECT_EQ(names(std::nullopt, SortOrder::Name, 10), (std::vector<std::string>{"Notes", "doc"}));
+  EXPECT_NE(store->itemWithID(note, nullptr), nullptr);
+
+  Tree tree;
+  std::uint64_t rank = 0;
+  ASSERT_TRUE(replay(tree, rank));
+  EXPECT_EQ(tree, listed());
+  store->setContainers({});
+  ASSERT_TRUE(replay(tree, rank));
+  EXPECT_EQ(tree, listed());
+  EXPECT_EQ(tree.size(), 1U);
+  std::filesystem::remove_all(container);
+}
+
+TEST_F(StoreListing, AnIndexThatIsNoneIsKeptAsideAndMadeAnew) {
+  write("doc");
+  std::ofstream(options.databasePath) << std::string(20'000, 'z');
+  open();
+  EXPECT_NE(item("doc"), nullptr);
+  EXPECT_TRUE(log.holds("cannot be used"));
+  bool isKept = false;
+  for (const auto& file : std::filesystem::directory_iterator(root + "/..")) {
+    isKept = isKept || file.path().string().find(".set-aside-") != std::string::npos;
+  }
+  EXPECT_TRUE(isKept);
+}
+
+TEST_F(StoreListing, AnIndexGoesWithItsFolder) {
+  write("doc");
+  open();
+  const std::string doc = id("doc");
+  const std::string journal = store->journalID();
+  close();
+  // Another folder in its place, as when a volume is not mounted; then the first again.
+  std::filesystem::rename(root, root + "-away");
+  std::filesystem::create_directory(root);
+  open();
+  EXPECT_NE(store->journalID(), journal);
+  close();
+  std::filesystem::remove(root);
+  std::filesystem::rename(root + "-away", root);
+  open();
+  EXPECT_EQ(store->journalID(), journal);
+  EXPECT_EQ(id("doc"), doc);
+}
+
+TEST_F(StoreListing, SettingsSurviveARestart) {
+  open();
+  store->setSetting("account", "anna");
+  store->setSetting("gone", "x");
+  store->setSetting("gone", std::nullopt);
+  reopen();
+  EXPECT_EQ(store->setting("account"), "anna");
+  EXPECT_EQ(store->setting("gone"), std::nullopt);
+}
+
+}  // namespace
+}  // namespace skein::vald
