@@ -15,6 +15,8 @@ namespace skein::vald {
 namespace {
 
 constexpr std::chrono::milliseconds kBetweenTries{50};
+// How long one that was told to stop may go on accepting.
+constexpr std::chrono::milliseconds kLastAccepted{500};
 
 bool somebodyAccepts(const std::string& socketPath) {
   int code = 0;
@@ -32,10 +34,11 @@ RunLock::Outcome RunLock::take(const std::string& path, const std::string& socke
   };
   _file = FileDescriptor(open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600));
   if (!_file) return failed(errno);
-  const auto deadline = std::chrono::steady_clock::now() + patience;
+  const auto start = std::chrono::steady_clock::now();
   while (flock(_file.get(), LOCK_EX | LOCK_NB) != 0) {
     if (errno != EWOULDBLOCK && errno != EINTR) return failed(errno);
-    if (somebodyAccepts(socketPath) || std::chrono::steady_clock::now() >= deadline) {
+    const auto waited = std::chrono::steady_clock::now() - start;
+    if (waited >= patience || (waited >= kLastAccepted && somebodyAccepts(socketPath))) {
       return Outcome::AlreadyRunning;
     }
     std::this_thread::sleep_for(kBetweenTries);

@@ -16,8 +16,8 @@ class RunLock {
   enum class Outcome : std::uint8_t { Taken, AlreadyRunning, Failed };
 
   // Takes the lock of the file at `path`, and writes the process's number there for people.
-  // While another process holds it but nobody accepts on `socketPath`, that one is about
-  // to come or to go: waits for it, until `patience` is over.
+  // Who holds it may be on its way out, or in: as long as nobody accepts on `socketPath`
+  // this waits until `patience` is over, and half a second when somebody does.
   Outcome take(const std::string& path, const std::string& socketPath,
                std::chrono::milliseconds patience, NSErrorOut error);
 

@@ -1,1 +1,211 @@
-int main() { return 0; }
+// vald: the daemon of one drive.
+#include <sys/resource.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <csignal>
+#include <cstdio>
+#include <cstdlib>
+#include <memory>
+#include <string>
+#include <string_view>
+#include <thread>
+#include <utility>
+#include <vector>
+
+#include "base/Mutex.h"
+#include "linux/protocol/DaemonServer.h"
+#include "linux/protocol/DrivePaths.h"
+#include "linux/protocol/LogFile.h"
+#include "linux/protocol/RpcLoop.h"
+#include "linux/vald/Accounts.h"
+#include "linux/vald/ApplicationsWatcher.h"
+#include "linux/vald/Background.h"
+#include "linux/vald/ClosableExecutor.h"
+#include "linux/vald/CommandLine.h"
+#include "linux/vald/Containers.h"
+#include "linux/vald/Daemon.h"
+#include "linux/vald/DesktopEntries.h"
+#include "linux/vald/DriveListener.h"
+#include "linux/vald/EventSubscribers.h"
+#include "linux/vald/FaultingDaemon.h"
+#include "linux/vald/ItemUpdateSenders.h"
+#include "linux/vald/RunLock.h"
+#include "linux/vald/Store.h"
+
+namespace skein::vald {
+namespace {
+
+constexpr std::size_t kWorkers = 4;
+constexpr std::chrono::milliseconds kQuietApplications{300};
+constexpr std::chrono::milliseconds kPatienceWithPredecessor{3000};
+
+// The server, as the faults reach it: there is none before it listens and after
+// it ended.
+class ServerSlot {
+ public:
+  void put(std::unique_ptr<DaemonServer> server) SKEIN_EXCLUDES(_mutex) {
+    MutexLock lock(_mutex);
+    _server.swap(server);
+  }
+  // Only posts to the loop.
+  void dropConnections() SKEIN_EXCLUDES(_mutex) {
+    MutexLock lock(_mutex);
+    if (_server) _server->dropConnections();
+  }
+
+ private:
+  Mutex _mutex;
+  std::unique_ptr<DaemonServer> _server SKEIN_GUARDED_BY(_mutex);
+};
+
+// As many descriptors as the system lets it have: clients and folders each cost
+// some.
+void raiseDescriptorLimit() {
+  rlimit limit{};
+  if (getrlimit(RLIMIT_NOFILE, &limit) != 0 || limit.rlim_cur == limit.rlim_max) return;
+  limit.rlim_cur = limit.rlim_max;
+  setrlimit(RLIMIT_NOFILE, &limit);
+}
+
+// Blocks the signals that end the process in order, in this thread and those it
+// starts.
+sigset_t takeEndingSignals() {
+  sigset_t signals;
+  sigemptyset(&signals);
+  for (const int signal : {SIGTERM, SIGINT, SIGHUP}) sigaddset(&signals, signal);
+  pthread_sigmask(SIG_BLOCK, &signals, nullptr);
+  std::signal(SIGPIPE, SIG_IGN);
+  return signals;
+}
+
+bool faultsAreAllowed() {
+  const char* value = std::getenv("SKEIN_ALLOW_FAULTS");
+  return value != nullptr && std::string_view(value) == "1";
+}
+
+// Serves until a signal comes. The exit status.
+int serve(const DrivePaths& paths, Background& background, Log& log) {
+  const sigset_t signals = takeEndingSignals();
+  raiseDescriptorLimit();
+  const auto fail = [&](const NSErrorPtr& error) {
+    VL_ERROR(log, "[ERROR] vald can't serve %@: %@", paths.store, error->localizedDescription());
+    background.failed(error->localizedDescription());
+    return kExitFailure;
+  };
+
+  const auto executor = std::make_shared<ClosableExecutor>(kWorkers, "vald");
+  const auto slowExecutor = std::make_shared<ClosableExecutor>(1, "vald-slow");
+  const ContainerFolders folders{paths.store, paths.containersDirectory, applicationFolders()};
+  ItemUpdateSenders senders(executor);
+  DriveListener listener(senders);
+  EventSubscribers subscribers(executor);
+  Containers containers(folders, log);
+
+  NSErrorPtr error;
+  StoreOptions options;
+  options.databasePath = paths.database;
+  options.drive.path = paths.store;
+  options.containers = containers.storeRoots();
+  const std::unique_ptr<Store> store = Store::open(std::move(options), listener, log, &error);
+  if (!store) return fail(error);
+
+  Accounts accounts(*store, loginName(), log);
+  const auto loop = RpcLoop::start("vald-io");
+  // The reply to the call that stops vald is on its way to the loop: in its first turn the
+  // connection gets it, and before the second it is written.
+  const auto stop = [weak = std::weak_ptr<RpcLoop>(loop)] {
+    const auto first = weak.lock();
+    if (!first) return;
+    first->post([weak] {
+      if (const auto second = weak.lock()) second->post([] { kill(getpid(), SIGTERM); });
+    });
+  };
+  auto daemon =
+      std::make_shared<Daemon>(DaemonParts{executor, slowExecutor, *store, senders, accounts,
+                                           containers, subscribers, log, paths.store, stop});
+  listener.setAfterChange([weak = std::weak_ptr<Daemon>(daemon)] {
+    if (const auto changed = weak.lock()) changed->refreshDriveFolders();
+  });
+
+  ServerSlot server;
+  auto served = std::make_shared<FaultingDaemon>(
+      FaultingDaemon::Parts{daemon, executor, faultsAreAllowed(),
+                            [executor](std::chrono::milliseconds delay) {
+                              ScopedWait wait(*executor);
+                              std::this_thread::sleep_for(delay);
+                            },
+                            [&server] { server.dropConnections(); }});
+  auto listening = DaemonServer::listen(loop, executor, served, paths.daemonSocket, log, &error);
+  if (!listening) {
+    executor->close();
+    slowExecutor->close();
+    return fail(error);
+  }
+  server.put(std::move(listening));
+  {
+    const ApplicationsWatcher watcher(
+        folders.applications, kQuietApplications, [&daemon] { daemon->refreshContainers(); }, log);
+    VL_NOTICE(log, "[NOTICE] vald serves %@", paths.store);
+    background.isReady();
+
+    int signal = 0;
+    sigwait(&signals, &signal);
+    VL_NOTICE(log, "[NOTICE] vald ends after signal %d", signal);
+  }
+
+  // From the outside in: no more calls come, those that came are answered, and
+  // with the last work done nothing asks the store any more, which then closes
+  // its index.
+  server.put(nullptr);
+  executor->close();
+  slowExecutor->close();
+  return EXIT_SUCCESS;
+}
+
+int run(const std::vector<std::string>& arguments) {
+  std::string problem;
+  const auto line = parseCommandLine(arguments, problem);
+  if (!line) {
+    std::fprintf(stderr, "vald: %s; \"vald --help\" tells more\n", problem.c_str());
+    return kExitUsage;
+  }
+  if (line->help) {
+    std::fputs(helpText(), stdout);
+    return EXIT_SUCCESS;
+  }
+
+  NSErrorPtr error;
+  const DrivePaths paths = DrivePaths::forStore(line->store, &error);
+  RunLock lock;
+  if (!paths.store.empty()) {
+    const auto outcome = lock.take(paths.runtimeDirectory + "/vald.lock", paths.daemonSocket,
+                                   kPatienceWithPredecessor, &error);
+    if (outcome == RunLock::Outcome::AlreadyRunning) {
+      std::fprintf(stderr, "vald: another vald serves the drive %s already\n", paths.store.c_str());
+      return EXIT_SUCCESS;
+    }
+  }
+  if (error) {
+    std::fprintf(stderr, "vald: %s\n", error->localizedDescription().c_str());
+    return kExitFailure;
+  }
+
+  Background background = line->foreground ? Background() : Background::enter(paths.daemonLog);
+  lock.writeProcessID();
+  const auto log = LogFile::open({paths.daemonLog, line->foreground}, &error);
+  if (!log) {
+    background.failed(error->localizedDescription());
+    return kExitFailure;
+  }
+  setLogLevel(*log, line->logLevel);
+  LogFile::takeFaults(log);
+  return serve(paths, background, *log);
+}
+
+}  // namespace
+}  // namespace skein::vald
+
+int main(int argc, char** argv) {
+  return skein::vald::run(std::vector<std::string>(argv + 1, argv + argc));
+}
