@@ -2,6 +2,7 @@
 #include <sys/resource.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <chrono>
 #include <csignal>
 #include <cstdio>
@@ -39,6 +40,9 @@ namespace {
 constexpr std::size_t kWorkers = 4;
 constexpr std::chrono::milliseconds kQuietApplications{300};
 constexpr std::chrono::milliseconds kPatienceWithPredecessor{3000};
+// Who told vald to stop reads the reply meanwhile: were the connection closed at once, its
+// next write would fail and take the unread reply along.
+constexpr std::chrono::milliseconds kLastReply{200};
 
 // The server, as the faults reach it: there is none before it listens and after
 // it ended.
@@ -111,15 +115,10 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
   if (!store) return fail(error);
 
   Accounts accounts(*store, loginName(), log);
-  const auto loop = RpcLoop::start("vald-io");
-  // The reply to the call that stops vald is on its way to the loop: in its first turn the
-  // connection gets it, and before the second it is written.
-  const auto stop = [weak = std::weak_ptr<RpcLoop>(loop)] {
-    const auto first = weak.lock();
-    if (!first) return;
-    first->post([weak] {
-      if (const auto second = weak.lock()) second->post([] { kill(getpid(), SIGTERM); });
-    });
+  std::atomic<bool> wasToldToStop{false};
+  const auto stop = [&wasToldToStop] {
+    wasToldToStop.store(true);
+    kill(getpid(), SIGTERM);
   };
   auto daemon =
       std::make_shared<Daemon>(DaemonParts{executor, slowExecutor, *store, senders, accounts,
@@ -136,6 +135,7 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
                               std::this_thread::sleep_for(delay);
                             },
                             [&server] { server.dropConnections(); }});
+  const auto loop = RpcLoop::start("vald-io");
   auto listening = DaemonServer::listen(loop, executor, served, paths.daemonSocket, log, &error);
   if (!listening) {
     executor->close();
@@ -151,12 +151,16 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
 
     int signal = 0;
     sigwait(&signals, &signal);
-    VL_NOTICE(log, "[NOTICE] vald ends after signal %d", signal);
+    if (wasToldToStop.load()) {
+      VL_NOTICE(log, "[NOTICE] vald ends as it was told to");
+      std::this_thread::sleep_for(kLastReply);
+    } else {
+      VL_NOTICE(log, "[NOTICE] vald ends after signal %d", signal);
+    }
   }
 
-  // From the outside in: no more calls come, those that came are answered, and
-  // with the last work done nothing asks the store any more, which then closes
-  // its index.
+  // From the outside in: no more calls come, those that came are answered, and with the
+  // last work done nothing asks the store any more, which then closes its index.
   server.put(nullptr);
   executor->close();
   slowExecutor->close();
