@@ -1,1 +1,272 @@
-int main() { return 0; }
+// skein-host: carries the extension of one drive. Reads the arguments and wires the parts;
+// everything else is theirs.
+#include <fcntl.h>
+#include <sys/file.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <chrono>
+#include <csignal>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <memory>
+#include <string>
+#include <string_view>
+#include <thread>
+
+#include "base/ThreadPool.h"
+#include "extension/VLFileProviderExtension.h"
+#include "linux/framework/LocalFramework.h"
+#include "linux/framework/UnsupportedFileOperations.h"
+#include "linux/host/HostRequests.h"
+#include "linux/host/NSExtensionMain.h"
+#include "linux/protocol/HostServer.h"
+#include "linux/protocol/LogFile.h"
+#include "linux/protocol/ProcessLauncher.h"
+#include "linux/protocol/UnixSocket.h"
+#include "support/Environment.h"
+
+namespace skein {
+namespace {
+
+constexpr char kHelp[] =
+    R"(Usage: skein-host --store DIR [--foreground] [--log-level LEVEL] [--attributes FILE]
+
+Carries the File Provider extension of the drive over DIR, for the commands of skein,
+which starts it when it is not running. It starts vald, the drive's daemon, in its turn.
+
+  --store DIR         the drive's folder; SKEIN_STORE otherwise
+  --foreground        stay in the foreground, and log to standard error too
+  --log-level LEVEL   notice, info (the usual one) or debug; SKEIN_LOG otherwise
+  --attributes FILE   the extension's attributes, instead of those installed with it
+  --help              this text
+
+Example: skein-host --store ~/Documents --foreground --log-level debug
+
+Exit codes: 0 ended as asked, or another skein-host serves the drive already; 1 failure;
+2 usage; 3 the extension cannot be instantiated.
+)";
+
+constexpr int kExitFailure = 1;
+constexpr int kExitUsage = 2;
+constexpr int kExitExtension = 3;
+
+struct Arguments {
+  std::string store;
+  std::string logLevel = "info";
+  std::string attributes;
+  bool foreground = false;
+};
+
+int fail(int code, const std::string& text) {
+  std::fprintf(stderr, "skein-host: %s\n", text.c_str());
+  return code;
+}
+
+bool isLogLevel(std::string_view level) {
+  return level == "notice" || level == "info" || level == "debug";
+}
+
+// Empty when they make sense; else what is wrong.
+std::string parse(int argc, char** argv, Arguments& arguments, bool& help) {
+  if (const char* store = std::getenv("SKEIN_STORE")) arguments.store = store;
+  if (const char* level = std::getenv("SKEIN_LOG"); level != nullptr && isLogLevel(level)) {
+    arguments.logLevel = level;
+  }
+  for (int i = 1; i < argc; ++i) {
+    const std::string_view argument = argv[i];
+    const auto value = [&](std::string& into) {
+      if (i + 1 >= argc) return false;
+      into = argv[++i];
+      return true;
+    };
+    bool complete = true;
+    if (argument == "--help" || argument == "-h") {
+      help = true;
+    } else if (argument == "--foreground") {
+      arguments.foreground = true;
+    } else if (argument == "--store") {
+      complete = value(arguments.store);
+    } else if (argument == "--log-level") {
+      complete = value(arguments.logLevel);
+    } else if (argument == "--attributes") {
+      complete = value(arguments.attributes);
+    } else {
+      return "there is no argument " + std::string(argument) + "; see skein-host --help";
+    }
+    if (!complete) return std::string(argument) + " needs a value; see skein-host --help";
+  }
+  if (!isLogLevel(arguments.logLevel)) {
+    return "--log-level is notice, info or debug, not " + arguments.logLevel;
+  }
+  if (!help && arguments.store.empty()) return "name the drive's folder with --store DIR";
+  return {};
+}
+
+std::string attributesPath() {
+  const std::string folder = folderOfThisProgram();
+  const std::string beside = folder + "/extension.attributes";
+  if (access(beside.c_str(), R_OK) == 0) return beside;
+  return folder + "/../share/skein/extension.attributes";
+}
+
+// Goes on in a child when it is not to stay in the foreground; the first process ends with
+// status 0 once the child serves, or 1. Answers where the child says that it does.
+FileDescriptor leaveForeground() {
+  int ends[2];
+  if (pipe2(ends, O_CLOEXEC) != 0) return FileDescriptor();
+  const pid_t child = fork();
+  if (child < 0) return FileDescriptor();
+  if (child > 0) {
+    close(ends[1]);
+    char ready = 0;
+    ssize_t got = 0;
+    do {
+      got = read(ends[0], &ready, 1);
+    } while (got < 0 && errno == EINTR);
+    _exit(got == 1 ? ready : kExitFailure);
+  }
+  close(ends[0]);
+  setsid();
+  return FileDescriptor(ends[1]);
+}
+
+void report(const FileDescriptor& parent, int code) {
+  const char byte = static_cast<char>(code);
+  if (parent) [[maybe_unused]]
+    const ssize_t written = write(parent.get(), &byte, 1);
+}
+
+enum class Lock : std::uint8_t { Taken, Held, Failed };
+
+// One host per drive. Another one that holds the lock but does not accept is just coming or
+// going, so it is waited for.
+Lock takeLock(const DrivePaths& paths, FileDescriptor& file) {
+  using namespace std::chrono_literals;
+  const std::string path = paths.runtimeDirectory + "/skein-host.lock";
+  file = FileDescriptor(open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600));
+  if (!file) return Lock::Failed;
+  const auto deadline = std::chrono::steady_clock::now() + 3s;
+  while (flock(file.get(), LOCK_EX | LOCK_NB) != 0) {
+    if (errno != EWOULDBLOCK && errno != EINTR) return Lock::Failed;
+    int code = 0;
+    if (connectToUnixSocket(paths.hostSocket, code)) return Lock::Held;
+    if (std::chrono::steady_clock::now() >= deadline) return Lock::Held;
+    std::this_thread::sleep_for(10ms);
+  }
+  return Lock::Taken;
+}
+
+int serve(const Arguments& arguments, const DrivePaths& paths, const FileDescriptor& parent,
+          const sigset_t& endSignals) {
+  NSErrorPtr error;
+  const auto log = LogFile::open({paths.hostLog, arguments.foreground}, &error);
+  if (!log) return fail(kExitFailure, error->localizedDescription());
+  LogFile::takeFaults(log);
+  log->setEnabled(LogType::Info, arguments.logLevel != "notice");
+  log->setEnabled(LogType::Debug, arguments.logLevel == "debug");
+
+  const auto attributes = readExtensionAttributes(
+      arguments.attributes.empty() ? attributesPath() : arguments.attributes, &error);
+  if (!attributes) return fail(kExitExtension, error->localizedDescription());
+
+  const std::shared_ptr<Executor> executor = std::make_shared<ThreadPool>(4, "host");
+  const std::shared_ptr<Timers> timers = std::make_shared<SteadyTimers>(executor);
+  const std::shared_ptr<RpcLoop> loop = RpcLoop::start("host-io");
+  NSNotificationCenter notificationCenter;
+  LocalFramework framework(loop, executor, notificationCenter, LocalFramework::optionsFor(paths));
+  const DaemonProxies daemon = [client = framework.client()](auto errorHandler) {
+    return client->remoteObjectProxyWithErrorHandler(std::move(errorHandler));
+  };
+
+  const auto host = std::make_shared<FileProviderHost>(
+      HostTools{executor, timers}, std::make_unique<WorkingSetWatch>(daemon, timers), *log);
+  VLLogSections logSections(executor);
+  RootURL rootURL;
+  UnsupportedFileOperations fileOperations(executor);
+  UnsupportedFileManager fileManager(*log);
+  UnsupportedOperations operations;
+  UnsupportedBundles bundles;
+  Environment environment{*log,
+                          executor,
+                          notificationCenter,
+                          *host,
+                          framework.accounts(),
+                          framework.containers(),
+                          framework.daemonConnection(),
+                          framework.documents(),
+                          framework.queryItems(),
+                          logSections,
+                          rootURL,
+                          fileOperations,
+                          fileManager,
+                          operations,
+                          bundles,
+                          *log};
+
+  const NSExtensionPrincipalClasses classes{
+      {"VLFileProviderExtension",
+       [&environment](std::shared_ptr<const NSExtensionAttributes> given) {
+         return VLFileProviderExtension::init(std::move(given), environment);
+       }}};
+  auto extension = NSExtensionInstantiatePrincipalClass(attributes, classes, &error);
+  if (!extension) {
+    VL_ERROR(*log, "[ERROR] %s", error->localizedDescription());
+    return fail(kExitExtension, error->localizedDescription());
+  }
+  host->setExtension(std::move(extension));
+
+  const auto requests = std::make_shared<HostRequests>(host, daemon, framework.containers(), *log);
+  auto server = HostServer::listen(loop, executor, requests, paths.hostSocket, *log, &error);
+  if (!server) return fail(kExitFailure, error->localizedDescription());
+  VL_NOTICE(*log, "[NOTICE] serving %s", paths.store);
+  report(parent, 0);
+
+  int signal = 0;
+  while (sigwait(&endSignals, &signal) != 0) {
+  }
+  VL_NOTICE(*log, "[NOTICE] ending, as signal %d asked for it", signal);
+  server.reset();
+  // The process keeps nothing that has to be saved, and a thread may be waiting for a vald
+  // that does not answer: the end does not wait for it.
+  std::_Exit(EXIT_SUCCESS);
+}
+
+}  // namespace
+}  // namespace skein
+
+int main(int argc, char** argv) {
+  using namespace skein;
+  Arguments arguments;
+  bool help = false;
+  if (const std::string problem = parse(argc, argv, arguments, help); !problem.empty()) {
+    return fail(kExitUsage, problem);
+  }
+  if (help) {
+    std::fputs(kHelp, stdout);
+    return 0;
+  }
+  // Before there are threads: they inherit it, so that main alone takes these.
+  std::signal(SIGPIPE, SIG_IGN);
+  sigset_t endSignals;
+  sigemptyset(&endSignals);
+  for (const int signal : {SIGTERM, SIGINT, SIGHUP}) sigaddset(&endSignals, signal);
+  pthread_sigmask(SIG_BLOCK, &endSignals, nullptr);
+
+  NSErrorPtr error;
+  const DrivePaths paths = DrivePaths::forStore(arguments.store, &error);
+  if (paths.store.empty()) return fail(kExitFailure, error->localizedDescription());
+  const FileDescriptor parent = arguments.foreground ? FileDescriptor() : leaveForeground();
+  FileDescriptor lockFile;
+  switch (takeLock(paths, lockFile)) {
+    case Lock::Held: report(parent, 0); return 0;
+    case Lock::Failed:
+      return fail(kExitFailure, paths.runtimeDirectory +
+                                    "/skein-host.lock cannot be locked: " + std::strerror(errno));
+    case Lock::Taken: break;
+  }
+  const int code = serve(arguments, paths, parent, endSignals);
+  report(parent, code);
+  return code;
+}

@@ -54,9 +54,7 @@ struct HostStatus {
   LocalDaemonStatus daemon;
   std::int64_t processID = 0;
   std::uint64_t watchedContainers = 0;
-  std::uint64_t enumerators = 0;
   bool debugLog = false;
-  std::string version;
 };
 
 struct HostDifference {

@@ -1,0 +1,274 @@
+#include "linux/protocol/HostClient.h"
+
+#include <type_traits>
+#include <utility>
+
+#include "linux/protocol/HostCodec.h"
+
+namespace skein {
+namespace {
+
+constexpr auto kPatience = SocketClient::Patience::WhilePeerLives;
+
+template <class... Values>
+using SharedReply = std::shared_ptr<Reply<Values..., NSErrorPtr>>;
+template <class... Values>
+SharedReply<Values...> share(std::type_identity_t<Reply<Values..., NSErrorPtr>>& reply) {
+  return std::make_shared<Reply<Values..., NSErrorPtr>>(std::move(reply));
+}
+
+// One stream, on the connection that it was made on. The reference belongs to the loop.
+// `Decode` is a function object without state.
+template <class Client, class Decode, class... Values>
+class StreamProxy final : public HostStream<Values...> {
+ public:
+  StreamProxy(std::shared_ptr<SocketClient> socket, Client client)
+      : _socket(std::move(socket)),
+        _connection(_socket->currentConnection()),
+        _client(_socket->loop()->own(std::make_unique<Client>(kj::mv(client)))) {}
+
+  void next(Reply<Values..., NSErrorPtr> reply) override {
+    auto shared = share<Values...>(reply);
+    _socket->loop()->post([socket = _socket, client = _client, connection = _connection, shared] {
+      socket->sendOver(
+          connection,
+          [client, shared]() -> kj::Promise<Task> {
+            return client->nextRequest().send().then(
+                [shared](auto results) -> Task { return Decode()(results, shared); });
+          },
+          [shared](NSErrorPtr error) { (*shared)(Values()..., std::move(error)); }, kPatience);
+    });
+  }
+
+ private:
+  const std::shared_ptr<SocketClient> _socket;
+  const std::uint64_t _connection;
+  const std::shared_ptr<Client> _client;
+};
+
+template <class... Values, class Client, class Decode>
+std::shared_ptr<HostStream<Values...>> makeStream(const std::shared_ptr<SocketClient>& socket,
+                                                  Client client, Decode) {
+  return std::make_shared<StreamProxy<Client, Decode, Values...>>(socket, kj::mv(client));
+}
+
+Task decodePage(const auto& results, const SharedReply<NSFileProviderItems, bool>& reply) {
+  return [reply, items = codec::decodeProviderItems(results.getItems()), last = results.getLast(),
+          error = codec::errorOf(results)]() mutable {
+    (*reply)(std::move(items), last, std::move(error));
+  };
+}
+
+Task decodeChanges(const auto& results, const SharedReply<std::vector<HostChange>>& reply) {
+  std::vector<HostChange> changes;
+  changes.reserve(results.getChanges().size());
+  for (const auto change : results.getChanges()) changes.push_back(codec::decode(change));
+  return [reply, changes = std::move(changes), error = codec::errorOf(results)]() mutable {
+    (*reply)(std::move(changes), std::move(error));
+  };
+}
+
+Task decodeStep(const auto& results, const SharedReply<HostCheckStep>& reply) {
+  HostCheckStep step;
+  for (const auto difference : results.getDifferences()) {
+    step.differences.push_back(codec::decode(difference));
+  }
+  step.folders = results.getFolders();
+  step.items = results.getItems();
+  step.finished = results.getFinished();
+  return [reply, step = std::move(step), error = codec::errorOf(results)]() mutable {
+    (*reply)(std::move(step), std::move(error));
+  };
+}
+
+class HostProxy final : public HostService {
+ public:
+  explicit HostProxy(std::shared_ptr<SocketClient> socket) : _socket(std::move(socket)) {}
+  ~HostProxy() override { _socket->close(); }
+
+  void list(HostTarget container, HostOrder order,
+            Reply<std::shared_ptr<HostListing>, NSErrorPtr> reply) override {
+    call<std::shared_ptr<HostListing>>(
+        [container = std::move(container), order](wire::Host::Client& host) {
+          auto request = host.listRequest();
+          codec::encode(request.initContainer(), container);
+          request.setOrder(static_cast<std::uint8_t>(order));
+          return request.send();
+        },
+        [socket = _socket](auto& results) -> std::shared_ptr<HostListing> {
+          if (!results.hasListing()) return nullptr;
+          return makeStream<NSFileProviderItems, bool>(
+              socket, results.getListing(),
+              [](const auto& page, const auto& next) { return decodePage(page, next); });
+        },
+        reply);
+  }
+
+  void item(HostTarget target, Reply<HostItem, NSErrorPtr> reply) override {
+    call<HostItem>(
+        [target = std::move(target)](wire::Host::Client& host) {
+          auto request = host.itemRequest();
+          codec::encode(request.initTarget(), target);
+          return request.send();
+        },
+        [](auto& results) { return codec::decode(results.getItem()); }, reply);
+  }
+
+  void identifierForPath(std::string path, Reply<std::string, NSErrorPtr> reply) override {
+    call<std::string>(
+        [path = std::move(path)](wire::Host::Client& host) {
+          auto request = host.identifierForPathRequest();
+          request.setPath(codec::bytes(path));
+          return request.send();
+        },
+        [](auto& results) { return codec::text(results.getIdentifier()); }, reply);
+  }
+
+  void pathForIdentifier(std::string identifier, Reply<std::string, NSErrorPtr> reply) override {
+    call<std::string>(
+        [identifier = std::move(identifier)](wire::Host::Client& host) {
+          auto request = host.pathForIdentifierRequest();
+          request.setIdentifier(codec::bytes(identifier));
+          return request.send();
+        },
+        [](auto& results) { return codec::text(results.getPath()); }, reply);
+  }
+
+  void watch(HostTarget container, Reply<std::shared_ptr<HostWatch>, NSErrorPtr> reply) override {
+    call<std::shared_ptr<HostWatch>>(
+        [container = std::move(container)](wire::Host::Client& host) {
+          auto request = host.watchRequest();
+          codec::encode(request.initContainer(), container);
+          return request.send();
+        },
+        [socket = _socket](auto& results) -> std::shared_ptr<HostWatch> {
+          if (!results.hasWatch()) return nullptr;
+          return makeStream<std::vector<HostChange>>(
+              socket, results.getWatch(),
+              [](const auto& changes, const auto& next) { return decodeChanges(changes, next); });
+        },
+        reply);
+  }
+
+  void changesSince(std::optional<NSData> token,
+                    Reply<HostChangeBatch, NSErrorPtr> reply) override {
+    call<HostChangeBatch>(
+        [token = std::move(token)](wire::Host::Client& host) {
+          auto request = host.changesSinceRequest();
+          if (token) request.setToken(codec::bytes(*token));
+          return request.send();
+        },
+        [](auto& results) {
+          HostChangeBatch batch;
+          batch.updates = codec::decodeProviderItems(results.getUpdates());
+          batch.deletions = codec::decode(results.getDeletions());
+          const auto data = results.getToken();
+          batch.token = NSData(std::span(data.begin(), data.size()));
+          batch.moreComing = results.getMoreComing();
+          return batch;
+        },
+        reply);
+  }
+
+  void account(Reply<std::optional<LocalAccount>, NSErrorPtr> reply) override {
+    call<std::optional<LocalAccount>>(
+        [](wire::Host::Client& host) { return host.accountRequest().send(); },
+        [](auto& results) -> std::optional<LocalAccount> {
+          if (!results.hasAccount()) return std::nullopt;
+          return codec::decode(results.getAccount());
+        },
+        reply);
+  }
+
+  void logIn(LocalAccount account, Reply<NSErrorPtr> reply) override {
+    callForError(
+        [account = std::move(account)](wire::Host::Client& host) {
+          auto request = host.logInRequest();
+          codec::encode(request.initAccount(), account);
+          return request.send();
+        },
+        reply);
+  }
+
+  void logOut(Reply<NSErrorPtr> reply) override {
+    callForError([](wire::Host::Client& host) { return host.logOutRequest().send(); }, reply);
+  }
+
+  void status(Reply<HostStatus, NSErrorPtr> reply) override {
+    call<HostStatus>([](wire::Host::Client& host) { return host.statusRequest().send(); },
+                     [](auto& results) { return codec::decode(results.getStatus()); }, reply);
+  }
+
+  void check(Reply<std::shared_ptr<HostCheck>, NSErrorPtr> reply) override {
+    call<std::shared_ptr<HostCheck>>(
+        [](wire::Host::Client& host) { return host.checkRequest().send(); },
+        [socket = _socket](auto& results) -> std::shared_ptr<HostCheck> {
+          if (!results.hasCheck()) return nullptr;
+          return makeStream<HostCheckStep>(
+              socket, results.getCheck(),
+              [](const auto& step, const auto& next) { return decodeStep(step, next); });
+        },
+        reply);
+  }
+
+  void setDebugLog(bool enabled, Reply<NSErrorPtr> reply) override {
+    callForError(
+        [enabled](wire::Host::Client& host) {
+          auto request = host.setDebugLogRequest();
+          request.setEnabled(enabled);
+          return request.send();
+        },
+        reply);
+  }
+
+ private:
+  template <class Value, class Send, class Decode>
+  void call(Send send, Decode decode, Reply<Value, NSErrorPtr>& reply) {
+    struct Waiting {
+      Reply<Value, NSErrorPtr> reply;
+      Decode decode;
+    };
+    auto waiting = std::make_shared<Waiting>(Waiting{std::move(reply), std::move(decode)});
+    _socket->send(
+        [send = std::move(send),
+         waiting](capnp::Capability::Client server) mutable -> kj::Promise<Task> {
+          auto host = server.castAs<wire::Host>();
+          return send(host).then([waiting](auto results) -> Task {
+            return [waiting, value = waiting->decode(results),
+                    error = codec::errorOf(results)]() mutable {
+              waiting->reply(std::move(value), std::move(error));
+            };
+          });
+        },
+        [waiting](NSErrorPtr error) { waiting->reply(Value(), std::move(error)); }, kPatience);
+  }
+
+  template <class Send>
+  void callForError(Send send, Reply<NSErrorPtr>& reply) {
+    auto shared = std::make_shared<Reply<NSErrorPtr>>(std::move(reply));
+    _socket->send(
+        [send = std::move(send),
+         shared](capnp::Capability::Client server) mutable -> kj::Promise<Task> {
+          auto host = server.castAs<wire::Host>();
+          return send(host).then([shared](auto results) -> Task {
+            return [shared, error = codec::errorOf(results)]() mutable {
+              (*shared)(std::move(error));
+            };
+          });
+        },
+        [shared](NSErrorPtr error) { (*shared)(std::move(error)); }, kPatience);
+  }
+
+  const std::shared_ptr<SocketClient> _socket;
+};
+
+}  // namespace
+
+std::shared_ptr<HostService> makeHostClient(std::shared_ptr<RpcLoop> loop,
+                                            std::shared_ptr<Executor> executor,
+                                            SocketClient::Options options) {
+  return std::make_shared<HostProxy>(
+      std::make_shared<SocketClient>(std::move(loop), std::move(executor), std::move(options)));
+}
+
+}  // namespace skein

@@ -1,0 +1,329 @@
+#include "linux/protocol/HostServer.h"
+
+#include <kj/debug.h>
+
+#include <tuple>
+#include <utility>
+
+#include "linux/protocol/HostCodec.h"
+#include "linux/protocol/SocketServer.h"
+
+namespace skein {
+namespace {
+
+// What one connection may have at once. A terminal's listing has three pages under way.
+constexpr std::size_t kMostUnanswered = 256;
+
+// What the objects of one connection share.
+struct HostPeer {
+  std::shared_ptr<RpcLoop> loop;
+  std::shared_ptr<Executor> executor;
+  std::shared_ptr<HostService> service;
+  std::size_t unanswered = 0;  // on the loop's thread
+};
+using HostPeerPtr = std::shared_ptr<HostPeer>;
+
+// A call that the service has to answer. Lives on the loop's thread.
+template <class Context>
+struct HostCall {
+  HostCall(HostPeerPtr hostPeer, Context callContext, kj::Own<kj::PromiseFulfiller<void>> own)
+      : peer(std::move(hostPeer)), context(callContext), fulfiller(kj::mv(own)) {
+    ++peer->unanswered;
+  }
+  ~HostCall() { --peer->unanswered; }
+  HostCall(const HostCall&) = delete;
+  HostCall& operator=(const HostCall&) = delete;
+
+  const HostPeerPtr peer;
+  Context context;  // valid while the fulfiller is waited for
+  kj::Own<kj::PromiseFulfiller<void>> fulfiller;
+};
+
+// Calls start(reply) on the executor and answers the promise of the call, on the loop's
+// thread: encode(results, values...). The parameters are decoded by then.
+template <class Context, class Start, class Encode>
+kj::Promise<void> answer(const HostPeerPtr& peer, Context context, Start start, Encode encode) {
+  KJ_REQUIRE(peer->unanswered < kMostUnanswered, "too many calls are unanswered");
+  auto paf = kj::newPromiseAndFulfiller<void>();
+  auto call =
+      peer->loop->own(std::make_unique<HostCall<Context>>(peer, context, kj::mv(paf.fulfiller)));
+  peer->executor->post([start = std::move(start), call = std::move(call), loop = peer->loop,
+                        encode = std::move(encode)]() mutable {
+    start([call = std::move(call), loop, encode = std::move(encode)](auto&&... values) mutable {
+      loop->post([call = std::move(call), encode = std::move(encode),
+                  values = std::make_tuple(std::forward<decltype(values)>(values)...)]() mutable {
+        if (!call->fulfiller->isWaiting()) return;  // the client is gone
+        call->fulfiller->rejectIfThrows([&] {
+          std::apply([&](auto&... value) { encode(call->context.getResults(), value...); }, values);
+          call->fulfiller->fulfill();
+        });
+      });
+    });
+  });
+  return kj::mv(paf.promise);
+}
+
+// A stream that is released on the executor: its end asks the extension to let go.
+template <class Stream>
+class StreamOwner {
+ public:
+  StreamOwner(HostPeerPtr peer, std::shared_ptr<Stream> stream)
+      : _peer(std::move(peer)), _stream(std::move(stream)) {}
+  ~StreamOwner() {
+    _peer->executor->post([stream = std::move(_stream)]() mutable { stream = nullptr; });
+  }
+  StreamOwner(const StreamOwner&) = delete;
+  StreamOwner& operator=(const StreamOwner&) = delete;
+
+  const HostPeerPtr& peer() const { return _peer; }
+  auto next() const {
+    return [stream = _stream](auto reply) { stream->next(std::move(reply)); };
+  }
+
+ private:
+  const HostPeerPtr _peer;
+  std::shared_ptr<Stream> _stream;
+};
+
+class ListingObject final : public wire::Listing::Server {
+ public:
+  ListingObject(HostPeerPtr peer, std::shared_ptr<HostListing> stream)
+      : _stream(std::move(peer), std::move(stream)) {}
+
+  kj::Promise<void> next(NextContext context) override {
+    return answer(
+        _stream.peer(), context, _stream.next(),
+        [](auto results, const NSFileProviderItems& items, bool last, const NSErrorPtr& error) {
+          codec::encode(results.initItems(static_cast<unsigned>(items.size())), items);
+          results.setLast(last);
+          codec::setError(results, error);
+        });
+  }
+
+ private:
+  const StreamOwner<HostListing> _stream;
+};
+
+class WatchObject final : public wire::Watch::Server {
+ public:
+  WatchObject(HostPeerPtr peer, std::shared_ptr<HostWatch> stream)
+      : _stream(std::move(peer), std::move(stream)) {}
+
+  kj::Promise<void> next(NextContext context) override {
+    return answer(
+        _stream.peer(), context, _stream.next(),
+        [](auto results, const std::vector<HostChange>& changes, const NSErrorPtr& error) {
+          auto list = results.initChanges(static_cast<unsigned>(changes.size()));
+          unsigned at = 0;
+          for (const HostChange& change : changes) codec::encode(list[at++], change);
+          codec::setError(results, error);
+        });
+  }
+
+ private:
+  const StreamOwner<HostWatch> _stream;
+};
+
+class CheckObject final : public wire::Check::Server {
+ public:
+  CheckObject(HostPeerPtr peer, std::shared_ptr<HostCheck> stream)
+      : _stream(std::move(peer), std::move(stream)) {}
+
+  kj::Promise<void> next(NextContext context) override {
+    return answer(_stream.peer(), context, _stream.next(),
+                  [](auto results, const HostCheckStep& step, const NSErrorPtr& error) {
+                    auto list =
+                        results.initDifferences(static_cast<unsigned>(step.differences.size()));
+                    unsigned at = 0;
+                    for (const auto& difference : step.differences) {
+                      codec::encode(list[at++], difference);
+                    }
+                    results.setFolders(step.folders);
+                    results.setItems(step.items);
+                    results.setFinished(step.finished);
+                    codec::setError(results, error);
+                  });
+  }
+
+ private:
+  const StreamOwner<HostCheck> _stream;
+};
+
+constexpr auto encodeError = [](auto results, const NSErrorPtr& error) {
+  codec::setError(results, error);
+};
+
+// The host, as one connection sees it. Lives on the loop's thread.
+class HostObject final : public wire::Host::Server {
+ public:
+  explicit HostObject(HostPeerPtr peer) : _peer(std::move(peer)) {}
+
+  kj::Promise<void> list(ListContext context) override {
+    const auto params = context.getParams();
+    const HostOrder order = params.getOrder() == 1 ? HostOrder::Date : HostOrder::Name;
+    return answer(
+        _peer, context,
+        [service = service(), target = codec::decode(params.getContainer()), order](auto reply) {
+          service->list(target, order, std::move(reply));
+        },
+        [peer = _peer](auto results, std::shared_ptr<HostListing>& listing,
+                       const NSErrorPtr& error) {
+          if (listing) results.setListing(kj::heap<ListingObject>(peer, std::move(listing)));
+          codec::setError(results, error);
+        });
+  }
+
+  kj::Promise<void> item(ItemContext context) override {
+    return answer(
+        _peer, context,
+        [service = service(), target = codec::decode(context.getParams().getTarget())](auto reply) {
+          service->item(target, std::move(reply));
+        },
+        [](auto results, const HostItem& item, const NSErrorPtr& error) {
+          codec::encode(results.initItem(), item);
+          codec::setError(results, error);
+        });
+  }
+
+  kj::Promise<void> identifierForPath(IdentifierForPathContext context) override {
+    return answer(
+        _peer, context,
+        [service = service(), path = codec::text(context.getParams().getPath())](auto reply) {
+          service->identifierForPath(path, std::move(reply));
+        },
+        [](auto results, const std::string& identifier, const NSErrorPtr& error) {
+          results.setIdentifier(codec::bytes(identifier));
+          codec::setError(results, error);
+        });
+  }
+
+  kj::Promise<void> pathForIdentifier(PathForIdentifierContext context) override {
+    return answer(
+        _peer, context,
+        [service = service(), identifier = codec::text(context.getParams().getIdentifier())](
+            auto reply) { service->pathForIdentifier(identifier, std::move(reply)); },
+        [](auto results, const std::string& path, const NSErrorPtr& error) {
+          results.setPath(codec::bytes(path));
+          codec::setError(results, error);
+        });
+  }
+
+  kj::Promise<void> watch(WatchContext context) override {
+    return answer(
+        _peer, context,
+        [service = service(), target = codec::decode(context.getParams().getContainer())](
+            auto reply) { service->watch(target, std::move(reply)); },
+        [peer = _peer](auto results, std::shared_ptr<HostWatch>& watch, const NSErrorPtr& error) {
+          if (watch) results.setWatch(kj::heap<WatchObject>(peer, std::move(watch)));
+          codec::setError(results, error);
+        });
+  }
+
+  kj::Promise<void> changesSince(ChangesSinceContext context) override {
+    std::optional<NSData> token;
+    if (context.getParams().hasToken()) {
+      const auto data = context.getParams().getToken();
+      token = NSData(std::span(data.begin(), data.size()));
+    }
+    return answer(
+        _peer, context,
+        [service = service(), token = std::move(token)](auto reply) {
+          service->changesSince(token, std::move(reply));
+        },
+        [](auto results, const HostChangeBatch& batch, const NSErrorPtr& error) {
+          codec::encode(results.initUpdates(static_cast<unsigned>(batch.updates.size())),
+                        batch.updates);
+          codec::encode(results.initDeletions(static_cast<unsigned>(batch.deletions.size())),
+                        batch.deletions);
+          results.setToken(codec::bytes(batch.token));
+          results.setMoreComing(batch.moreComing);
+          codec::setError(results, error);
+        });
+  }
+
+  kj::Promise<void> account(AccountContext context) override {
+    return answer(
+        _peer, context, [service = service()](auto reply) { service->account(std::move(reply)); },
+        [](auto results, const std::optional<LocalAccount>& account, const NSErrorPtr& error) {
+          if (account) codec::encode(results.initAccount(), *account);
+          codec::setError(results, error);
+        });
+  }
+
+  kj::Promise<void> logIn(LogInContext context) override {
+    return answer(
+        _peer, context,
+        [service = service(), account = codec::decode(context.getParams().getAccount())](
+            auto reply) { service->logIn(account, std::move(reply)); },
+        encodeError);
+  }
+
+  kj::Promise<void> logOut(LogOutContext context) override {
+    return answer(
+        _peer, context, [service = service()](auto reply) { service->logOut(std::move(reply)); },
+        encodeError);
+  }
+
+  kj::Promise<void> status(StatusContext context) override {
+    return answer(
+        _peer, context, [service = service()](auto reply) { service->status(std::move(reply)); },
+        [](auto results, const HostStatus& status, const NSErrorPtr& error) {
+          codec::encode(results.initStatus(), status);
+          codec::setError(results, error);
+        });
+  }
+
+  kj::Promise<void> check(CheckContext context) override {
+    return answer(
+        _peer, context, [service = service()](auto reply) { service->check(std::move(reply)); },
+        [peer = _peer](auto results, std::shared_ptr<HostCheck>& check, const NSErrorPtr& error) {
+          if (check) results.setCheck(kj::heap<CheckObject>(peer, std::move(check)));
+          codec::setError(results, error);
+        });
+  }
+
+  kj::Promise<void> setDebugLog(SetDebugLogContext context) override {
+    return answer(
+        _peer, context,
+        [service = service(), enabled = context.getParams().getEnabled()](auto reply) {
+          service->setDebugLog(enabled, std::move(reply));
+        },
+        encodeError);
+  }
+
+ private:
+  const std::shared_ptr<HostService>& service() const { return _peer->service; }
+
+  const HostPeerPtr _peer;
+};
+
+}  // namespace
+
+class HostServer::Implementation {
+ public:
+  std::shared_ptr<SocketServer> server;
+};
+
+std::unique_ptr<HostServer> HostServer::listen(const std::shared_ptr<RpcLoop>& loop,
+                                               const std::shared_ptr<Executor>& executor,
+                                               const std::shared_ptr<HostService>& service,
+                                               const std::string& socketPath, Log& log,
+                                               NSErrorOut error) {
+  auto implementation = std::make_unique<Implementation>();
+  implementation->server = SocketServer::listen(
+      loop, socketPath,
+      [loop, executor, service]() -> capnp::Capability::Client {
+        return kj::heap<HostObject>(
+            std::make_shared<HostPeer>(HostPeer{loop, executor, service, 0}));
+      },
+      log, {}, error);
+  if (!implementation->server) return nullptr;
+  return std::unique_ptr<HostServer>(new HostServer(std::move(implementation)));
+}
+
+HostServer::HostServer(std::unique_ptr<Implementation> implementation)
+    : _implementation(std::move(implementation)) {}
+
+HostServer::~HostServer() = default;
+
+}  // namespace skein

@@ -1,0 +1,70 @@
+# What crosses the socket between skein-host and the command line. Names, paths and
+# identifiers are bytes, never text. A null pointer is nil; an empty one is empty.
+@0xd3a1f2c4b5968778;
+
+using Cxx = import "/capnp/c++.capnp";
+$Cxx.namespace("skein::wire");
+
+using Daemon = import "daemon.capnp";
+
+struct Target {
+  isIdentifier @0 :Bool;
+  text @1 :Data;
+}
+
+struct HostItem {
+  item @0 :Daemon.Item;
+  path @1 :Data;
+  url @2 :Data;
+}
+
+struct Change {
+  kind @0 :UInt8;
+  identifier @1 :Data;
+  filename @2 :Data;
+  previousFilename @3 :Data;
+  item @4 :Daemon.Item;
+}
+
+struct HostStatus {
+  daemon @0 :Daemon.Status;
+  processID @1 :Int64;
+  watchedContainers @2 :UInt64;
+  debugLog @3 :Bool;
+}
+
+struct HostDifference {
+  kind @0 :UInt8;
+  path @1 :Data;
+  detail @2 :Data;
+}
+
+interface Host {
+  list @0 (container :Target, order :UInt8) -> (listing :Listing, error :Daemon.Error);
+  item @1 (target :Target) -> (item :HostItem, error :Daemon.Error);
+  identifierForPath @2 (path :Data) -> (identifier :Data, error :Daemon.Error);
+  pathForIdentifier @3 (identifier :Data) -> (path :Data, error :Daemon.Error);
+  watch @4 (container :Target) -> (watch :Watch, error :Daemon.Error);
+  changesSince @5 (token :Data)
+      -> (updates :List(Daemon.Item), deletions :List(Data), token :Data, moreComing :Bool,
+          error :Daemon.Error);
+  account @6 () -> (account :Daemon.Account, error :Daemon.Error);
+  logIn @7 (account :Daemon.Account) -> (error :Daemon.Error);
+  logOut @8 () -> (error :Daemon.Error);
+  status @9 () -> (status :HostStatus, error :Daemon.Error);
+  check @10 () -> (check :Check, error :Daemon.Error);
+  setDebugLog @11 (enabled :Bool) -> (error :Daemon.Error);
+}
+
+# Streams: each ends when its last reference goes. next may be called again before the
+# answer to the call before came; that is what keeps a listing flowing.
+interface Listing {
+  next @0 () -> (items :List(Daemon.Item), last :Bool, error :Daemon.Error);
+}
+interface Watch {
+  next @0 () -> (changes :List(Change), error :Daemon.Error);
+}
+interface Check {
+  next @0 () -> (differences :List(HostDifference), folders :UInt64, items :UInt64,
+                 finished :Bool, error :Daemon.Error);
+}
