@@ -1,1 +1,55 @@
-int main() { return 0; }
+// skein: the drive's command line. Reads the arguments and runs one command.
+#include <unistd.h>
+
+#include <csignal>
+#include <cstdlib>
+#include <cstring>
+
+#include "linux/cli/Commands.h"
+#include "linux/cli/ExitCodes.h"
+
+namespace {
+
+// Nothing is left behind: what a command began in skein-host ends with its connection.
+void interrupted(int) { _exit(skein::cli::kInterrupted); }
+
+constexpr char kFooter[] =
+    R"(Paths begin at the drive's root: / is the drive's folder. Each command has its own --help.
+
+Example: skein --store ~/Documents ls -l /
+
+Exit codes: 0 success, 1 failure, 2 usage, 3 no such item, 4 not authenticated,
+5 unreachable, 6 collision, 7 quota, 130 interrupted.)";
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  using namespace skein::cli;
+  std::signal(SIGINT, interrupted);
+  std::signal(SIGPIPE, SIG_IGN);
+
+  CLI::App app("The command line of a Skein drive.", "skein");
+  Invocation invocation;
+  if (const char* store = std::getenv("SKEIN_STORE")) invocation.drive.store = store;
+  app.set_version_flag("--version", std::string("skein ") + SKEIN_VERSION);
+  app.add_option("--store", invocation.drive.store,
+                 "The drive's folder (SKEIN_STORE, or ~/Skein if not given)");
+  app.require_subcommand(1);
+  app.fallthrough();
+  app.footer(kFooter);
+  addListCommand(app, invocation);
+  addItemCommands(app, invocation);
+  addChangeCommands(app, invocation);
+  addAccountCommand(app, invocation);
+  addStatusCommands(app, invocation);
+  addLogCommand(app, invocation);
+  addProcessCommands(app, invocation);
+  try {
+    app.parse(argc, argv);
+  } catch (const CLI::ParseError& error) {
+    if (error.get_exit_code() == 0) return app.exit(error);  // help, or the version
+    complain(std::string(error.what()) + "; see: skein --help");
+    return kUsage;
+  }
+  return invocation.run();
+}

@@ -1,0 +1,95 @@
+#include "linux/cli/ExitCodes.h"
+
+#include <cstdint>
+#include <string_view>
+
+#include "platform/fileprovider/NSFileProviderError.h"
+#include "vellum/VLErrors.h"
+
+namespace skein::cli {
+namespace {
+
+struct Meaning {
+  std::string_view domain;
+  std::int64_t code;
+  ExitCode exitCode;
+  std::string_view cause;  // when the error brings no text of its own
+  std::string_view nextStep;
+};
+
+constexpr std::string_view kLogIn = "log in with: skein account login";
+constexpr std::string_view kTryAgain = "try again, or end the drive's processes with: skein stop";
+
+constexpr Meaning kMeanings[] = {
+    {NSFileProviderErrorDomain, NSFileProviderErrorNotAuthenticated, kNotAuthenticated,
+     "nobody is logged in", kLogIn},
+    {NSFileProviderErrorDomain, NSFileProviderErrorFilenameCollision, kCollision,
+     "an item of this name is there already", "choose another name"},
+    {NSFileProviderErrorDomain, NSFileProviderErrorSyncAnchorExpired, kFailure,
+     "the token is too old, its changes are no longer kept",
+     "start again with: skein changes --since initial"},
+    {NSFileProviderErrorDomain, NSFileProviderErrorInsufficientQuota, kQuota,
+     "there is no room left in the account", "delete something, or get more room"},
+    {NSFileProviderErrorDomain, NSFileProviderErrorServerUnreachable, kUnreachable,
+     "the server cannot be reached", "try again later"},
+    {NSFileProviderErrorDomain, NSFileProviderErrorNoSuchItem, kNoSuchItem, "there is no such item",
+     "see what is there with: skein ls /"},
+    {NSCocoaErrorDomain, NSFileNoSuchFileError, kNoSuchItem, "there is no such item",
+     "see what is there with: skein ls /"},
+    {NSCocoaErrorDomain, NSFileWriteFileExistsError, kCollision,
+     "an item of this name is there already", "choose another name"},
+    {NSCocoaErrorDomain, NSFeatureUnsupportedError, kFailure, "this is not supported",
+     "see what is with: skein --help"},
+    {NSCocoaErrorDomain, NSUbiquitousFileNotUploadedDueToQuotaError, kQuota,
+     "there is no room left in the account", "delete something, or get more room"},
+    {NSCocoaErrorDomain, NSUbiquitousFileUbiquityServerNotAvailable, kUnreachable,
+     "the server cannot be reached", "try again later"},
+    {VLVellumErrorDomain, VLVellumErrorNotAuthenticated, kNotAuthenticated, "nobody is logged in",
+     kLogIn},
+    {VLVellumErrorDomain, VLVellumErrorInvalidParameter, kUsage, "an argument is not valid",
+     "paths begin at the drive's root, such as /Documents, and have no \".\" or \"..\""},
+    {VLVellumErrorDomain, VLVellumErrorDaemonUnreachable, kUnreachable,
+     "the drive's processes cannot be reached", kTryAgain},
+};
+
+const Meaning* meaningOf(const NSErrorPtr& error) {
+  for (const Meaning& meaning : kMeanings) {
+    if (error->domain() == meaning.domain && error->code() == meaning.code) return &meaning;
+  }
+  return nullptr;
+}
+
+const Meaning* firstMeaningOf(const NSErrorPtr& error) {
+  for (NSErrorPtr at = error; at; at = at->underlyingError()) {
+    if (const Meaning* meaning = meaningOf(at)) return meaning;
+  }
+  return nullptr;
+}
+
+std::string describedBy(const NSErrorPtr& error) {
+  for (NSErrorPtr at = error; at; at = at->underlyingError()) {
+    if (std::string text = at->localizedDescription(); !text.empty()) return text;
+  }
+  return {};
+}
+
+}  // namespace
+
+ExitCode exitCodeFor(const NSErrorPtr& error) {
+  if (!error) return kSuccess;
+  const Meaning* meaning = firstMeaningOf(error);
+  return meaning != nullptr ? meaning->exitCode : kFailure;
+}
+
+std::string textFor(const NSErrorPtr& error) {
+  const Meaning* meaning = firstMeaningOf(error);
+  std::string cause = describedBy(error);
+  while (!cause.empty() && (cause.back() == '.' || cause.back() == ' ')) cause.pop_back();
+  if (cause.empty() && meaning != nullptr) cause = meaning->cause;
+  if (cause.empty()) cause = error->domain() + " " + std::to_string(error->code());
+  return cause + "; " +
+         std::string(meaning != nullptr ? meaning->nextStep
+                                        : "the log may say more: skein log -n 20");
+}
+
+}  // namespace skein::cli

@@ -1,0 +1,88 @@
+#pragma once
+
+#include <chrono>
+#include <memory>
+#include <optional>
+#include <string>
+#include <tuple>
+#include <utility>
+
+#include "base/Mutex.h"
+#include "base/ThreadPool.h"
+#include "linux/protocol/DrivePaths.h"
+#include "linux/protocol/HostClient.h"
+
+namespace skein::cli {
+
+// The drive that a command is about: $SKEIN_STORE or --store, else ~/Skein.
+struct DriveChoice {
+  std::string store;  // as --store gave it; may be empty
+
+  // Stores an error that says what to do when there is no such drive.
+  DrivePaths paths(NSErrorOut error) const;
+};
+
+// An answer that a command waits for.
+template <class... Values>
+class Awaited {
+ public:
+  // What to give the service. Once.
+  Reply<Values..., NSErrorPtr> reply() {
+    return [state = _state](Values... values, NSErrorPtr error) {
+      MutexLock lock(state->mutex);
+      state->values = std::tuple<Values..., NSErrorPtr>(std::move(values)..., std::move(error));
+      state->came.notifyAll();
+    };
+  }
+
+  std::tuple<Values..., NSErrorPtr> wait() {
+    MutexLock lock(_state->mutex);
+    while (!_state->values) _state->came.wait(_state->mutex);
+    return std::move(*_state->values);
+  }
+
+  // Nothing when the moment passed first.
+  std::optional<std::tuple<Values..., NSErrorPtr>> waitUntil(
+      std::optional<std::chrono::steady_clock::time_point> moment) {
+    if (!moment) return wait();
+    MutexLock lock(_state->mutex);
+    while (!_state->values) {
+      if (!_state->came.waitUntil(_state->mutex, *moment) && !_state->values) return std::nullopt;
+    }
+    return std::move(*_state->values);
+  }
+
+ private:
+  struct State {
+    Mutex mutex;
+    CondVar came;
+    std::optional<std::tuple<Values..., NSErrorPtr>> values SKEIN_GUARDED_BY(mutex);
+  };
+  std::shared_ptr<State> _state = std::make_shared<State>();
+};
+
+// A command's connection to the drive's skein-host, which is started when it does not run.
+class Session {
+ public:
+  // Null with an error: no such drive.
+  static std::unique_ptr<Session> open(const DriveChoice& drive, NSErrorOut error);
+
+  HostService& host() { return *_host; }
+
+ private:
+  explicit Session(const DrivePaths& paths);
+
+  const std::shared_ptr<RpcLoop> _loop;
+  const std::shared_ptr<Executor> _executor;
+  const std::shared_ptr<HostService> _host;
+};
+
+// Calls start(reply) and waits for the answer.
+template <class... Values, class Start>
+std::tuple<Values..., NSErrorPtr> await(Start start) {
+  Awaited<Values...> answer;
+  start(answer.reply());
+  return answer.wait();
+}
+
+}  // namespace skein::cli
