@@ -20,7 +20,7 @@ VLFileProviderExtension::VLFileProviderExtension(Environment& environment)
 
 std::shared_ptr<VLFileProviderExtension> VLFileProviderExtension::init(
     std::shared_ptr<const NSExtensionAttributes> attributes, Environment& environment) {
-  const std::shared_ptr<VLFileProviderExtension> self(new VLFileProviderExtension(environment));
+  std::shared_ptr<VLFileProviderExtension> self(new VLFileProviderExtension(environment));
   if (!self->NSFileProviderExtension::init(std::move(attributes))) return nullptr;
 
   self->_operationQueue = std::make_shared<NSOperationQueue>(environment.executor);
