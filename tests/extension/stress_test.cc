@@ -1,60 +1,22 @@
 // One folder's enumerator under real threads: pushes, change requests, listings, broken
 // links, notifications and invalidation at once. A host that follows the rules must end
 // with what the store holds.
-#include <chrono>
 #include <map>
 #include <set>
 #include <thread>
 
-#include "base/ThreadPool.h"
 #include "tests/extension/FolderFixture.h"
+#include "tests/support/CountingPool.h"
 #include "vellum/VLErrors.h"
 
 namespace skein {
 namespace {
 
-constexpr auto kDeadline = std::chrono::seconds(60);
 constexpr int kPushers = 3;
 constexpr int kActors = kPushers + 3;
 constexpr int kPushes = 800;
 constexpr std::uint64_t kItemsPerPusher = 40;
 constexpr int kFloodEvery = 200;  // one push in so many passes the cap
-
-// A pool that can be waited for until it has nothing to do.
-class CountingPool final : public Executor {
- public:
-  void post(Task task) override {
-    count(+1);
-    _pool.post([this, task = std::move(task)]() mutable {
-      task();
-      task = nullptr;
-      count(-1);
-    });
-  }
-  void beginWait() override { _pool.beginWait(); }
-  void endWait() override { _pool.endWait(); }
-
-  bool waitIdle() {
-    const auto deadline = std::chrono::steady_clock::now() + kDeadline;
-    MutexLock lock(_mutex);
-    while (_outstanding > 0) {
-      if (!_idle.waitUntil(_mutex, deadline)) return _outstanding == 0;
-    }
-    return true;
-  }
-
- private:
-  void count(int change) {
-    MutexLock lock(_mutex);
-    _outstanding += change;
-    if (_outstanding == 0) _idle.notifyAll();
-  }
-
-  Mutex _mutex;
-  CondVar _idle;
-  int _outstanding SKEIN_GUARDED_BY(_mutex) = 0;
-  ThreadPool _pool{8, "stress"};
-};
 
 // What the store holds: the version of each live item.
 class Store {
@@ -152,7 +114,7 @@ void pushAll(VLFileEnumerator& enumerator, Store& store, std::uint64_t pusher) {
 
 TEST(Stress, AHostEndsWithWhatTheStoreHolds) {
   for (int repeat = 0; repeat < 3; ++repeat) {
-    const auto pool = std::make_shared<CountingPool>();
+    const auto pool = std::make_shared<CountingPool>(8);
     TestEnvironment env(pool);
     env.log.setEnabled(LogType::Debug, false);
     ScriptedFramework& framework = env.framework;

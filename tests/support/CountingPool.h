@@ -1,6 +1,7 @@
 #pragma once
 
 #include <chrono>
+#include <cstddef>
 #include <utility>
 
 #include "base/Mutex.h"
@@ -11,6 +12,8 @@ namespace skein {
 // Real threads that can be waited for until they have nothing to do.
 class CountingPool final : public Executor {
  public:
+  explicit CountingPool(std::size_t width = 4) : _pool(width, "tests") {}
+
   void post(Task task) override SKEIN_EXCLUDES(_mutex) {
     count(+1);
     _pool.post([this, task = std::move(task)]() mutable {
@@ -42,7 +45,7 @@ class CountingPool final : public Executor {
   Mutex _mutex;
   CondVar _idle;
   int _outstanding SKEIN_GUARDED_BY(_mutex) = 0;
-  ThreadPool _pool{4, "tests"};
+  ThreadPool _pool;
 };
 
 }  // namespace skein
