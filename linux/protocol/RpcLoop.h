@@ -35,15 +35,12 @@ class RpcLoop : public std::enable_shared_from_this<RpcLoop> {
   // The thread's event loop, timer and sockets; on its own thread only.
   RpcIo& io();
 
-  // Makes `object` shared among threads while its destructor runs on the loop's thread.
+  // Makes `object` shared among threads while its destructor runs on the loop's thread,
+  // as a task of its own: an object may lose its last reference inside its own promise.
   template <class T>
   std::shared_ptr<T> own(std::unique_ptr<T> object) {
     return std::shared_ptr<T>(object.release(), [loop = shared_from_this()](T* dying) {
-      if (loop->isCurrent()) {
-        delete dying;
-      } else {
-        loop->post([dying] { delete dying; });
-      }
+      loop->post([dying] { delete dying; });
     });
   }
 

@@ -17,6 +17,7 @@ namespace {
 
 // How long a peer that let a deadline pass has to answer a probe.
 constexpr auto kProbeTime = 500 * kj::MILLISECONDS;
+constexpr auto kBetweenConnects = 10 * kj::MILLISECONDS;
 // How often a peer is probed while it takes its time.
 constexpr auto kBetweenProbes = 500 * kj::MILLISECONDS;
 
@@ -130,13 +131,18 @@ kj::Promise<void> SocketClient::Core::connected() {
 kj::Promise<void> SocketClient::Core::connect() {
   int code = 0;
   connectNow(code);
-  if (code != 0 && options.program && (code == ENOENT || code == ECONNREFUSED)) {
+  if (options.program && (code == ENOENT || code == ECONNREFUSED)) {
     return startProgramAndConnect();
+  }
+  // Too many wait to be accepted; as long as somebody waits here, it is tried again.
+  if (code == EAGAIN && !messages.empty()) {
+    return loop->io().timer.afterDelay(kBetweenConnects).then([this] { return connect(); });
   }
   return kj::READY_NOW;
 }
 
 void SocketClient::Core::connectNow(int& code) {
+  if (closed) return;
   FileDescriptor socket = connectToUnixSocket(options.socketPath, code);
   if (!socket) {
     const bool notThere = code == ENOENT || code == ECONNREFUSED;
@@ -172,7 +178,6 @@ kj::Promise<void> SocketClient::Core::startProgramAndConnect() {
   });
   return paf.promise.then([this, result] {
     int code = 0;
-    if (closed) return;
     if (*result) {
       lastError = *result;
     } else {

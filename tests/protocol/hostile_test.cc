@@ -31,12 +31,6 @@ std::string bootstrapMessage(std::uint32_t question) {
   return flat(message);
 }
 
-std::string finishMessage(std::uint32_t question) {
-  capnp::MallocMessageBuilder message;
-  message.initRoot<capnp::rpc::Message>().initFinish().setQuestionId(question);
-  return flat(message);
-}
-
 // A listing, called on the bootstrap object that question 0 asked for.
 std::string listMessage(std::uint32_t question) {
   capnp::MallocMessageBuilder message;
@@ -51,9 +45,10 @@ std::string listMessage(std::uint32_t question) {
 
 class Hostile : public ProtocolTest {
  protected:
-  FileDescriptor connectRaw() const {
+  FileDescriptor connectRaw() {
     int code = 0;
     FileDescriptor socket = connectToUnixSocket(socketPath, code);
+    for (; code == EAGAIN; socket = connectToUnixSocket(socketPath, code)) expectServed();
     EXPECT_TRUE(socket) << code;
     return socket;
   }
@@ -152,11 +147,12 @@ TEST_F(Hostile, AnswersThatAreNeverReadStopTheReading) {
   daemon->items.assign(200, std::make_shared<const VLQueryItem>(properties));
   const FileDescriptor socket = connectRaw();
   sendSome(socket, bootstrapMessage(0));
-  floodUntilNotRead(socket, [](std::uint32_t question) {
-    return listMessage(question) + finishMessage(question);
-  });
+  floodUntilNotRead(socket, listMessage);
   // 4 MiB may wait, and what was in flight when they did.
-  EXPECT_LT(daemon->asked.count(), 2000U);
+  std::size_t served = 0;
+  while (daemon->asked.count() > 0) served += daemon->asked.take()->starts_with("items") ? 1 : 0;
+  EXPECT_LT(served, 2000U);
+  EXPECT_GT(served, 20U);
 }
 
 TEST_F(Hostile, QuestionsThatAreNeverFinishedCloseTheConnection) {
