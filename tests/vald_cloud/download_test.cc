@@ -74,31 +74,34 @@ TEST_F(DownloadTest, ProgressGrowsToTheWholeAndTheBandwidthIsKept) {
 TEST_F(DownloadTest, CancellingAnswersAtOnceAndLeavesNothing) {
   const std::string path = evicted(1);
   rig.conditions.change([](auto& settings) { settings.delay = std::chrono::hours(1); });
-  for (int round = 0; round < 2; ++round) {
-    Answer answer;
-    Downloader downloader(rig.places(), rig.conditions, rig.clock, threads);
-    const auto ticket = downloader.download(request(1, path, answer));
-    ASSERT_TRUE(rig.clock.waitForTimer());
-    if (round == 0) {
-      ticket->cancel();
-      EXPECT_EQ(answer.error, "NSCocoaErrorDomain 3072");
-      EXPECT_EQ(rig.names(), std::vector<std::string>{".1.skein"});
-      ticket->cancel();
-    }
-    // In the second round the downloader goes while it waits.
-    const auto left =
-        std::make_unique<Downloader>(rig.places(), rig.conditions, rig.clock, threads);
-    Answer second;
-    if (round == 1) left->download(request(1, path, second));
-    if (round == 1) {
-      // The first one's part stands in its way, and is not touched.
-      ASSERT_TRUE(second.came.wait());
-      EXPECT_EQ(second.error, "NSCocoaErrorDomain 516");
-      ticket->cancel();
-    }
-    EXPECT_EQ(answer.times, 1);
-    rig.clock.advance(std::chrono::hours(2));
-  }
+  auto downloader = std::make_unique<Downloader>(rig.places(), rig.conditions, rig.clock, threads);
+  Answer cancelled;
+  const auto ticket = downloader->download(request(1, path, cancelled));
+  ASSERT_TRUE(rig.clock.waitForTimer());
+  ticket->cancel();
+  EXPECT_EQ(cancelled.error, "NSCocoaErrorDomain 3072");
+  EXPECT_EQ(rig.names(), std::vector<std::string>{".1.skein"});
+  ticket->cancel();
+  EXPECT_EQ(cancelled.times, 1);
+  rig.clock.advance(std::chrono::hours(2));
+
+  // Somebody else's file where the part would be is not touched.
+  const std::string other = rig.write(".1.skein-part", "somebody's own");
+  Answer refused;
+  downloader->download(request(1, path, refused));
+  ASSERT_TRUE(refused.came.wait());
+  EXPECT_EQ(refused.error, "NSCocoaErrorDomain 516");
+  EXPECT_EQ(contentsOf(other), "somebody's own");
+  std::filesystem::remove(other);
+
+  // The downloader goes while it waits.
+  Answer left;
+  const auto late = downloader->download(request(1, path, left));
+  ASSERT_TRUE(rig.clock.waitForTimer());
+  downloader.reset();
+  EXPECT_EQ(left.error, "NSCocoaErrorDomain 3072");
+  late->cancel();
+  EXPECT_EQ(left.times, 1);
   EXPECT_EQ(rig.names(), std::vector<std::string>{".1.skein"});
 }
 

@@ -132,6 +132,13 @@ NSErrorPtr CloudDatabase::transact(const std::function<NSErrorPtr()>& body) {
   return error;
 }
 
+NSErrorPtr CloudDatabase::withoutWaiting(const std::function<NSErrorPtr()>& body) {
+  if (NSErrorPtr error = execute("PRAGMA synchronous=NORMAL")) return error;
+  NSErrorPtr error = body();
+  NSErrorPtr restored = execute("PRAGMA synchronous=FULL");
+  return error != nullptr ? error : restored;
+}
+
 NSErrorPtr CloudDatabase::execute(const char* sql) {
   return sqlite3_exec(_database, sql, nullptr, nullptr, nullptr) == SQLITE_OK
              ? nullptr

@@ -68,6 +68,9 @@ class CloudDatabase {
   // Runs `body` and commits, or undoes all of it when it answers an error.
   NSErrorPtr transact(const std::function<NSErrorPtr()>& body);
   NSErrorPtr execute(const char* sql);
+  // Runs `body` without waiting for the disk: what it commits is durable with the next
+  // commit that is. For what is found again when a power cut loses it.
+  NSErrorPtr withoutWaiting(const std::function<NSErrorPtr()>& body);
   std::int64_t lastInsertedRow() const;
 
  private:

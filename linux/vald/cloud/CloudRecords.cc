@@ -206,7 +206,8 @@ Outcome<std::optional<UploadStamp>> CloudRecords::stamp(VLFileObjectID document)
 NSErrorPtr CloudRecords::setStamp(VLFileObjectID document,
                                   const std::optional<UploadStamp>& stamp) {
   MutexLock lock(_mutex);
-  return writeStamp(document, stamp);
+  return _database->withoutWaiting(
+      [&]() SKEIN_NO_THREAD_SAFETY_ANALYSIS { return writeStamp(document, stamp); });
 }
 
 NSErrorPtr CloudRecords::writeStamp(VLFileObjectID document,
@@ -251,7 +252,9 @@ Outcome<CloudRecords::Work> CloudRecords::beginWork(const std::string& path) {
 
 NSErrorPtr CloudRecords::endWork(const Work& work) {
   MutexLock lock(_mutex);
-  return _database->prepare("DELETE FROM work WHERE number = ?")->bind(1, work.number).run();
+  return _database->withoutWaiting([&]() SKEIN_NO_THREAD_SAFETY_ANALYSIS {
+    return _database->prepare("DELETE FROM work WHERE number = ?")->bind(1, work.number).run();
+  });
 }
 
 Outcome<std::vector<CloudRecords::Work>> CloudRecords::unfinishedWork() {

@@ -67,6 +67,7 @@ class CloudRecords {
 
   // The file as which the document was uploaded; nil while it is evicted, too.
   Outcome<std::optional<UploadStamp>> stamp(VLFileObjectID document) SKEIN_EXCLUDES(_mutex);
+  // A power cut may lose it: the document is then looked at again.
   NSErrorPtr setStamp(VLFileObjectID document, const std::optional<UploadStamp>& stamp)
       SKEIN_EXCLUDES(_mutex);
 
@@ -79,6 +80,7 @@ class CloudRecords {
     std::string path;  // of the document
   };
   Outcome<Work> beginWork(const std::string& path) SKEIN_EXCLUDES(_mutex);
+  // A power cut may lose it: recovery then finds nothing to do.
   NSErrorPtr endWork(const Work& work) SKEIN_EXCLUDES(_mutex);
   Outcome<std::vector<Work>> unfinishedWork() SKEIN_EXCLUDES(_mutex);
 
