@@ -1,0 +1,219 @@
+// How a container is watched: the order of what is asked, and what the watchers hear.
+#include "linux/host/WatchEvents.h"
+
+#include <algorithm>
+
+#include "tests/host/HostFixture.h"
+
+namespace skein {
+namespace {
+
+TEST_F(HostTest, AnchorIsReadBeforeTheListing) {
+  const auto subscription = host->watch("i1", watcher);
+  EXPECT_EQ(calls(), (Words{"open i1", "anchor", "list start"}));
+  enumerator().givePage({item(1, "one")}, "p2");
+  EXPECT_EQ(calls(), (Words{"list p2"}));
+  enumerator().givePage({item(2, "two")});
+  EXPECT_EQ(calls(), (Words{"changes a0"}));
+  EXPECT_EQ(watcher->take(), Words{});
+
+  // What the listing showed already is no change; what came during it is.
+  enumerator().giveChanges({item(2, "two")}, {}, "a0.1");
+  run();
+  EXPECT_EQ(watcher->take(), (Words{"begin"}));
+  signal();
+  EXPECT_EQ(calls(), (Words{"changes a0.1"}));
+  enumerator().giveChanges({item(2, "two", 5), item(3, "three"), item(1, "uno")}, {}, "a0.2");
+  run();
+  EXPECT_EQ(watcher->take(), (Words{"~two", "+three", "~uno was one"}));
+  signal();
+  EXPECT_EQ(calls(), (Words{"changes a0.2"}));
+  enumerator().giveChanges({}, {idOf(3), idOf(9)}, "a0.3", true);
+  EXPECT_EQ(calls(), (Words{"changes a0.3"}));
+  EXPECT_EQ(watcher->take(), (Words{"-three"}));
+}
+
+TEST_F(HostTest, SignalsCoalesceAndNoneIsLost) {
+  const auto subscription = watchLive(watcher, {});
+  signal();
+  signal();
+  signal();
+  EXPECT_EQ(calls(), (Words{"changes a0"}));
+  // During the round: one more round, however many there were.
+  signal();
+  run();
+  signal();
+  EXPECT_EQ(calls(), Words{});
+  enumerator().giveChanges({item(1, "one")}, {}, "a0.1");
+  EXPECT_EQ(calls(), (Words{"changes a0.1"}));
+  enumerator().giveChanges({}, {}, "a0.1");
+  EXPECT_EQ(calls(), Words{});
+}
+
+TEST_F(HostTest, SignalOfAnUnknownContainerAnswersAnError) {
+  std::vector<std::int64_t> codes;
+  const auto note = [&](const NSErrorPtr& error) { codes.push_back(error ? error->code() : 0); };
+  host->signalEnumeratorForContainerItemIdentifier("i9", note);
+  host->signalEnumeratorForContainerItemIdentifier(NSFileProviderRootContainerItemIdentifier, note);
+  EXPECT_TRUE(codes.empty());  // never inside the call
+  run();
+  EXPECT_EQ(codes, (std::vector<std::int64_t>{NSFileProviderErrorNoSuchItem, 0}));
+}
+
+TEST_F(HostTest, ExpiryIsFollowedByAListingAndTheDifference) {
+  const auto subscription =
+      watchLive(watcher, {item(1, "one"), item(2, "two"), item(3, "three"), item(4, "four")});
+  signal();
+  run();
+  enumerator().anchor = "b0";
+  enumerator().failChanges(expired());
+  EXPECT_EQ(calls(), (Words{"changes a0", "anchor", "list start"}));
+  enumerator().givePage({item(1, "one"), item(2, "zwei"), item(3, "three", 7), item(5, "five")});
+  run();
+  EXPECT_EQ(watcher->take(), Words{});
+  // The round after the listing counts before anything is told.
+  enumerator().giveChanges({item(5, "five", 1)}, {idOf(1)}, "b0.1");
+  run();
+  auto heard = watcher->take();
+  std::sort(heard.begin(), heard.end());
+  EXPECT_EQ(heard, (Words{"+five", "-four", "-one", "~three", "~zwei was two"}));
+  signal();
+  EXPECT_EQ(calls(), (Words{"changes b0", "changes b0.1"}));
+}
+
+TEST_F(HostTest, EndlessExpiryPausesInsteadOfSpinning) {
+  const auto subscription = watchLive(watcher, {item(1, "one")});
+  signal();
+  for (int i = 0; i < 3; ++i) {
+    run();
+    enumerator().failChanges(expired());
+    run();
+    enumerator().givePage({item(1, "one")});
+  }
+  run();
+  extension->calls.clear();
+  enumerator().failChanges(expired());
+  EXPECT_EQ(calls(), (Words{"invalidate"}));
+  timers->advance(std::chrono::milliseconds(200));
+  EXPECT_EQ(calls(), (Words{"open i1", "anchor", "list start"}));
+  EXPECT_EQ(watcher->take(), Words{});
+}
+
+TEST_F(HostTest, WatchersShareAnEnumeratorUntilTheLastLeaves) {
+  const auto second = std::make_shared<Watcher>();
+  auto first = watchLive(watcher, {item(1, "one")});
+  auto other = host->watch("i1", second);
+  EXPECT_EQ(calls(), Words{});
+  EXPECT_EQ(second->take(), (Words{"begin"}));
+  signal();
+  run();
+  enumerator().giveChanges({item(2, "two")}, {}, "a0.1");
+  first.reset();
+  EXPECT_EQ(calls(), (Words{"changes a0"}));
+  EXPECT_EQ(second->take(), (Words{"+two"}));
+  other.reset();
+  EXPECT_EQ(calls(), (Words{"invalidate"}));
+  EXPECT_EQ(host->watchedContainers(), 0U);
+  // A later watcher begins anew.
+  const auto third = host->watch("i1", std::make_shared<Watcher>());
+  EXPECT_EQ(calls(), (Words{"open i1", "anchor", "list start"}));
+}
+
+TEST_F(HostTest, TheWatchSurvivesADaemonThatDies) {
+  const auto subscription = watchLive(watcher, {item(1, "one"), item(2, "two")});
+  signal();
+  run();
+  enumerator().failChanges(vl_errorDaemonUnreachable("vald closed the connection"));
+  EXPECT_EQ(calls(), (Words{"changes a0", "invalidate"}));
+  EXPECT_EQ(watcher->take(), Words{});
+
+  extension->error = vl_errorDaemonUnreachable("vald does not run");
+  timers->advance(std::chrono::milliseconds(100));
+  EXPECT_EQ(calls(), (Words{"open i1"}));
+  extension->error = nullptr;
+  timers->advance(std::chrono::milliseconds(200));
+  EXPECT_EQ(calls(), (Words{"open i1", "anchor", "list start"}));
+  enumerator(1).givePage({item(2, "two"), item(3, "three")});
+  run();
+  enumerator(1).giveChanges({}, {}, "a1");
+  run();
+  EXPECT_EQ(watcher->take(), (Words{"-one", "+three"}));
+}
+
+TEST_F(HostTest, LogoutAndDeletionEndTheWatch) {
+  auto subscription = watchLive(watcher, {item(1, "one")});
+  signal();
+  run();
+  enumerator().failChanges(
+      NSError::errorWithDomain(NSFileProviderErrorDomain, NSFileProviderErrorNotAuthenticated));
+  run();
+  EXPECT_EQ(watcher->take(), (Words{"end -1000"}));
+  subscription.reset();
+  run();
+
+  const auto again = std::make_shared<Watcher>();
+  const auto other = host->watch("i1", again);
+  run();
+  enumerator(1).givePage({});
+  run();
+  enumerator(1).giveChanges({}, {"i1"}, "a1.1");
+  run();
+  EXPECT_EQ(again->take(), (Words{"begin"}));
+  signal();
+  run();
+  enumerator(1).giveChanges({}, {"i1"}, "a1.2");
+  run();
+  EXPECT_EQ(again->take(), (Words{"end -1005"}));
+}
+
+TEST_F(HostTest, ALostAnswerFailsTheFirstWatchAndIsIgnoredWhenItComesLate) {
+  const auto subscription = host->watch("i1", watcher);
+  run();
+  timers->advance(std::chrono::milliseconds(4499));
+  run();
+  EXPECT_EQ(watcher->take(), Words{});
+  timers->advance(std::chrono::milliseconds(1));
+  run();
+  EXPECT_EQ(watcher->take(), (Words{"end " + std::to_string(VLVellumErrorDaemonUnreachable)}));
+  enumerator().givePage({item(1, "one")});
+  run();
+  EXPECT_EQ(watcher->take(), Words{});
+}
+
+HostChange change(HostChange::Kind kind, std::uint64_t id, std::string name) {
+  return {kind, idOf(id), std::move(name), std::nullopt,
+          kind == HostChange::Kind::Deleted ? nullptr : item(id, "x")};
+}
+
+// A consumer that takes late hears the sum of what happened, one change per item.
+TEST(WatchEvents, AreTheSumSinceTheLastTime) {
+  using Kind = HostChange::Kind;
+  WatchEvents events;
+  events.add(change(Kind::Created, 1, "came and went"));
+  events.add(change(Kind::Changed, 2, "two"));
+  events.add(change(Kind::Deleted, 1, "came and went"));
+  HostChange renamed = change(Kind::Changed, 2, "zwei");
+  renamed.previousFilename = "two";
+  events.add(renamed);
+  events.add(change(Kind::Deleted, 3, "three"));
+  events.add(change(Kind::Created, 3, "drei"));
+  events.add(change(Kind::Changed, 4, "four"));
+  events.add(change(Kind::Deleted, 4, "four"));
+
+  const auto first = events.take(2);
+  ASSERT_EQ(first.size(), 2U);
+  EXPECT_EQ(first[0].kind, Kind::Changed);
+  EXPECT_EQ(first[0].filename, "zwei");
+  EXPECT_EQ(first[0].previousFilename, "two");
+  EXPECT_EQ(first[1].kind, Kind::Changed);
+  EXPECT_EQ(first[1].previousFilename, "three");
+  events.add(change(Kind::Changed, 2, "zwei"));
+  const auto rest = events.take(10);
+  ASSERT_EQ(rest.size(), 2U);
+  EXPECT_EQ(rest[0].kind, Kind::Deleted);
+  EXPECT_EQ(rest[1].filename, "zwei");
+  EXPECT_TRUE(events.empty());
+}
+
+}  // namespace
+}  // namespace skein
