@@ -41,8 +41,7 @@ int logIn(HostService& host, const LoginOptions& options) {
     account.name = user != nullptr && *user != '\0' ? user : "me";
   }
   if (!options.noAppID) account.perAppAccountIdentifier = account.name + "@skein";
-  const auto [error] =
-      await<>([&](auto reply) { host.logIn(std::move(account), std::move(reply)); });
+  const auto [error] = await<>([&](auto reply) { host.logIn(account, std::move(reply)); });
   return error ? complainAbout(error) : kSuccess;
 }
 

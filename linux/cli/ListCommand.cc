@@ -66,21 +66,32 @@ class Lister {
   }
 
   int list(const Folder& folder) {
+    const auto begin = std::chrono::steady_clock::now();
+    bool any = false;
+    NSErrorPtr error = listOnce(folder, any);
+    // What was shown cannot be taken back, so only a listing that has not begun is tried again.
+    if (!any && isWorthAnotherTry(error, begin)) error = listOnce(folder, any);
+    return error ? fail(error) : kSuccess;
+  }
+
+  // Null, or why it ended; `any` is set with the first page.
+  NSErrorPtr listOnce(const Folder& folder, bool& any) {
     auto [listing, error] = await<std::shared_ptr<HostListing>>([&](auto reply) {
       _host.list(folder.target, _options.sort == "date" ? HostOrder::Date : HostOrder::Name,
                  std::move(reply));
     });
-    if (error) return fail(error);
+    if (error) return error;
     std::deque<Awaited<NSFileProviderItems, bool>> underWay;
     for (;;) {
       while (underWay.size() < kPagesUnderWay) listing->next(underWay.emplace_back().reply());
       const auto [items, last, problem] = underWay.front().wait();
       underWay.pop_front();
-      if (problem) return fail(problem);
+      if (problem) return problem;
+      any = true;
       for (const NSFileProviderItemPtr& item : items) print(*item, folder.path);
       // What is there is shown while the rest comes.
       _output.flush();
-      if (last) return kSuccess;
+      if (last) return nullptr;
     }
   }
 

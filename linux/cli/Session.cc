@@ -5,6 +5,8 @@
 #include <cerrno>
 #include <cstdlib>
 
+#include "linux/cli/ExitCodes.h"
+
 namespace skein::cli {
 
 DrivePaths DriveChoice::paths(NSErrorOut error) const {
@@ -44,5 +46,11 @@ Session::Session(const DrivePaths& paths)
                                                                 {},
                                                                 std::chrono::milliseconds(4000)},
                                                  std::chrono::milliseconds(4000)})) {}
+
+bool isWorthAnotherTry(const NSErrorPtr& error, std::chrono::steady_clock::time_point begin) {
+  using namespace std::chrono_literals;
+  return error && exitCodeFor(error) == kUnreachable &&
+         std::chrono::steady_clock::now() - begin < 1s;
+}
 
 }  // namespace skein::cli

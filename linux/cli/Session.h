@@ -77,12 +77,26 @@ class Session {
   const std::shared_ptr<HostService> _host;
 };
 
+// Whether a question that began at `begin` and got `error` is worth asking once more: vald
+// or skein-host was about to end when it was asked, and will be started again. An error that
+// took long is an answer of its own.
+bool isWorthAnotherTry(const NSErrorPtr& error, std::chrono::steady_clock::time_point begin);
+
 // Calls start(reply) and waits for the answer.
 template <class... Values, class Start>
-std::tuple<Values..., NSErrorPtr> await(Start start) {
+std::tuple<Values..., NSErrorPtr> awaitOnce(Start& start) {
   Awaited<Values...> answer;
   start(answer.reply());
   return answer.wait();
+}
+
+// The same, with another try where that is worth it; `start` may be called twice.
+template <class... Values, class Start>
+std::tuple<Values..., NSErrorPtr> await(Start start) {
+  const auto begin = std::chrono::steady_clock::now();
+  auto answer = awaitOnce<Values...>(start);
+  if (isWorthAnotherTry(std::get<NSErrorPtr>(answer), begin)) answer = awaitOnce<Values...>(start);
+  return answer;
 }
 
 }  // namespace skein::cli

@@ -156,8 +156,9 @@ int runDoctor(HostService& host, bool json) {
   Progress progress;
   std::uint64_t found = 0;
   for (;;) {
-    const auto [step, problem] =
-        await<HostCheckStep>([&](auto reply) { check->next(std::move(reply)); });
+    Awaited<HostCheckStep> next;
+    check->next(next.reply());
+    const auto [step, problem] = next.wait();
     if (problem) {
       progress.clear();
       return complainAbout(problem);

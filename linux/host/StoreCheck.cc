@@ -50,8 +50,8 @@ int readFolder(const std::string& path, DiskEntries& entries) {
   return 0;
 }
 
-// The trash of a drive lies at its root and is no folder of documents.
-bool isTrash(const std::string& name) { return name == ".Trash" || name.starts_with(".Trash-"); }
+// A folder of what was thrown away is none of documents; vald leaves it out too.
+bool isTrash(const std::string& name) { return name.starts_with(".Trash-"); }
 
 std::string joined(const std::string& folder, const std::string& name) {
   return folder == "/" ? folder + name : folder + '/' + name;
@@ -253,7 +253,7 @@ class StoreCheck::Work final : public std::enable_shared_from_this<Work> {
       onDisk.erase(entry);
     }
     for (const auto& [name, entry] : onDisk) {
-      if (isRoot && isTrash(name)) continue;
+      if (isTrash(name)) continue;
       differences.push_back({HostDifference::Kind::MissingInListing, joined(folder.drivePath, name),
                              "on disk, but not listed"});
     }
