@@ -267,9 +267,11 @@ void StoreWriter::setDurability(bool isFull) {
                             : "PRAGMA synchronous = NORMAL; PRAGMA wal_autocheckpoint = 8000");
 }
 
-void StoreWriter::begin() {
+void StoreWriter::begin() { begin(!_isBulk); }
+
+void StoreWriter::begin(bool isFull) {
   if (_inTransaction) return;
-  setDurability(!_isBulk);
+  setDurability(isFull);
   _database->begin();
   _inTransaction = true;
   _transactionStart = std::chrono::steady_clock::now();
@@ -377,8 +379,9 @@ std::string StoreWriter::failure() const {
 }
 
 bool StoreWriter::setSetting(const std::string& key, const std::optional<std::string>& value) {
-  begin();
-  setDurability(true);
+  // Durability cannot change inside a transaction, so a bulk load's ends first.
+  if (!commit()) return false;
+  begin(true);
   _index.setSetting("value " + key, value);
   return commit();
 }

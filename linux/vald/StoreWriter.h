@@ -91,6 +91,7 @@ class StoreWriter {
 
   // Transactions.
   void begin();
+  void begin(bool isFull);
   void setDurability(bool isFull);
   void note(std::string failure) SKEIN_EXCLUDES(_mutex);
   bool commit();
