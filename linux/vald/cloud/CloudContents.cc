@@ -13,6 +13,7 @@
 
 #include "linux/vald/cloud/CloudErrors.h"
 #include "linux/vald/files/FileErrors.h"
+#include "linux/vald/files/FileNames.h"
 
 namespace skein::vald {
 namespace {
@@ -78,7 +79,7 @@ Outcome<std::unique_ptr<CloudContents>> CloudContents::open(const std::string& f
   if (!objects || !incoming) return fileError(errno, "can't open the cloud's folder", folder);
   for (const std::string& name : entries(incoming.get())) {
     if (const int code = files.unlink(incoming.get(), name)) {
-      return fileError(code, "can't remove", folder + "/incoming/" + name);
+      return fileError(code, "can't remove", joinPath(folder + "/incoming", name));
     }
   }
   if (const int code = files.sync(top.get())) return fileError(code, "can't make durable", folder);
