@@ -22,7 +22,8 @@ namespace skein {
 //                           framework.accounts(), framework.containers(), ...};
 class LocalFramework {
  public:
-  // The center has to outlive the framework. Nothing is sent until something is asked.
+  // The center has to outlive the framework and the work on the executor. Nothing is sent
+  // until something is asked.
   LocalFramework(std::shared_ptr<RpcLoop> loop, std::shared_ptr<Executor> executor,
                  NSNotificationCenter& notificationCenter, DaemonClient::Options options);
   // To reach the drive's vald, and to start it.

@@ -41,7 +41,7 @@ void ReceiverReference::receiveUpdates(const VLQueryItems& items,
                   logicalExtensions);
     codec::encode(request.initPhysicalExtensions(static_cast<unsigned>(physicalExtensions.size())),
                   physicalExtensions);
-    self->_service->tasks.add(request.send().ignoreResult().then(
+    self->_service->tasks->add(request.send().ignoreResult().then(
         [executor = self->_service->executor, reply = std::move(reply)]() mutable {
           executor->post([reply = std::move(reply)]() mutable { reply(); });
         }));
@@ -54,7 +54,7 @@ void ReceiverReference::receiveProgressUpdates(const VLQueryItems& updates, Repl
     ++self->_progressUnderWay;
     auto request = self->_client->receiveProgressUpdatesRequest();
     codec::encode(request.initItems(static_cast<unsigned>(updates.size())), updates);
-    self->_service->tasks.add(
+    self->_service->tasks->add(
         request.send().ignoreResult().then([self] { --self->_progressUnderWay; }));
   });
 }
@@ -63,7 +63,7 @@ void ReceiverReference::linkDidBreak(NSErrorPtr error) {
   _service->loop->post([self = shared_from_this(), error = std::move(error)] {
     auto request = self->_client->linkDidBreakRequest();
     codec::setError(static_cast<wire::Receiver::LinkDidBreakParams::Builder&>(request), error);
-    self->_service->tasks.add(request.send().ignoreResult());
+    self->_service->tasks->add(request.send().ignoreResult());
   });
 }
 
@@ -86,7 +86,7 @@ void EventsReference::sendAccount() {
   auto request = _client->accountDidChangeRequest();
   if (const auto& account = *_nextAccount) codec::encode(request.initAccount(), *account);
   _nextAccount.reset();
-  _service->tasks.add(request.send().ignoreResult().then([self = shared_from_this()] {
+  _service->tasks->add(request.send().ignoreResult().then([self = shared_from_this()] {
     self->_accountUnderWay = false;
     self->sendAccount();
   }));
@@ -103,7 +103,7 @@ void EventsReference::sendContainers() {
   if (!std::exchange(_nextContainers, false)) return;
   _containersUnderWay = true;
   auto sent = _client->containerListDidChangeRequest().send().ignoreResult();
-  _service->tasks.add(sent.then([self = shared_from_this()] {
+  _service->tasks->add(sent.then([self = shared_from_this()] {
     self->_containersUnderWay = false;
     self->sendContainers();
   }));

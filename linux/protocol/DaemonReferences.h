@@ -22,16 +22,26 @@ struct DaemonService final : private kj::TaskSet::ErrorHandler {
       : loop(std::move(rpcLoop)),
         executor(std::move(runner)),
         daemon(std::move(served)),
-        tasks(*this) {}
+        tasks(newTasks()) {}
+
+  // Lets go of the daemon and of everything on its way to clients. Once there are no more
+  // connections.
+  void close() {
+    tasks = newTasks();
+    daemon = nullptr;
+  }
 
   const std::shared_ptr<RpcLoop> loop;
   const std::shared_ptr<Executor> executor;
-  const std::shared_ptr<LocalDaemon> daemon;
+  std::shared_ptr<LocalDaemon> daemon;
   // Calls that vald has not answered, of clients that are gone too.
   std::size_t unanswered = 0;
-  kj::TaskSet tasks;
+  kj::Own<kj::TaskSet> tasks;
 
  private:
+  kj::Own<kj::TaskSet> newTasks() {
+    return kj::heap<kj::TaskSet>(static_cast<kj::TaskSet::ErrorHandler&>(*this));
+  }
   void taskFailed(kj::Exception&&) override {}  // a push to a client that is gone
 };
 using DaemonServicePtr = std::shared_ptr<DaemonService>;

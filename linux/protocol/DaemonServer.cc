@@ -249,7 +249,18 @@ class DaemonObject final : public wire::Daemon::Server {
 
 class DaemonServer::Implementation {
  public:
+  explicit Implementation(DaemonServicePtr service) : _service(std::move(service)) {}
+  ~Implementation() {
+    sockets.reset();
+    _service->loop->postAndWait([service = _service] { service->close(); });
+  }
+  Implementation(const Implementation&) = delete;
+  Implementation& operator=(const Implementation&) = delete;
+
   std::shared_ptr<SocketServer> sockets;
+
+ private:
+  const DaemonServicePtr _service;
 };
 
 std::unique_ptr<DaemonServer> DaemonServer::listen(const std::shared_ptr<RpcLoop>& loop,
@@ -259,7 +270,7 @@ std::unique_ptr<DaemonServer> DaemonServer::listen(const std::shared_ptr<RpcLoop
                                                    NSErrorOut error) {
   const DaemonServicePtr service =
       loop->own(std::make_unique<DaemonService>(loop, executor, daemon));
-  auto implementation = std::make_unique<Implementation>();
+  auto implementation = std::make_unique<Implementation>(service);
   implementation->sockets = SocketServer::listen(
       loop, socketPath,
       [service]() -> capnp::Capability::Client { return kj::heap<DaemonObject>(service); }, log, {},

@@ -29,7 +29,8 @@ class DaemonServer {
                                               const std::shared_ptr<LocalDaemon>& daemon,
                                               const std::string& socketPath, Log& log,
                                               NSErrorOut error);
-  // Closes the socket and every connection.
+  // Closes the socket and every connection. When it returns, the server has let go of the
+  // daemon and the log; update senders may still be on their way to the executor.
   ~DaemonServer();
 
   // Closes every connection there is; new ones are accepted. Any thread.

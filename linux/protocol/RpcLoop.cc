@@ -110,6 +110,20 @@ RpcLoop::~RpcLoop() {
 
 void RpcLoop::post(Task task) { _state->post(std::move(task)); }
 
+void RpcLoop::postAndWait(Task task) {
+  if (isCurrent()) {
+    task();
+    return;
+  }
+  std::promise<void> ran;
+  post([&] {
+    task();
+    task = nullptr;
+    ran.set_value();
+  });
+  ran.get_future().wait();
+}
+
 bool RpcLoop::isCurrent() const {
   return _state->thread.load(std::memory_order_relaxed) == std::this_thread::get_id();
 }

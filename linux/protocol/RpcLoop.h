@@ -30,6 +30,10 @@ class RpcLoop : public std::enable_shared_from_this<RpcLoop> {
   // Runs `task` on the loop's thread, later, in the order of posting. Any thread.
   void post(Task task);
 
+  // Runs `task` there and returns when it has run. For ends of programs, where what a task
+  // names is about to go. Any thread; the loop's own runs it at once.
+  void postAndWait(Task task);
+
   bool isCurrent() const;
 
   // The thread's event loop, timer and sockets; on its own thread only.

@@ -1,5 +1,7 @@
 #include "linux/protocol/SocketClient.h"
 
+#include <kj/debug.h>
+
 #include <cerrno>
 #include <cstring>
 #include <list>
@@ -333,7 +335,10 @@ void SocketClient::send(Send send, Fail fail, Patience patience) {
             return Task();
           }
           message->connection = core->number;
-          return send(KJ_ASSERT_NONNULL(core->server));
+          KJ_IF_MAYBE (server, core->server) {
+            return send(*server);
+          }
+          return KJ_EXCEPTION(DISCONNECTED, "there is no connection");
         });
     core->run(message, kj::mv(sending), patience);
   });

@@ -38,9 +38,10 @@ struct SocketServer::Core final : private kj::TaskSet::ErrorHandler {
         bootstrap(std::move(make)),
         log(logHandle),
         options(settings),
-        tasks(*this) {}
+        tasks(kj::heap<kj::TaskSet>(static_cast<kj::TaskSet::ErrorHandler&>(*this))) {}
 
   void start(RpcIo& io);
+  void close();
   kj::Promise<void> acceptSome();
   kj::Promise<void> acceptWhenReadable();
   void admit(FileDescriptor socket);
@@ -57,14 +58,22 @@ struct SocketServer::Core final : private kj::TaskSet::ErrorHandler {
   kj::Own<kj::UnixEventPort::FdObserver> observer;
   std::map<std::uint64_t, kj::Own<Peer>> peers;
   std::uint64_t lastNumber = 0;
-  kj::TaskSet tasks;  // goes first: its promises name the peers
+  kj::Own<kj::TaskSet> tasks;  // goes first: its promises name the peers
 };
 
 void SocketServer::Core::start(RpcIo& loopIo) {
   io = &loopIo;
   observer = kj::heap<kj::UnixEventPort::FdObserver>(io->port, listener.get(),
                                                      kj::UnixEventPort::FdObserver::OBSERVE_READ);
-  tasks.add(acceptSome());
+  tasks->add(acceptSome());
+}
+
+void SocketServer::Core::close() {
+  tasks = nullptr;
+  peers.clear();
+  observer = nullptr;
+  listener.reset();
+  bootstrap = nullptr;
 }
 
 kj::Promise<void> SocketServer::Core::acceptWhenReadable() {
@@ -138,7 +147,7 @@ void SocketServer::Core::remove(std::uint64_t number) { peers.erase(number); }
 
 // A promise of the peer's own ends here, so the peer has to outlive the moment.
 void SocketServer::Core::removeSoon(std::uint64_t number) {
-  tasks.add(kj::evalLater([this, number] { remove(number); }));
+  tasks->add(kj::evalLater([this, number] { remove(number); }));
 }
 
 void SocketServer::Core::taskFailed(kj::Exception&& exception) {
@@ -160,7 +169,10 @@ SocketServer::SocketServer(std::shared_ptr<RpcLoop> loop, std::string path,
                            std::shared_ptr<Core> core)
     : _loop(std::move(loop)), _path(std::move(path)), _core(std::move(core)) {}
 
-SocketServer::~SocketServer() { unlink(_path.c_str()); }
+SocketServer::~SocketServer() {
+  unlink(_path.c_str());
+  _loop->postAndWait([core = _core] { core->close(); });
+}
 
 void SocketServer::dropConnections() {
   _loop->post([core = _core] { core->peers.clear(); });

@@ -38,7 +38,8 @@ class SocketServer {
                                               const std::string& path, Bootstrap bootstrap,
                                               Log& log, Options options, NSErrorOut error);
 
-  // Closes the socket and every connection, soon, and removes the socket's file.
+  // Closes the socket and every connection, and removes the socket's file. When it
+  // returns, neither the log nor the bootstrap function is used any more.
   ~SocketServer();
   SocketServer(const SocketServer&) = delete;
   SocketServer& operator=(const SocketServer&) = delete;

@@ -150,7 +150,12 @@ void UpdateLink::send(UniqueFunction<kj::Promise<Task>(wire::Sender::Client&)> s
                          handler = std::move(handler), patience]() mutable {
     self->_socket->sendOver(
         self->_connection,
-        [self, send = std::move(send)]() mutable { return send(KJ_ASSERT_NONNULL(self->_sender)); },
+        [self, send = std::move(send)]() mutable -> kj::Promise<Task> {
+          KJ_IF_MAYBE (sender, self->_sender) {
+            return send(*sender);
+          }
+          return KJ_EXCEPTION(DISCONNECTED, "the link was released");
+        },
         [self, handler = std::move(handler)](NSErrorPtr error) {
           if (!handler || !handler->call) return;
           handler->lastError = error;

@@ -7,6 +7,7 @@
 #include <functional>
 #include <memory>
 #include <optional>
+#include <thread>
 #include <tuple>
 #include <utility>
 #include <vector>
@@ -19,6 +20,17 @@ namespace skein {
 
 inline std::chrono::steady_clock::time_point testDeadline() {
   return std::chrono::steady_clock::now() + std::chrono::seconds(20);
+}
+
+// For what nothing tells of, such as the end of a weak reference. False at the deadline.
+template <class Condition>
+bool becomesTrue(Condition condition) {
+  const auto deadline = testDeadline();
+  while (!condition()) {
+    if (std::chrono::steady_clock::now() > deadline) return false;
+    std::this_thread::yield();
+  }
+  return true;
 }
 
 // Things that come in from other threads, in order of arrival.
