@@ -168,6 +168,14 @@ class HostTest : public testing::Test {
   using Words = std::vector<std::string>;
 
   HostTest() { host->setExtension(extension); }
+  // What a test left unanswered holds the watch, which holds the enumerator.
+  ~HostTest() override {
+    run();
+    for (const auto& held : extension->enumerators) {
+      held->listings.clear();
+      held->rounds.clear();
+    }
+  }
 
   void run() { executor->runAll(); }
   Words calls() {

@@ -47,7 +47,6 @@ struct Result {
   int code = -1;
   std::string output;
   std::string errors;
-  std::chrono::milliseconds time{0};
 
   std::vector<std::string> lines() const;
 };

@@ -19,8 +19,8 @@ namespace {
 using namespace std::chrono_literals;
 using Lines = std::vector<std::string>;
 
-// Within 5 s, with room for the program's own start on a busy machine.
-constexpr auto kAnswersWithin = 5000ms;
+// Within 5 s, and twice that for a busy machine.
+constexpr auto kAnswersWithin = 10s;
 
 std::string firstWord(const std::string& line) { return line.substr(0, line.find(' ')); }
 
@@ -191,28 +191,25 @@ TEST(Commands, AStoppedOrKilledVald) {
 
   const pid_t vald = drive.daemon();
   kill(vald, SIGSTOP);
-  for (const Arguments& arguments : {Arguments{"ls", "/"},
-                                     {"stat", "/letter.txt"},
-                                     {"id", "/letter.txt"},
-                                     {"status"},
-                                     {"watch", "/"},
-                                     {"changes", "--since", "initial"},
-                                     {"account", "status"},
-                                     {"doctor"}}) {
-    const Result result = drive.run(arguments);
-    EXPECT_EQ(result.code, 5) << arguments[0] << ": " << result.output << result.errors;
-    EXPECT_LT(result.time, kAnswersWithin) << arguments[0];
-    EXPECT_NE(result.errors.find("vald"), std::string::npos) << result.errors;
+  // All at once: each waits for its own deadline.
+  const std::vector<Arguments> commands{
+      {"ls", "/"},      {"stat", "/letter.txt"},           {"id", "/letter.txt"}, {"status"},
+      {"watch", "/"},   {"changes", "--since", "initial"}, {"account", "status"}, {"doctor"},
+      {"ls", "-R", "/"}};
+  std::vector<std::unique_ptr<Process>> running;
+  for (const Arguments& arguments : commands) running.push_back(drive.start(arguments));
+  for (std::size_t i = 0; i < commands.size(); ++i) {
+    EXPECT_EQ(running[i]->finish(kAnswersWithin), 5) << commands[i][0] << running[i]->output;
+    EXPECT_NE(running[i]->errors.find("vald"), std::string::npos) << running[i]->errors;
   }
   kill(vald, SIGCONT);
   EXPECT_EQ(drive.list("/"), (Lines{"letter.txt"}));
 
   const pid_t host = drive.host();
   kill(host, SIGSTOP);
-  const Result stopped = drive.run({"ls", "/"});
-  EXPECT_EQ(stopped.code, 5);
-  EXPECT_LT(stopped.time, kAnswersWithin);
-  EXPECT_NE(stopped.errors.find("skein-host"), std::string::npos) << stopped.errors;
+  const auto stopped = drive.start({"ls", "/"});
+  EXPECT_EQ(stopped->finish(kAnswersWithin), 5);
+  EXPECT_NE(stopped->errors.find("skein-host"), std::string::npos) << stopped->errors;
   kill(host, SIGCONT);
 }
 
