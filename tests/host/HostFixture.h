@@ -90,11 +90,15 @@ class FakeEnumerator final : public NSFileProviderEnumerator,
   }
   void invalidate() override { _calls.push_back("invalidate"); }
 
-  // Answers to the oldest held request.
-  void givePage(const NSFileProviderItems& items, std::optional<std::string> next = std::nullopt) {
+  // Answers to the oldest held request. Without `next` the page is the last.
+  void givePage(const NSFileProviderItems& items, const std::string& next = "") {
     const auto observer = take(listings);
     observer->didEnumerateItems(items);
-    observer->finishEnumeratingUpToPage(next ? std::optional(tokenOf(*next)) : std::nullopt);
+    if (next.empty()) {
+      observer->finishEnumeratingUpToPage(std::nullopt);
+    } else {
+      observer->finishEnumeratingUpToPage(tokenOf(next));
+    }
   }
   void giveChanges(const NSFileProviderItems& updates, const std::vector<std::string>& deletions,
                    const std::string& to, bool more = false) {

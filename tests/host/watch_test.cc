@@ -180,9 +180,12 @@ TEST_F(HostTest, ALostAnswerFailsTheFirstWatchAndIsIgnoredWhenItComesLate) {
   EXPECT_EQ(watcher->take(), Words{});
 }
 
-HostChange change(HostChange::Kind kind, std::uint64_t id, std::string name) {
-  return {kind, idOf(id), std::move(name), std::nullopt,
-          kind == HostChange::Kind::Deleted ? nullptr : item(id, "x")};
+HostChange change(HostChange::Kind kind, std::uint64_t id, const std::string& name) {
+  HostChange change;
+  change.kind = kind;
+  change.identifier = idOf(id);
+  change.filename = name;
+  return change;
 }
 
 // A consumer that takes late hears the sum of what happened, one change per item.

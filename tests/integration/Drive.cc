@@ -161,11 +161,13 @@ std::unique_ptr<Process> Drive::start(const Arguments& arguments) const {
 }
 
 Result Drive::run(const Arguments& arguments) const {
+  const auto begin = Clock::now();
   const auto process = start(arguments);
   Result result;
   result.code = process->finish(std::chrono::seconds(60));
   result.output = process->output;
   result.errors = process->errors;
+  result.time = std::chrono::duration_cast<std::chrono::milliseconds>(Clock::now() - begin);
   return result;
 }
 

@@ -47,6 +47,7 @@ struct Result {
   int code = -1;
   std::string output;
   std::string errors;
+  std::chrono::milliseconds time{0};  // that it took; for messages, not for tests
 
   std::vector<std::string> lines() const;
 };
