@@ -5,6 +5,7 @@
 #include <tuple>
 #include <utility>
 
+#include "base/SerialQueue.h"
 #include "linux/protocol/HostCodec.h"
 #include "linux/protocol/SocketServer.h"
 
@@ -39,16 +40,17 @@ struct HostCall {
   kj::Own<kj::PromiseFulfiller<void>> fulfiller;
 };
 
-// Calls start(reply) on the executor and answers the promise of the call, on the loop's
-// thread: encode(results, values...). The parameters are decoded by then.
-template <class Context, class Start, class Encode>
-kj::Promise<void> answer(const HostPeerPtr& peer, Context context, Start start, Encode encode) {
+// Has `run` run start(reply) off the loop's thread, and answers the promise of the call on
+// it: encode(results, values...). The parameters are decoded by then.
+template <class Context, class Run, class Start, class Encode>
+kj::Promise<void> answerThrough(Run run, const HostPeerPtr& peer, Context context, Start start,
+                                Encode encode) {
   KJ_REQUIRE(peer->unanswered < kMostUnanswered, "too many calls are unanswered");
   auto paf = kj::newPromiseAndFulfiller<void>();
   auto call =
       peer->loop->own(std::make_unique<HostCall<Context>>(peer, context, kj::mv(paf.fulfiller)));
-  peer->executor->post([start = std::move(start), call = std::move(call), loop = peer->loop,
-                        encode = std::move(encode)]() mutable {
+  run([start = std::move(start), call = std::move(call), loop = peer->loop,
+       encode = std::move(encode)]() mutable {
     start([call = std::move(call), loop, encode = std::move(encode)](auto&&... values) mutable {
       loop->post([call = std::move(call), encode = std::move(encode),
                   values = std::make_tuple(std::forward<decltype(values)>(values)...)]() mutable {
@@ -63,26 +65,39 @@ kj::Promise<void> answer(const HostPeerPtr& peer, Context context, Start start, 
   return kj::mv(paf.promise);
 }
 
-// A stream that is released on the executor: its end asks the extension to let go.
+template <class Context, class Start, class Encode>
+kj::Promise<void> answer(const HostPeerPtr& peer, Context context, Start start, Encode encode) {
+  return answerThrough([&](Task task) { peer->executor->post(std::move(task)); }, peer, context,
+                       std::move(start), std::move(encode));
+}
+
+// One stream of a client. Its calls reach the service one after the other, as they came, or
+// pages would change places. It is released on the executor, since its end asks the
+// extension to let go.
 template <class Stream>
 class StreamOwner {
  public:
   StreamOwner(HostPeerPtr peer, std::shared_ptr<Stream> stream)
-      : _peer(std::move(peer)), _stream(std::move(stream)) {}
+      : _peer(std::move(peer)),
+        _stream(std::move(stream)),
+        _queue("host-stream", _peer->executor) {}
   ~StreamOwner() {
     _peer->executor->post([stream = std::move(_stream)]() mutable { stream = nullptr; });
   }
   StreamOwner(const StreamOwner&) = delete;
   StreamOwner& operator=(const StreamOwner&) = delete;
 
-  const HostPeerPtr& peer() const { return _peer; }
-  auto next() const {
-    return [stream = _stream](auto reply) { stream->next(std::move(reply)); };
+  template <class Context, class Encode>
+  kj::Promise<void> next(Context context, Encode encode) {
+    return answerThrough([&](Task task) { _queue.async(std::move(task)); }, _peer, context,
+                         [stream = _stream](auto reply) { stream->next(std::move(reply)); },
+                         std::move(encode));
   }
 
  private:
   const HostPeerPtr _peer;
   std::shared_ptr<Stream> _stream;
+  SerialQueue _queue;
 };
 
 class ListingObject final : public wire::Listing::Server {
@@ -91,17 +106,16 @@ class ListingObject final : public wire::Listing::Server {
       : _stream(std::move(peer), std::move(stream)) {}
 
   kj::Promise<void> next(NextContext context) override {
-    return answer(
-        _stream.peer(), context, _stream.next(),
-        [](auto results, const NSFileProviderItems& items, bool last, const NSErrorPtr& error) {
-          codec::encode(results.initItems(static_cast<unsigned>(items.size())), items);
-          results.setLast(last);
-          codec::setError(results, error);
-        });
+    return _stream.next(context, [](auto results, const NSFileProviderItems& items, bool last,
+                                    const NSErrorPtr& error) {
+      codec::encode(results.initItems(static_cast<unsigned>(items.size())), items);
+      results.setLast(last);
+      codec::setError(results, error);
+    });
   }
 
  private:
-  const StreamOwner<HostListing> _stream;
+  StreamOwner<HostListing> _stream;
 };
 
 class WatchObject final : public wire::Watch::Server {
@@ -110,9 +124,8 @@ class WatchObject final : public wire::Watch::Server {
       : _stream(std::move(peer), std::move(stream)) {}
 
   kj::Promise<void> next(NextContext context) override {
-    return answer(
-        _stream.peer(), context, _stream.next(),
-        [](auto results, const std::vector<HostChange>& changes, const NSErrorPtr& error) {
+    return _stream.next(
+        context, [](auto results, const std::vector<HostChange>& changes, const NSErrorPtr& error) {
           auto list = results.initChanges(static_cast<unsigned>(changes.size()));
           unsigned at = 0;
           for (const HostChange& change : changes) codec::encode(list[at++], change);
@@ -121,7 +134,7 @@ class WatchObject final : public wire::Watch::Server {
   }
 
  private:
-  const StreamOwner<HostWatch> _stream;
+  StreamOwner<HostWatch> _stream;
 };
 
 class CheckObject final : public wire::Check::Server {
@@ -130,23 +143,22 @@ class CheckObject final : public wire::Check::Server {
       : _stream(std::move(peer), std::move(stream)) {}
 
   kj::Promise<void> next(NextContext context) override {
-    return answer(_stream.peer(), context, _stream.next(),
-                  [](auto results, const HostCheckStep& step, const NSErrorPtr& error) {
-                    auto list =
-                        results.initDifferences(static_cast<unsigned>(step.differences.size()));
-                    unsigned at = 0;
-                    for (const auto& difference : step.differences) {
-                      codec::encode(list[at++], difference);
-                    }
-                    results.setFolders(step.folders);
-                    results.setItems(step.items);
-                    results.setFinished(step.finished);
-                    codec::setError(results, error);
-                  });
+    return _stream.next(
+        context, [](auto results, const HostCheckStep& step, const NSErrorPtr& error) {
+          auto list = results.initDifferences(static_cast<unsigned>(step.differences.size()));
+          unsigned at = 0;
+          for (const auto& difference : step.differences) {
+            codec::encode(list[at++], difference);
+          }
+          results.setFolders(step.folders);
+          results.setItems(step.items);
+          results.setFinished(step.finished);
+          codec::setError(results, error);
+        });
   }
 
  private:
-  const StreamOwner<HostCheck> _stream;
+  StreamOwner<HostCheck> _stream;
 };
 
 constexpr auto encodeError = [](auto results, const NSErrorPtr& error) {
