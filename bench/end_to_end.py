@@ -1,0 +1,223 @@
+#!/usr/bin/env python3
+"""Measures the programs end to end, each figure beside a baseline of the same run.
+
+Usage: bench/end_to_end.py [--bin DIR] [--files N] [--work DIR] [STEP...]
+
+Steps: listing   a folder of N files (100,000) by name and by date, beside find | sort; the
+                 same with N/10 files; what the host's memory grows by
+       latency   a change on disk until "skein watch" prints it
+       unpack    20,000 files unpacked into a watched folder: each told of, none twice
+       kill      vald killed during a listing, vald stopped during a command
+Without a step: all of them.
+"""
+import argparse
+import json
+import os
+import pathlib
+import shutil
+import signal
+import statistics
+import subprocess
+import sys
+import tarfile
+import tempfile
+import time
+
+
+class Drive:
+    """A drive in folders of its own, and the programs on it."""
+
+    def __init__(self, top: pathlib.Path, binaries: pathlib.Path):
+        self.store = top / "store"
+        self.store.mkdir(parents=True)
+        self.skein = str(binaries / "skein")
+        self.environment = dict(os.environ, SKEIN_STORE=str(self.store), SKEIN_LOG="notice",
+                                NO_COLOR="1")
+        for name in ("RUNTIME_DIR", "STATE_HOME", "DATA_HOME", "CONFIG_HOME", "CACHE_HOME"):
+            folder = top / name.lower()
+            folder.mkdir(mode=0o700)
+            self.environment["XDG_" + name] = str(folder)
+
+    def command(self, *arguments, check=True, **options):
+        return subprocess.run([self.skein, *arguments], env=self.environment, check=check,
+                              **options)
+
+    def status(self):
+        answer = self.command("status", "--json", stdout=subprocess.PIPE)
+        return json.loads(answer.stdout)
+
+    def wait_until_scanned(self):
+        while True:
+            status = self.status()
+            if status["scan"] == "idle":
+                return status
+            time.sleep(0.2)
+
+    def stop(self):
+        self.command("stop", check=False, stdout=subprocess.DEVNULL)
+
+
+def seconds(function):
+    start = time.perf_counter()
+    function()
+    return time.perf_counter() - start
+
+
+def best(function, rounds=5):
+    return min(seconds(function) for _ in range(rounds))
+
+
+def resident(pid):
+    for line in open(f"/proc/{pid}/status"):
+        if line.startswith("VmRSS:"):
+            return int(line.split()[1]) / 1024
+    raise RuntimeError(f"process {pid} tells no resident memory")
+
+
+def make_files(folder: pathlib.Path, count: int):
+    folder.mkdir(parents=True)
+    for number in range(count):
+        with open(folder / f"document {number:06}.txt", "wb") as file:
+            file.write(b"x" * (number % 97))
+
+
+def listing(drive: Drive, options):
+    make_files(drive.store / "small", options.files // 10)
+    make_files(drive.store / "large", options.files)
+    status = drive.wait_until_scanned()
+    host = status["hostProcessID"]
+    sink = open(os.devnull, "wb")
+    times = {}
+    for name, count in (("small", options.files // 10), ("large", options.files)):
+        baseline = best(lambda: subprocess.run(
+            f"find '{drive.store / name}' -maxdepth 1 -printf '%f %s %T@\\n' | sort",
+            shell=True, stdout=sink, check=True))
+        for order in ("name", "date"):
+            drive.command("ls", "--sort", order, "/" + name, stdout=sink)
+            before = resident(host)
+            took = best(lambda: drive.command("ls", "--sort", order, "/" + name, stdout=sink))
+            grown = resident(host) - before
+            times[name, order] = took
+            print(f"ls by {order}, {count} files: {took:.3f} s; find | sort: {baseline:.3f} s; "
+                  f"ratio {took / baseline:.2f}; skein-host grew by {grown:.1f} MB")
+    for order in ("name", "date"):
+        print(f"ls by {order}, {options.files} over {options.files // 10} files: "
+              f"{times['large', order] / times['small', order]:.1f} times")
+    listed = drive.command("ls", "/large", stdout=subprocess.PIPE).stdout.splitlines()
+    assert listed == sorted(os.fsencode(n) for n in os.listdir(drive.store / "large")), \
+        "the listing is not what is on disk"
+
+
+def watching(drive: Drive, path: str, *arguments):
+    watch = subprocess.Popen([drive.skein, "watch", path, "--json", *arguments],
+                             env=drive.environment, stdout=subprocess.PIPE,
+                             stderr=subprocess.PIPE, text=True)
+    return watch
+
+
+def until_ready(watch):
+    line = watch.stderr.readline()
+    if not line:
+        raise RuntimeError("skein watch ended before it began")
+
+
+def latency(drive: Drive, _options):
+    folder = drive.store / "latency"
+    folder.mkdir()
+    drive.wait_until_scanned()
+    watch = watching(drive, "/latency")
+    until_ready(watch)
+    samples = []
+    for number in range(30):
+        start = time.perf_counter()
+        (folder / f"note {number}").write_text("seen")
+        while json.loads(watch.stdout.readline())["name"] != f"note {number}":
+            pass
+        samples.append(time.perf_counter() - start)
+    watch.send_signal(signal.SIGINT)
+    watch.wait()
+    print(f"a change on disk until skein watch prints it: median "
+          f"{statistics.median(samples) * 1000:.0f} ms, worst {max(samples) * 1000:.0f} ms")
+
+
+def unpack(drive: Drive, _options):
+    count = 20_000
+    folder = drive.store / "unpacked"
+    folder.mkdir()
+    archive = drive.store.parent / "archive.tar"
+    with tarfile.open(archive, "w") as tar:
+        for number in range(count):
+            tar.addfile(tarfile.TarInfo(f"member {number:05}"))
+    drive.wait_until_scanned()
+    watch = watching(drive, "/unpacked")
+    until_ready(watch)
+    start = time.perf_counter()
+    subprocess.run(["tar", "-xf", str(archive), "-C", str(folder)], check=True)
+    unpacked = time.perf_counter() - start
+    created = {}
+    while len(created) < count:
+        change = json.loads(watch.stdout.readline())
+        if change["change"] == "created":
+            assert change["name"] not in created, f"{change['name']} was told of twice"
+            created[change["name"]] = change["id"]
+    told = time.perf_counter() - start
+    watch.send_signal(signal.SIGINT)
+    watch.wait()
+    assert len(set(created.values())) == count, "two files have one identifier"
+    print(f"{count} files unpacked: tar took {unpacked:.2f} s, all told of after {told:.2f} s; "
+          f"ratio {told / unpacked:.2f}")
+
+
+def kill(drive: Drive, options):
+    if not (drive.store / "large").exists():
+        make_files(drive.store / "large", options.files)
+    status = drive.wait_until_scanned()
+    vald = status["daemon"]["processID"] if "daemon" in status else status["processID"]
+    process = subprocess.Popen([drive.skein, "ls", "/large"], env=drive.environment,
+                               stdout=subprocess.PIPE, stderr=subprocess.PIPE)
+    process.stdout.read(10_000)
+    start = time.perf_counter()
+    os.kill(vald, signal.SIGKILL)
+    _, error = process.communicate()
+    print(f"vald killed during a listing: exit code {process.returncode} after "
+          f"{time.perf_counter() - start:.2f} s: {error.decode().strip()}")
+    print(f"the next command: {seconds(lambda: drive.command('ls', '/', stdout=subprocess.DEVNULL)):.2f} s")
+    status = drive.status()
+    vald = status["daemon"]["processID"] if "daemon" in status else status["processID"]
+    os.kill(vald, signal.SIGSTOP)
+    try:
+        for arguments in (["ls", "/"], ["stat", "/large"], ["status"], ["account", "status"],
+                          ["doctor"], ["changes", "--since", "initial"]):
+            start = time.perf_counter()
+            answer = drive.command(*arguments, check=False, stdout=subprocess.DEVNULL,
+                                   stderr=subprocess.PIPE)
+            print(f"vald stopped: skein {arguments[0]}: exit code {answer.returncode} after "
+                  f"{time.perf_counter() - start:.2f} s: {answer.stderr.decode().strip()[:100]}")
+    finally:
+        os.kill(vald, signal.SIGCONT)
+
+
+STEPS = {"listing": listing, "latency": latency, "unpack": unpack, "kill": kill}
+
+
+def main():
+    top = pathlib.Path(__file__).resolve().parent.parent
+    parser = argparse.ArgumentParser(description=__doc__,
+                                     formatter_class=argparse.RawDescriptionHelpFormatter)
+    parser.add_argument("--bin", type=pathlib.Path, default=top / "build/release/bin")
+    parser.add_argument("--files", type=int, default=100_000)
+    parser.add_argument("--work", help="where the drives are made")
+    parser.add_argument("steps", nargs="*", choices=[*STEPS, []])
+    options = parser.parse_args()
+    work = pathlib.Path(tempfile.mkdtemp(prefix="skein-bench-", dir=options.work))
+    drive = Drive(work, options.bin.resolve())
+    try:
+        for step in options.steps or STEPS:
+            STEPS[step](drive, options)
+    finally:
+        drive.stop()
+        shutil.rmtree(work)
+
+
+if __name__ == "__main__":
+    sys.exit(main())
