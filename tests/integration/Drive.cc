@@ -186,6 +186,10 @@ pid_t Drive::processOf(const std::string& program) const {
   return 0;
 }
 
+void sendSignal(pid_t pid, int signal) {
+  if (pid <= 0 || kill(pid, signal) != 0) ADD_FAILURE() << "no process for signal " << signal;
+}
+
 bool waitUntilGone(pid_t pid, std::chrono::milliseconds deadline) {
   const FileDescriptor handle(static_cast<int>(syscall(SYS_pidfd_open, pid, 0)));
   if (!handle) return errno == ESRCH;

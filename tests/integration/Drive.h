@@ -76,6 +76,9 @@ class Drive {
   Arguments _environment;
 };
 
+// Sends a signal; fails the test for what is no process of its own (0 and -1 mean many).
+void sendSignal(pid_t pid, int signal);
+
 // Waits until the process is gone; false at the deadline.
 bool waitUntilGone(pid_t pid, std::chrono::milliseconds deadline);
 

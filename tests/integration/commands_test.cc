@@ -36,7 +36,9 @@ TEST(Commands, ListsByNameAndDateAndBelow) {
   const Result byName = drive.run({"ls", "/"});
   ASSERT_EQ(byName.code, 0) << byName.errors;
   EXPECT_EQ(byName.lines(), (Lines{"alpha.txt", "beta.txt", "folder"}));
-  EXPECT_EQ(drive.run({"ls", "--sort", "date"}).lines().back(), "alpha.txt");
+  const Result byDate = drive.run({"ls", "--sort", "date"});
+  ASSERT_EQ(byDate.lines().size(), 3U) << byDate.code << byDate.errors;
+  EXPECT_EQ(byDate.lines().back(), "alpha.txt");
 
   const Lines details = drive.run({"ls", "-l", "/"}).lines();
   ASSERT_EQ(details.size(), 3U);
@@ -141,13 +143,13 @@ TEST(Commands, WatchSeesWhatHappensAndSurvivesVald) {
   // What happens while vald is away is told once it is back.
   const pid_t vald = drive.daemon();
   ASSERT_GT(vald, 0);
-  kill(vald, SIGKILL);
+  sendSignal(vald, SIGKILL);
   std::filesystem::remove(drive.store() + "/older.txt");
   next = watch->readLine(15s);
   while (next && firstWord(*next) == "changed") next = watch->readLine(15s);
   EXPECT_EQ(next, "deleted  older.txt");
   EXPECT_NE(drive.daemon(), vald);
-  kill(watch->pid(), SIGINT);
+  sendSignal(watch->pid(), SIGINT);
   EXPECT_EQ(watch->finish(5s), 130);
 }
 
@@ -186,11 +188,11 @@ TEST(Commands, AStoppedOrKilledVald) {
   Drive drive;
   drive.write("/letter.txt", "");
   ASSERT_EQ(drive.list("/"), (Lines{"letter.txt"}));
-  kill(drive.daemon(), SIGKILL);
+  sendSignal(drive.daemon(), SIGKILL);
   EXPECT_EQ(drive.list("/"), (Lines{"letter.txt"}));
 
   const pid_t vald = drive.daemon();
-  kill(vald, SIGSTOP);
+  sendSignal(vald, SIGSTOP);
   // All at once: each waits for its own deadline.
   const std::vector<Arguments> commands{
       {"ls", "/"},      {"stat", "/letter.txt"},           {"id", "/letter.txt"}, {"status"},
@@ -202,15 +204,15 @@ TEST(Commands, AStoppedOrKilledVald) {
     EXPECT_EQ(running[i]->finish(kAnswersWithin), 5) << commands[i][0] << running[i]->output;
     EXPECT_NE(running[i]->errors.find("vald"), std::string::npos) << running[i]->errors;
   }
-  kill(vald, SIGCONT);
+  sendSignal(vald, SIGCONT);
   EXPECT_EQ(drive.list("/"), (Lines{"letter.txt"}));
 
   const pid_t host = drive.host();
-  kill(host, SIGSTOP);
+  sendSignal(host, SIGSTOP);
   const auto stopped = drive.start({"ls", "/"});
   EXPECT_EQ(stopped->finish(kAnswersWithin), 5);
   EXPECT_NE(stopped->errors.find("skein-host"), std::string::npos) << stopped->errors;
-  kill(host, SIGCONT);
+  sendSignal(host, SIGCONT);
 }
 
 TEST(Commands, StopLeavesNothingRunning) {
