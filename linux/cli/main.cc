@@ -51,5 +51,7 @@ int main(int argc, char** argv) {
     complain(std::string(error.what()) + "; see: skein --help");
     return kUsage;
   }
-  return invocation.run();
+  const int code = invocation.run();
+  // Everything is written. What the connection's threads still tidy up ends with the process.
+  std::_Exit(code);
 }
