@@ -109,7 +109,7 @@ def listing(drive: Drive, options):
 
 
 def watching(drive: Drive, path: str, *arguments):
-    watch = subprocess.Popen([drive.skein, "watch", path, "--json", *arguments],
+    watch = subprocess.Popen([drive.skein, "watch", path, "--json", "--ready-fd", "2", *arguments],
                              env=drive.environment, stdout=subprocess.PIPE,
                              stderr=subprocess.PIPE, text=True)
     return watch
@@ -172,7 +172,7 @@ def kill(drive: Drive, options):
     if not (drive.store / "large").exists():
         make_files(drive.store / "large", options.files)
     status = drive.wait_until_scanned()
-    vald = status["daemon"]["processID"] if "daemon" in status else status["processID"]
+    vald = status["processID"]
     process = subprocess.Popen([drive.skein, "ls", "/large"], env=drive.environment,
                                stdout=subprocess.PIPE, stderr=subprocess.PIPE)
     process.stdout.read(10_000)
@@ -183,7 +183,7 @@ def kill(drive: Drive, options):
           f"{time.perf_counter() - start:.2f} s: {error.decode().strip()}")
     print(f"the next command: {seconds(lambda: drive.command('ls', '/', stdout=subprocess.DEVNULL)):.2f} s")
     status = drive.status()
-    vald = status["daemon"]["processID"] if "daemon" in status else status["processID"]
+    vald = status["processID"]
     os.kill(vald, signal.SIGSTOP)
     try:
         for arguments in (["ls", "/"], ["stat", "/large"], ["status"], ["account", "status"],
