@@ -4,27 +4,29 @@
 #include <kj/async.h>
 #include <kj/debug.h>
 
+#include <cstddef>
 #include <memory>
 #include <tuple>
 #include <utility>
 
-#include "linux/protocol/DaemonReferences.h"
-
 namespace skein {
 
-// A call that vald has to answer. Lives on the loop's thread.
-template <class Context>
+// A call that a peer has to answer. Lives on the loop's thread.
+//
+// A peer is what the objects of one connection or service share: its `loop`, the number of
+// `unanswered` calls (on the loop's thread) and `kMostUnanswered`.
+template <class Peer, class Context>
 struct UnansweredCall {
-  UnansweredCall(DaemonServicePtr servicePtr, Context callContext,
+  UnansweredCall(std::shared_ptr<Peer> callPeer, Context callContext,
                  kj::Own<kj::PromiseFulfiller<void>> own)
-      : service(std::move(servicePtr)), context(callContext), fulfiller(kj::mv(own)) {
-    ++service->unanswered;
+      : peer(std::move(callPeer)), context(callContext), fulfiller(kj::mv(own)) {
+    ++peer->unanswered;
   }
-  ~UnansweredCall() { --service->unanswered; }
+  ~UnansweredCall() { --peer->unanswered; }
   UnansweredCall(const UnansweredCall&) = delete;
   UnansweredCall& operator=(const UnansweredCall&) = delete;
 
-  const DaemonServicePtr service;
+  const std::shared_ptr<Peer> peer;
   Context context;  // valid while the fulfiller is waited for
   kj::Own<kj::PromiseFulfiller<void>> fulfiller;
 };
@@ -32,15 +34,14 @@ struct UnansweredCall {
 // Calls start(reply) and answers the promise of the call, on the loop's thread. `reply`
 // takes what `encode` takes after the results' builder, and `encode` runs on the loop's
 // thread. When `reply` is dropped uncalled, the call fails.
-template <class Context, class Start, class Encode>
-kj::Promise<void> answer(const DaemonServicePtr& service, Context context, Start start,
+template <class Peer, class Context, class Start, class Encode>
+kj::Promise<void> answer(const std::shared_ptr<Peer>& peer, Context context, Start start,
                          Encode encode) {
-  constexpr std::size_t kMostUnanswered = 8192;
-  KJ_REQUIRE(service->unanswered < kMostUnanswered, "too many calls are unanswered");
+  KJ_REQUIRE(peer->unanswered < Peer::kMostUnanswered, "too many calls are unanswered");
   auto paf = kj::newPromiseAndFulfiller<void>();
-  using Call = UnansweredCall<Context>;
-  auto call = service->loop->own(std::make_unique<Call>(service, context, kj::mv(paf.fulfiller)));
-  start([call = std::move(call), loop = service->loop,
+  using Call = UnansweredCall<Peer, Context>;
+  auto call = peer->loop->own(std::make_unique<Call>(peer, context, kj::mv(paf.fulfiller)));
+  start([call = std::move(call), loop = peer->loop,
          encode = std::move(encode)](auto&&... values) mutable {
     loop->post([call = std::move(call), encode = std::move(encode),
                 values = std::make_tuple(std::forward<decltype(values)>(values)...)]() mutable {

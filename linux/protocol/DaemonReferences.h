@@ -17,6 +17,9 @@ namespace skein {
 
 // What the objects of one server share. Its fields are used on the loop's thread.
 struct DaemonService final : private kj::TaskSet::ErrorHandler {
+  // Of all connections together.
+  static constexpr std::size_t kMostUnanswered = 8192;
+
   DaemonService(std::shared_ptr<RpcLoop> rpcLoop, std::shared_ptr<Executor> runner,
                 std::shared_ptr<LocalDaemon> served)
       : loop(std::move(rpcLoop)),

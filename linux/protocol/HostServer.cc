@@ -6,17 +6,18 @@
 #include <utility>
 
 #include "base/SerialQueue.h"
+#include "linux/protocol/Answer.h"
 #include "linux/protocol/HostCodec.h"
 #include "linux/protocol/SocketServer.h"
 
 namespace skein {
 namespace {
 
-// What one connection may have at once. A terminal's listing has three pages under way.
-constexpr std::size_t kMostUnanswered = 256;
-
 // What the objects of one connection share.
 struct HostPeer {
+  // A terminal's listing has three pages under way.
+  static constexpr std::size_t kMostUnanswered = 256;
+
   std::shared_ptr<RpcLoop> loop;
   std::shared_ptr<Executor> executor;
   std::shared_ptr<HostService> service;
@@ -24,49 +25,23 @@ struct HostPeer {
 };
 using HostPeerPtr = std::shared_ptr<HostPeer>;
 
-// A call that the service has to answer. Lives on the loop's thread.
-template <class Context>
-struct HostCall {
-  HostCall(HostPeerPtr hostPeer, Context callContext, kj::Own<kj::PromiseFulfiller<void>> own)
-      : peer(std::move(hostPeer)), context(callContext), fulfiller(kj::mv(own)) {
-    ++peer->unanswered;
-  }
-  ~HostCall() { --peer->unanswered; }
-  HostCall(const HostCall&) = delete;
-  HostCall& operator=(const HostCall&) = delete;
-
-  const HostPeerPtr peer;
-  Context context;  // valid while the fulfiller is waited for
-  kj::Own<kj::PromiseFulfiller<void>> fulfiller;
-};
-
-// Has `run` run start(reply) off the loop's thread, and answers the promise of the call on
-// it: encode(results, values...). The parameters are decoded by then.
+// Answers the promise of a call whose start(reply) `run` takes off the loop's thread.
 template <class Context, class Run, class Start, class Encode>
 kj::Promise<void> answerThrough(Run run, const HostPeerPtr& peer, Context context, Start start,
                                 Encode encode) {
-  KJ_REQUIRE(peer->unanswered < kMostUnanswered, "too many calls are unanswered");
-  auto paf = kj::newPromiseAndFulfiller<void>();
-  auto call =
-      peer->loop->own(std::make_unique<HostCall<Context>>(peer, context, kj::mv(paf.fulfiller)));
-  run([start = std::move(start), call = std::move(call), loop = peer->loop,
-       encode = std::move(encode)]() mutable {
-    start([call = std::move(call), loop, encode = std::move(encode)](auto&&... values) mutable {
-      loop->post([call = std::move(call), encode = std::move(encode),
-                  values = std::make_tuple(std::forward<decltype(values)>(values)...)]() mutable {
-        if (!call->fulfiller->isWaiting()) return;  // the client is gone
-        call->fulfiller->rejectIfThrows([&] {
-          std::apply([&](auto&... value) { encode(call->context.getResults(), value...); }, values);
-          call->fulfiller->fulfill();
+  return answer(
+      peer, context,
+      [&run, &start](auto reply) {
+        run([start = std::move(start), reply = std::move(reply)]() mutable {
+          start(std::move(reply));
         });
-      });
-    });
-  });
-  return kj::mv(paf.promise);
+      },
+      std::move(encode));
 }
 
 template <class Context, class Start, class Encode>
-kj::Promise<void> answer(const HostPeerPtr& peer, Context context, Start start, Encode encode) {
+kj::Promise<void> answerOnExecutor(const HostPeerPtr& peer, Context context, Start start,
+                                   Encode encode) {
   return answerThrough([&](Task task) { peer->executor->post(std::move(task)); }, peer, context,
                        std::move(start), std::move(encode));
 }
@@ -173,7 +148,7 @@ class HostObject final : public wire::Host::Server {
   kj::Promise<void> list(ListContext context) override {
     const auto params = context.getParams();
     const HostOrder order = params.getOrder() == 1 ? HostOrder::Date : HostOrder::Name;
-    return answer(
+    return answerOnExecutor(
         _peer, context,
         [service = service(), target = codec::decode(params.getContainer()), order](auto reply) {
           service->list(target, order, std::move(reply));
@@ -186,7 +161,7 @@ class HostObject final : public wire::Host::Server {
   }
 
   kj::Promise<void> item(ItemContext context) override {
-    return answer(
+    return answerOnExecutor(
         _peer, context,
         [service = service(), target = codec::decode(context.getParams().getTarget())](auto reply) {
           service->item(target, std::move(reply));
@@ -198,7 +173,7 @@ class HostObject final : public wire::Host::Server {
   }
 
   kj::Promise<void> identifierForPath(IdentifierForPathContext context) override {
-    return answer(
+    return answerOnExecutor(
         _peer, context,
         [service = service(), path = codec::text(context.getParams().getPath())](auto reply) {
           service->identifierForPath(path, std::move(reply));
@@ -210,7 +185,7 @@ class HostObject final : public wire::Host::Server {
   }
 
   kj::Promise<void> pathForIdentifier(PathForIdentifierContext context) override {
-    return answer(
+    return answerOnExecutor(
         _peer, context,
         [service = service(), identifier = codec::text(context.getParams().getIdentifier())](
             auto reply) { service->pathForIdentifier(identifier, std::move(reply)); },
@@ -221,7 +196,7 @@ class HostObject final : public wire::Host::Server {
   }
 
   kj::Promise<void> watch(WatchContext context) override {
-    return answer(
+    return answerOnExecutor(
         _peer, context,
         [service = service(), target = codec::decode(context.getParams().getContainer())](
             auto reply) { service->watch(target, std::move(reply)); },
@@ -237,7 +212,7 @@ class HostObject final : public wire::Host::Server {
       const auto data = context.getParams().getToken();
       token = NSData(std::span(data.begin(), data.size()));
     }
-    return answer(
+    return answerOnExecutor(
         _peer, context,
         [service = service(), token = std::move(token)](auto reply) {
           service->changesSince(token, std::move(reply));
@@ -254,7 +229,7 @@ class HostObject final : public wire::Host::Server {
   }
 
   kj::Promise<void> account(AccountContext context) override {
-    return answer(
+    return answerOnExecutor(
         _peer, context, [service = service()](auto reply) { service->account(std::move(reply)); },
         [](auto results, const std::optional<LocalAccount>& account, const NSErrorPtr& error) {
           if (account) codec::encode(results.initAccount(), *account);
@@ -263,7 +238,7 @@ class HostObject final : public wire::Host::Server {
   }
 
   kj::Promise<void> logIn(LogInContext context) override {
-    return answer(
+    return answerOnExecutor(
         _peer, context,
         [service = service(), account = codec::decode(context.getParams().getAccount())](
             auto reply) { service->logIn(account, std::move(reply)); },
@@ -271,13 +246,13 @@ class HostObject final : public wire::Host::Server {
   }
 
   kj::Promise<void> logOut(LogOutContext context) override {
-    return answer(
+    return answerOnExecutor(
         _peer, context, [service = service()](auto reply) { service->logOut(std::move(reply)); },
         encodeError);
   }
 
   kj::Promise<void> status(StatusContext context) override {
-    return answer(
+    return answerOnExecutor(
         _peer, context, [service = service()](auto reply) { service->status(std::move(reply)); },
         [](auto results, const HostStatus& status, const NSErrorPtr& error) {
           codec::encode(results.initStatus(), status);
@@ -286,7 +261,7 @@ class HostObject final : public wire::Host::Server {
   }
 
   kj::Promise<void> check(CheckContext context) override {
-    return answer(
+    return answerOnExecutor(
         _peer, context, [service = service()](auto reply) { service->check(std::move(reply)); },
         [peer = _peer](auto results, std::shared_ptr<HostCheck>& check, const NSErrorPtr& error) {
           if (check) results.setCheck(kj::heap<CheckObject>(peer, std::move(check)));
@@ -295,7 +270,7 @@ class HostObject final : public wire::Host::Server {
   }
 
   kj::Promise<void> setDebugLog(SetDebugLogContext context) override {
-    return answer(
+    return answerOnExecutor(
         _peer, context,
         [service = service(), enabled = context.getParams().getEnabled()](auto reply) {
           service->setDebugLog(enabled, std::move(reply));
