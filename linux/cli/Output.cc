@@ -15,7 +15,7 @@
 namespace skein::cli {
 namespace {
 
-constexpr std::size_t kFlushAt = 64 * 1024;
+constexpr std::size_t kFlushAt = std::size_t{64} * 1024;
 
 // The length of the UTF-8 sequence at the head of `text`; 0 when there is none.
 std::size_t sequenceLength(std::string_view text) {

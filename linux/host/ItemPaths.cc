@@ -53,11 +53,11 @@ std::optional<NSFileProviderItemIdentifier> ItemPaths::identifierForPath(const s
       _extension.URLForItemWithPersistentIdentifier(NSFileProviderRootContainerItemIdentifier);
   if (root) {
     const std::string base = root->path() == "/" ? "" : root->path();
-    const auto identifier =
+    auto identifier =
         _extension.persistentIdentifierForItemAtURL(NSURL::fileURLWithPath(base + *wanted));
     if (identifier) return identifier;
     if (const auto elsewhere = pathInContainer(*wanted)) {
-      const auto inContainer =
+      auto inContainer =
           _extension.persistentIdentifierForItemAtURL(NSURL::fileURLWithPath(*elsewhere));
       if (inContainer) return inContainer;
     }

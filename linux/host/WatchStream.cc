@@ -78,7 +78,7 @@ class WatchStream::Gatherer final : public ContainerWatcher,
     }
     std::shared_ptr<HostWatch> stream;
     if (!error) {
-      stream.reset(new WatchStream(shared_from_this(), std::move(subscription)));
+      stream.reset(new WatchStream(shared_from_this(), std::exchange(subscription, nullptr)));
     }
     _executor->post([reply = std::move(reply), stream = std::move(stream), error = std::move(error),
                      subscription = std::move(subscription)]() mutable {

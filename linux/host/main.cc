@@ -106,7 +106,7 @@ std::string parse(int argc, char** argv, Arguments& arguments, bool& help) {
 
 std::string attributesPath() {
   const std::string folder = folderOfThisProgram();
-  const std::string beside = folder + "/extension.attributes";
+  std::string beside = folder + "/extension.attributes";
   if (access(beside.c_str(), R_OK) == 0) return beside;
   return folder + "/../share/skein/extension.attributes";
 }
