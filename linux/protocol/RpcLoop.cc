@@ -7,6 +7,7 @@
 
 #include <atomic>
 #include <cerrno>
+#include <cstdlib>
 #include <future>
 #include <system_error>
 #include <vector>
@@ -129,7 +130,10 @@ bool RpcLoop::isCurrent() const {
 }
 
 RpcIo& RpcLoop::io() {
-  if (!isCurrent() || _state->io == nullptr) reportFault("RpcLoop::io() off the loop's thread");
+  if (!isCurrent() || _state->io == nullptr) {
+    reportFault("RpcLoop::io() off the loop's thread");
+    std::abort();  // there is nothing to give
+  }
   return *_state->io;
 }
 
