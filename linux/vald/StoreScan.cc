@@ -373,6 +373,7 @@ Look StoreWriter::lookAtName(FolderKey folder, const std::string& name) {
 
 void StoreWriter::reconcile(DirtySet& dirty) {
   begin();
+  DirtySet unread;
   // A folder whose way changed in this very batch is found once its own change is decided.
   for (bool isProgress = true; isProgress && !dirty.folders.empty();) {
     isProgress = false;
@@ -382,8 +383,14 @@ void StoreWriter::reconcile(DirtySet& dirty) {
       const Folder* folder = _folders.find(key);
       int descriptor = -1;
       int error = 0;
-      // A folder that was not read yet will be.
+      // A folder that was not read yet will be. It may be on its way here, read before this
+      // change: then the change waits until the folder has arrived.
       const bool isKnown = folder != nullptr && folder->row.scanned;
+      if (!isKnown && _scanner.pending() > 0) {
+        unread.folders.insert(std::move(*entry));
+        entry = dirty.folders.erase(entry);
+        continue;
+      }
       const Look look = isKnown ? _disk.open(key, descriptor, error) : Look::RootLost;
       if (look == Look::Gone) {
         ++entry;
@@ -421,6 +428,11 @@ void StoreWriter::reconcile(DirtySet& dirty) {
     _later.folders.merge(dirty.folders);
   } else {
     _laterTries = 0;
+  }
+  for (auto& [key, changes] : unread.folders) {
+    DirtyFolder& later = _later.folders[key];
+    later.whole = later.whole || changes.whole;
+    later.names.merge(changes.names);
   }
   commit();
 }
