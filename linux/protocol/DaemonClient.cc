@@ -4,14 +4,12 @@
 #include <vector>
 
 #include "base/SerialQueue.h"
+#include "linux/protocol/DaemonCalls.h"
 #include "linux/protocol/DaemonCodec.h"
-#include "linux/protocol/SocketClient.h"
 #include "linux/protocol/UpdateLink.h"
 
 namespace skein {
 namespace {
-
-using Patience = SocketClient::Patience;
 
 // A subscriber, as vald pushes to it; held weakly. Deliveries have a queue of their own.
 class EventsObject final : public wire::Events::Server {
@@ -45,15 +43,6 @@ class EventsObject final : public wire::Events::Server {
   SerialQueue _deliveries;
 };
 
-// An answer that only has an error.
-auto errorReply(Reply<NSErrorPtr> reply) {
-  return [reply = std::move(reply)](const auto& results) mutable -> Task {
-    return [reply = std::move(reply), error = codec::errorOf(results)]() mutable {
-      reply(std::move(error));
-    };
-  };
-}
-
 template <class Results>
 Task replyWithPage(VLDaemon::ItemsReply& reply, const Results& results) {
   return [reply = std::move(reply), items = codec::decodeProviderItems(results.getItems()),
@@ -64,8 +53,7 @@ Task replyWithPage(VLDaemon::ItemsReply& reply, const Results& results) {
 
 class DaemonProxy final : public LocalDaemon {
  public:
-  DaemonProxy(std::shared_ptr<SocketClient> socket, std::function<void(NSErrorPtr)> errorHandler)
-      : _socket(std::move(socket)), _errorHandler(std::move(errorHandler)) {}
+  explicit DaemonProxy(DaemonCalls calls) : _calls(std::move(calls)) {}
 
   void enumerateItemsInFolder(std::optional<VLFileObjectID> folder, std::uint8_t sortOrder,
                               std::uint64_t offset, std::uint64_t limit,
@@ -138,7 +126,7 @@ class DaemonProxy final : public LocalDaemon {
   void getItemUpdateSenderWithReceiver(
       std::shared_ptr<VLItemNotificationReceiving> receiver,
       Reply<std::shared_ptr<VLItemNotificationSender>, NSErrorPtr> reply) override {
-    auto link = std::make_shared<UpdateLink>(_socket, std::move(receiver));
+    auto link = std::make_shared<UpdateLink>(_calls.socket(), std::move(receiver));
     call(
         [link](wire::Daemon::Client& daemon) {
           auto request = daemon.getItemUpdateSenderRequest();
@@ -240,7 +228,7 @@ class DaemonProxy final : public LocalDaemon {
   void subscribe(std::shared_ptr<LocalDaemonEvents> events, Reply<NSErrorPtr> reply) override {
     call(
         [weak = std::weak_ptr(events),
-         executor = _socket->executor()](wire::Daemon::Client& daemon) {
+         executor = _calls.socket()->executor()](wire::Daemon::Client& daemon) {
           auto request = daemon.subscribeRequest();
           request.setEvents(kj::heap<EventsObject>(weak, executor));
           return request.send();
@@ -295,26 +283,12 @@ class DaemonProxy final : public LocalDaemon {
   }
 
  private:
-  // build(daemon) sends a request; decode(results) makes what hands the reply on. Both on
-  // the loop's thread.
   template <class Build, class Decode>
   void call(Build build, Decode decode, Patience patience = Patience::Deadline) {
-    _socket->send(
-        [build = std::move(build), decode = std::move(decode)](
-            capnp::Capability::Client server) mutable -> kj::Promise<Task> {
-          auto daemon = server.castAs<wire::Daemon>();
-          return build(daemon).then([decode = kj::mv(decode)](auto&& results) mutable -> Task {
-            return decode(results);
-          });
-        },
-        [handler = _errorHandler](NSErrorPtr error) {
-          if (handler) handler(std::move(error));
-        },
-        patience);
+    _calls.call<wire::Daemon>(std::move(build), std::move(decode), patience);
   }
 
-  const std::shared_ptr<SocketClient> _socket;
-  const std::function<void(NSErrorPtr)> _errorHandler;
+  const DaemonCalls _calls;
 };
 
 }  // namespace
@@ -330,7 +304,7 @@ DaemonClient::~DaemonClient() { _socket->close(); }
 
 std::shared_ptr<LocalDaemon> DaemonClient::remoteObjectProxyWithErrorHandler(
     std::function<void(NSErrorPtr)> errorHandler) {
-  return std::make_shared<DaemonProxy>(_socket, std::move(errorHandler));
+  return std::make_shared<DaemonProxy>(DaemonCalls(_socket, std::move(errorHandler)));
 }
 
 void DaemonClient::setConnectedHandler(std::function<void()> handler) {

@@ -1,17 +1,9 @@
 #include "linux/protocol/HostCodec.h"
 
-#include <kj/debug.h>
-
 #include "vellum/VLQueryItem.h"
 
 namespace skein::codec {
 namespace {
-
-template <class Enum>
-Enum enumerator(std::uint8_t value, Enum last) {
-  KJ_REQUIRE(value <= static_cast<std::uint8_t>(last), "unknown value", value);
-  return static_cast<Enum>(value);
-}
 
 const VLQueryItem* queryItem(const NSFileProviderItemPtr& item) {
   return dynamic_cast<const VLQueryItem*>(item.get());

@@ -5,57 +5,7 @@
 using Cxx = import "/capnp/c++.capnp";
 $Cxx.namespace("skein::wire");
 
-# Errors travel as values. Exceptions of the RPC system mean that there was no answer.
-struct Error {
-  domain @0 :Data;
-  code @1 :Int64;
-  userInfo @2 :List(Entry);
-
-  struct Entry {
-    key @0 :Data;
-    union {
-      text @1 :Data;
-      error @2 :Error;
-      url @3 :Data;
-      item @4 :Item;
-    }
-  }
-}
-
-struct ObjectID {
-  rawID @0 :UInt64;
-  isInode @1 :Bool;
-}
-
-struct Item {
-  rawID @0 :UInt64;
-  isInode @1 :Bool;
-  kind @2 :UInt8;
-  isDead @3 :Bool;
-  isTrashed @4 :Bool;
-  isUploaded @5 :Bool;
-  isDownloaded @6 :Bool;
-  isShared @7 :Bool;
-  hasCreationDate @8 :Bool;
-  hasContentModificationDate @9 :Bool;
-  hasLastUsedDate @10 :Bool;
-  hasFavoriteRank @11 :Bool;
-  hasChildItemCount @12 :Bool;
-  capabilities @13 :UInt64;
-  size @14 :UInt64;
-  # Dates in nanoseconds since 1970; the largest value is the distant future.
-  creationDate @15 :Int64;
-  contentModificationDate @16 :Int64;
-  lastUsedDate @17 :Int64;
-  favoriteRank @18 :Int64;
-  childItemCount @19 :UInt64;
-  itemIdentifier @20 :Data;  # null: the string form of rawID and isInode
-  parentItemIdentifier @21 :Data;
-  filename @22 :Data;
-  typeIdentifier @23 :Data;
-  tagData @24 :Data;
-  containerID @25 :Data;
-}
+using Types = import "types.capnp";
 
 struct Account {
   name @0 :Data;
@@ -106,42 +56,44 @@ struct Fault {
 }
 
 interface Daemon {
-  enumerateItemsInFolder @0 (folder :ObjectID, sortOrder :UInt8, offset :UInt64, limit :UInt64)
-      -> (items :List(Item), nextOffset :UInt64, error :Error);
+  enumerateItemsInFolder @0 (folder :Types.ObjectID, sortOrder :UInt8, offset :UInt64,
+                             limit :UInt64)
+      -> (items :List(Types.Item), nextOffset :UInt64, error :Types.Error);
   enumerateAllFolders @1 (sortOrder :UInt8, offset :UInt64, limit :UInt64)
-      -> (items :List(Item), nextOffset :UInt64, error :Error);
-  currentNotifRank @2 () -> (rank :UInt64, error :Error);
+      -> (items :List(Types.Item), nextOffset :UInt64, error :Types.Error);
+  currentNotifRank @2 () -> (rank :UInt64, error :Types.Error);
   enumerateWorkingSetChanges @3 (changeToken :Data, limit :UInt64)
-      -> (updates :List(Item), deletions :List(ObjectID), changeToken :Data, error :Error);
-  getItemUpdateSender @4 (receiver :Receiver) -> (sender :Sender, error :Error);
+      -> (updates :List(Types.Item), deletions :List(Types.ObjectID), changeToken :Data,
+          error :Types.Error);
+  getItemUpdateSender @4 (receiver :Receiver) -> (sender :Sender, error :Types.Error);
 
-  urlForFileObjectID @5 (fileObjectID :ObjectID) -> (url :Data, error :Error);
-  queryItemForURL @6 (url :Data, scanFirst :Bool) -> (item :Item, error :Error);
-  account @7 () -> (account :Account, error :Error);
-  logIn @8 (account :Account) -> (error :Error);
-  logOut @9 () -> (error :Error);
-  containers @10 () -> (containers :List(Container), error :Error);
-  subscribe @11 (events :Events) -> (error :Error);
-  status @12 () -> (status :Status, error :Error);
-  checkIndex @13 (limit :UInt64) -> (differences :List(Difference), error :Error);
-  injectFault @14 (fault :Fault) -> (error :Error);
-  stop @15 () -> (error :Error);
+  urlForFileObjectID @5 (fileObjectID :Types.ObjectID) -> (url :Data, error :Types.Error);
+  queryItemForURL @6 (url :Data, scanFirst :Bool) -> (item :Types.Item, error :Types.Error);
+  account @7 () -> (account :Account, error :Types.Error);
+  logIn @8 (account :Account) -> (error :Types.Error);
+  logOut @9 () -> (error :Types.Error);
+  containers @10 () -> (containers :List(Container), error :Types.Error);
+  subscribe @11 (events :Events) -> (error :Types.Error);
+  status @12 () -> (status :Status, error :Types.Error);
+  checkIndex @13 (limit :UInt64) -> (differences :List(Difference), error :Types.Error);
+  injectFault @14 (fault :Fault) -> (error :Types.Error);
+  stop @15 () -> (error :Types.Error);
 }
 
 # vald's end of one watch; vald lets go of it with the last reference.
 interface Sender {
   boostPriority @0 ();
-  watchItem @1 (url :Data, options :UInt64) -> (error :Error);
+  watchItem @1 (url :Data, options :UInt64) -> (error :Types.Error);
   invalidate @2 ();
 }
 
 # The client's end of one watch.
 interface Receiver {
-  receiveUpdates @0 (items :List(Item), logicalExtensions :List(Data),
+  receiveUpdates @0 (items :List(Types.Item), logicalExtensions :List(Data),
                      physicalExtensions :List(Data));
-  receiveProgressUpdates @1 (items :List(Item));
+  receiveProgressUpdates @1 (items :List(Types.Item));
   # The sender has ended by itself: nothing more is pushed.
-  linkDidBreak @2 (error :Error);
+  linkDidBreak @2 (error :Types.Error);
 }
 
 interface Events {

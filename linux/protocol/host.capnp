@@ -6,6 +6,7 @@ using Cxx = import "/capnp/c++.capnp";
 $Cxx.namespace("skein::wire");
 
 using Daemon = import "daemon.capnp";
+using Types = import "types.capnp";
 
 struct Target {
   isIdentifier @0 :Bool;
@@ -13,7 +14,7 @@ struct Target {
 }
 
 struct HostItem {
-  item @0 :Daemon.Item;
+  item @0 :Types.Item;
   path @1 :Data;
   url @2 :Data;
 }
@@ -23,7 +24,7 @@ struct Change {
   identifier @1 :Data;
   filename @2 :Data;
   previousFilename @3 :Data;
-  item @4 :Daemon.Item;
+  item @4 :Types.Item;
 }
 
 struct HostStatus {
@@ -40,31 +41,31 @@ struct HostDifference {
 }
 
 interface Host {
-  list @0 (container :Target, order :UInt8) -> (listing :Listing, error :Daemon.Error);
-  item @1 (target :Target) -> (item :HostItem, error :Daemon.Error);
-  identifierForPath @2 (path :Data) -> (identifier :Data, error :Daemon.Error);
-  pathForIdentifier @3 (identifier :Data) -> (path :Data, error :Daemon.Error);
-  watch @4 (container :Target) -> (watch :Watch, error :Daemon.Error);
+  list @0 (container :Target, order :UInt8) -> (listing :Listing, error :Types.Error);
+  item @1 (target :Target) -> (item :HostItem, error :Types.Error);
+  identifierForPath @2 (path :Data) -> (identifier :Data, error :Types.Error);
+  pathForIdentifier @3 (identifier :Data) -> (path :Data, error :Types.Error);
+  watch @4 (container :Target) -> (watch :Watch, error :Types.Error);
   changesSince @5 (token :Data)
-      -> (updates :List(Daemon.Item), deletions :List(Data), token :Data, moreComing :Bool,
-          error :Daemon.Error);
-  account @6 () -> (account :Daemon.Account, error :Daemon.Error);
-  logIn @7 (account :Daemon.Account) -> (error :Daemon.Error);
-  logOut @8 () -> (error :Daemon.Error);
-  status @9 () -> (status :HostStatus, error :Daemon.Error);
-  check @10 () -> (check :Check, error :Daemon.Error);
-  setDebugLog @11 (enabled :Bool) -> (error :Daemon.Error);
+      -> (updates :List(Types.Item), deletions :List(Data), token :Data, moreComing :Bool,
+          error :Types.Error);
+  account @6 () -> (account :Daemon.Account, error :Types.Error);
+  logIn @7 (account :Daemon.Account) -> (error :Types.Error);
+  logOut @8 () -> (error :Types.Error);
+  status @9 () -> (status :HostStatus, error :Types.Error);
+  check @10 () -> (check :Check, error :Types.Error);
+  setDebugLog @11 (enabled :Bool) -> (error :Types.Error);
 }
 
 # Streams: each ends when its last reference goes. next may be called again before the
 # answer to the call before came; that is what keeps a listing flowing.
 interface Listing {
-  next @0 () -> (items :List(Daemon.Item), last :Bool, error :Daemon.Error);
+  next @0 () -> (items :List(Types.Item), last :Bool, error :Types.Error);
 }
 interface Watch {
-  next @0 () -> (changes :List(Change), error :Daemon.Error);
+  next @0 () -> (changes :List(Change), error :Types.Error);
 }
 interface Check {
   next @0 () -> (differences :List(HostDifference), folders :UInt64, items :UInt64,
-                 finished :Bool, error :Daemon.Error);
+                 finished :Bool, error :Types.Error);
 }
