@@ -8,29 +8,10 @@
 #include <string>
 #include <vector>
 
+#include "linux/protocol/HostTypes.h"
 #include "linux/protocol/LocalDaemon.h"
 
 namespace skein {
-
-// What a request is about: a path that begins at the drive's root ("/"), bytes, or an item
-// identifier, the reserved ones included.
-struct HostTarget {
-  enum class Kind : std::uint8_t { Path, Identifier };
-  Kind kind = Kind::Path;
-  std::string text = "/";
-
-  static HostTarget path(std::string text) { return {Kind::Path, std::move(text)}; }
-  static HostTarget identifier(std::string text) { return {Kind::Identifier, std::move(text)}; }
-};
-
-enum class HostOrder : std::uint8_t { Name = 0, Date = 1 };
-
-// One item, and where it is.
-struct HostItem {
-  NSFileProviderItemPtr item;
-  std::string path;  // from the drive's root
-  std::string url;   // of the file itself
-};
 
 // What happened to one item since it was last told of.
 struct HostChange {
@@ -80,14 +61,6 @@ struct HostCheckStep {
   bool finished = false;
 };
 
-// Something that is taken out bit by bit. next() may be called again before the answer
-// came; answers come in order. Letting go of the stream ends it.
-template <class... Values>
-class HostStream {
- public:
-  virtual ~HostStream() = default;
-  virtual void next(Reply<Values..., NSErrorPtr> reply) = 0;
-};
 using HostListing = HostStream<NSFileProviderItems, bool>;  // a page; whether it is the last
 using HostWatch = HostStream<std::vector<HostChange>>;      // waits until there is a change
 using HostCheck = HostStream<HostCheckStep>;
