@@ -12,7 +12,7 @@ namespace {
 // Errors beneath errors are cut off here; a cycle cannot be built, but a tower can.
 constexpr int kDeepestError = 8;
 
-void encodeError(wire::Error::Builder builder, const NSError& error, int depth) {
+void encodeToDepth(wire::Error::Builder builder, const NSError& error, int depth) {
   builder.setDomain(bytes(error.domain()));
   builder.setCode(error.code());
   auto entries = builder.initUserInfo(static_cast<unsigned>(error.userInfo().size()));
@@ -29,7 +29,7 @@ void encodeError(wire::Error::Builder builder, const NSError& error, int depth) 
             if (present) entry.setUrl(bytes(present->path()));
           } else if constexpr (std::is_same_v<T, NSErrorPtr>) {
             if (present && depth < kDeepestError) {
-              encodeError(entry.initError(), *present, depth + 1);
+              encodeToDepth(entry.initError(), *present, depth + 1);
             }
           } else {
             const auto* item = dynamic_cast<const VLQueryItem*>(present.get());
@@ -40,7 +40,7 @@ void encodeError(wire::Error::Builder builder, const NSError& error, int depth) 
   }
 }
 
-NSErrorPtr decodeError(wire::Error::Reader reader, int depth) {
+NSErrorPtr decodeToDepth(wire::Error::Reader reader, int depth) {
   NSErrorUserInfo userInfo;
   for (const auto entry : reader.getUserInfo()) {
     std::string key = text(entry.getKey());
@@ -50,7 +50,7 @@ NSErrorPtr decodeError(wire::Error::Reader reader, int depth) {
         break;
       case wire::Error::Entry::ERROR:
         if (entry.hasError() && depth < kDeepestError) {
-          userInfo.emplace(std::move(key), decodeError(entry.getError(), depth + 1));
+          userInfo.emplace(std::move(key), decodeToDepth(entry.getError(), depth + 1));
         }
         break;
       case wire::Error::Entry::URL:
@@ -89,9 +89,11 @@ std::string text(capnp::Data::Reader data) {
   return {reinterpret_cast<const char*>(data.begin()), data.size()};
 }
 
-void encode(wire::Error::Builder builder, const NSError& error) { encodeError(builder, error, 0); }
+void encode(wire::Error::Builder builder, const NSError& error) {
+  encodeToDepth(builder, error, 0);
+}
 
-NSErrorPtr decode(wire::Error::Reader reader) { return decodeError(reader, 0); }
+NSErrorPtr decode(wire::Error::Reader reader) { return decodeToDepth(reader, 0); }
 
 void encode(wire::ObjectID::Builder builder, const VLFileObjectID& fileObjectID) {
   builder.setRawID(fileObjectID.rawID());

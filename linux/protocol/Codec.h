@@ -35,6 +35,10 @@ template <class Results>
 void setError(Results results, const NSErrorPtr& error) {
   if (error) encode(results.initError(), *error);
 }
+// The answer of a method whose only result is an error.
+inline constexpr auto encodeError = [](auto results, const NSErrorPtr& error) {
+  setError(results, error);
+};
 
 void encode(wire::ObjectID::Builder builder, const VLFileObjectID& fileObjectID);
 VLFileObjectID decode(wire::ObjectID::Reader reader);

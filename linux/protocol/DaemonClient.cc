@@ -6,6 +6,7 @@
 #include "base/SerialQueue.h"
 #include "linux/protocol/DaemonCalls.h"
 #include "linux/protocol/DaemonCodec.h"
+#include "linux/protocol/FilesProxy.h"
 #include "linux/protocol/UpdateLink.h"
 
 namespace skein {
@@ -53,7 +54,10 @@ Task replyWithPage(VLDaemon::ItemsReply& reply, const Results& results) {
 
 class DaemonProxy final : public LocalDaemon {
  public:
-  explicit DaemonProxy(DaemonCalls calls) : _calls(std::move(calls)) {}
+  explicit DaemonProxy(DaemonCalls calls)
+      : _calls(std::move(calls)), _files(makeFilesProxy(_calls)) {}
+
+  LocalFiles& files() override { return *_files; }
 
   void enumerateItemsInFolder(std::optional<VLFileObjectID> folder, std::uint8_t sortOrder,
                               std::uint64_t offset, std::uint64_t limit,
@@ -289,6 +293,7 @@ class DaemonProxy final : public LocalDaemon {
   }
 
   const DaemonCalls _calls;
+  const std::unique_ptr<LocalFiles> _files;
 };
 
 }  // namespace

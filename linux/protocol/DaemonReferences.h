@@ -2,8 +2,6 @@
 // vald gave a client. Include this in few files: it costs seconds to compile.
 #pragma once
 
-#include <kj/async.h>
-
 #include <memory>
 #include <optional>
 #include <string>
@@ -11,43 +9,9 @@
 
 #include "base/Executor.h"
 #include "linux/protocol/DaemonCodec.h"
-#include "linux/protocol/RpcLoop.h"
+#include "linux/protocol/DaemonService.h"
 
 namespace skein {
-
-// What the objects of one server share. Its fields are used on the loop's thread.
-struct DaemonService final : private kj::TaskSet::ErrorHandler {
-  // Of all connections together.
-  static constexpr std::size_t kMostUnanswered = 8192;
-
-  DaemonService(std::shared_ptr<RpcLoop> rpcLoop, std::shared_ptr<Executor> runner,
-                std::shared_ptr<LocalDaemon> served)
-      : loop(std::move(rpcLoop)),
-        executor(std::move(runner)),
-        daemon(std::move(served)),
-        tasks(newTasks()) {}
-
-  // Lets go of the daemon and of everything on its way to clients. Once there are no more
-  // connections.
-  void close() {
-    tasks = newTasks();
-    daemon = nullptr;
-  }
-
-  const std::shared_ptr<RpcLoop> loop;
-  const std::shared_ptr<Executor> executor;
-  std::shared_ptr<LocalDaemon> daemon;
-  // Calls that vald has not answered, of clients that are gone too.
-  std::size_t unanswered = 0;
-  kj::Own<kj::TaskSet> tasks;
-
- private:
-  kj::Own<kj::TaskSet> newTasks() {
-    return kj::heap<kj::TaskSet>(static_cast<kj::TaskSet::ErrorHandler&>(*this));
-  }
-  void taskFailed(kj::Exception&&) override {}  // a push to a client that is gone
-};
-using DaemonServicePtr = std::shared_ptr<DaemonService>;
 
 // A client's receiver, as vald pushes to it. Any thread; replies come on the executor.
 class ReceiverReference final : public VLItemNotificationReceiving,
@@ -95,7 +59,7 @@ class EventsReference final : public LocalDaemonEvents,
 
 // vald's update sender, as its client calls it. Lives on the loop's thread; the client's
 // last reference ends it.
-class SenderObject final : public wire::Sender::Server {
+class SenderObject : public wire::Sender::Server {
  public:
   // `living`: counts the connection's senders.
   SenderObject(DaemonServicePtr service, std::shared_ptr<VLItemNotificationSender> sender,
@@ -116,8 +80,5 @@ class SenderObject final : public wire::Sender::Server {
 // wherever that reference goes.
 std::shared_ptr<VLItemNotificationSender> invalidatedAtTheEnd(
     std::shared_ptr<VLItemNotificationSender> sender, std::shared_ptr<Executor> executor);
-
-// A client's path: absolute, without NUL, "." and ".."; null otherwise.
-NSURLPtr urlFromClient(capnp::Data::Reader path);
 
 }  // namespace skein

@@ -6,8 +6,10 @@
 
 #include "linux/protocol/Answer.h"
 #include "linux/protocol/DaemonReferences.h"
+#include "linux/protocol/FilesObject.h"
 #include "linux/protocol/LinkBreaking.h"
 #include "linux/protocol/SocketServer.h"
+#include "linux/protocol/WithFaults.h"
 #include "vellum/VLErrors.h"
 
 namespace skein {
@@ -26,15 +28,17 @@ void encodePage(auto results, const NSFileProviderItems& items, std::uint64_t ne
   codec::setError(results, error);
 }
 
-// For methods whose only result is an error.
-constexpr auto encodeError = [](auto results, const NSErrorPtr& error) {
-  codec::setError(results, error);
-};
+// All of `values`, into a list as long as that.
+void encodeAll(auto list, const auto& values) {
+  unsigned at = 0;
+  for (const auto& value : values) codec::encode(list[at++], value);
+}
 
 // vald, as one connection sees it. Lives on the loop's thread.
-class DaemonObject final : public wire::Daemon::Server {
+class DaemonObject : public wire::Daemon::Server, public FilesObject {
  public:
-  explicit DaemonObject(DaemonServicePtr service) : _service(std::move(service)) {}
+  explicit DaemonObject(DaemonServicePtr service)
+      : FilesObject(service), _service(std::move(service)) {}
 
   kj::Promise<void> enumerateItemsInFolder(EnumerateItemsInFolderContext context) override {
     const auto params = context.getParams();
@@ -122,7 +126,8 @@ class DaemonObject final : public wire::Daemon::Server {
           codec::setError(results, error);
           if (!sender) return;
           auto* link = dynamic_cast<LinkBreaking*>(sender.get());
-          results.setSender(kj::heap<SenderObject>(service, std::move(sender), senders));
+          results.setSender(
+              kj::heap<WithFaults<SenderObject>>(service, std::move(sender), senders));
           if (link != nullptr) {
             link->setLinkBrokenHandler(
                 [receiver](NSErrorPtr broken) { receiver->linkDidBreak(std::move(broken)); });
@@ -171,12 +176,14 @@ class DaemonObject final : public wire::Daemon::Server {
     LocalAccount account = codec::decode(context.getParams().getAccount());
     return answer(
         _service, context,
-        [&](auto reply) { daemon().logIn(std::move(account), std::move(reply)); }, encodeError);
+        [&](auto reply) { daemon().logIn(std::move(account), std::move(reply)); },
+        codec::encodeError);
   }
 
   kj::Promise<void> logOut(LogOutContext context) override {
     return answer(
-        _service, context, [&](auto reply) { daemon().logOut(std::move(reply)); }, encodeError);
+        _service, context, [&](auto reply) { daemon().logOut(std::move(reply)); },
+        codec::encodeError);
   }
 
   kj::Promise<void> containers(ContainersContext context) override {
@@ -197,7 +204,8 @@ class DaemonObject final : public wire::Daemon::Server {
     _subscriptions.push_back(events);
     return answer(
         _service, context,
-        [&](auto reply) { daemon().subscribe(std::move(events), std::move(reply)); }, encodeError);
+        [&](auto reply) { daemon().subscribe(std::move(events), std::move(reply)); },
+        codec::encodeError);
   }
 
   kj::Promise<void> status(StatusContext context) override {
@@ -224,21 +232,18 @@ class DaemonObject final : public wire::Daemon::Server {
     FaultInjection fault = codec::decode(context.getParams().getFault());
     return answer(
         _service, context,
-        [&](auto reply) { daemon().injectFault(std::move(fault), std::move(reply)); }, encodeError);
+        [&](auto reply) { daemon().injectFault(std::move(fault), std::move(reply)); },
+        codec::encodeError);
   }
 
   kj::Promise<void> stop(StopContext context) override {
     return answer(
-        _service, context, [&](auto reply) { daemon().stop(std::move(reply)); }, encodeError);
+        _service, context, [&](auto reply) { daemon().stop(std::move(reply)); },
+        codec::encodeError);
   }
 
  private:
   LocalDaemon& daemon() const { return *_service->daemon; }
-
-  static void encodeAll(auto builder, const auto& values) {
-    unsigned at = 0;
-    for (const auto& value : values) codec::encode(builder[at++], value);
-  }
 
   const DaemonServicePtr _service;
   const std::shared_ptr<std::size_t> _senders = std::make_shared<std::size_t>(0);
@@ -267,15 +272,23 @@ std::unique_ptr<DaemonServer> DaemonServer::listen(const std::shared_ptr<RpcLoop
                                                    const std::shared_ptr<Executor>& executor,
                                                    const std::shared_ptr<LocalDaemon>& daemon,
                                                    const std::string& socketPath, Log& log,
-                                                   NSErrorOut error) {
+                                                   NSErrorOut error,
+                                                   const std::shared_ptr<CallFaults>& faults) {
   const DaemonServicePtr service =
-      loop->own(std::make_unique<DaemonService>(loop, executor, daemon));
+      loop->own(std::make_unique<DaemonService>(loop, executor, daemon, faults));
   auto implementation = std::make_unique<Implementation>(service);
   implementation->sockets = SocketServer::listen(
       loop, socketPath,
-      [service]() -> capnp::Capability::Client { return kj::heap<DaemonObject>(service); }, log, {},
-      error);
+      [service]() -> capnp::Capability::Client {
+        return kj::heap<WithFaults<DaemonObject>>(service);
+      },
+      log, {}, error);
   if (!implementation->sockets) return nullptr;
+  loop->post([service, weak = std::weak_ptr(implementation->sockets)] {
+    service->dropConnections = [weak] {
+      if (const auto sockets = weak.lock()) sockets->dropConnections();
+    };
+  });
   return std::unique_ptr<DaemonServer>(new DaemonServer(std::move(implementation)));
 }
 

@@ -4,6 +4,7 @@
 #include <string>
 
 #include "base/Executor.h"
+#include "linux/protocol/CallFaults.h"
 #include "linux/protocol/LocalDaemon.h"
 #include "linux/protocol/RpcLoop.h"
 #include "platform/log/Log.h"
@@ -23,12 +24,13 @@ namespace skein {
 class DaemonServer {
  public:
   // Listens from now on. Null with an error that names the socket. `log` has to outlive
-  // the server.
+  // the server. `faults` is asked before every call; null: no call has any.
   static std::unique_ptr<DaemonServer> listen(const std::shared_ptr<RpcLoop>& loop,
                                               const std::shared_ptr<Executor>& executor,
                                               const std::shared_ptr<LocalDaemon>& daemon,
                                               const std::string& socketPath, Log& log,
-                                              NSErrorOut error);
+                                              NSErrorOut error,
+                                              const std::shared_ptr<CallFaults>& faults = nullptr);
   // Closes the socket and every connection. When it returns, the server has let go of the
   // daemon and the log; update senders may still be on their way to the executor.
   ~DaemonServer();

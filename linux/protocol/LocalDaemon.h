@@ -10,6 +10,7 @@
 #include <string>
 #include <vector>
 
+#include "linux/protocol/LocalFiles.h"
 #include "vellum/VLContainer.h"
 #include "vellum/VLDaemonConnection.h"
 
@@ -58,9 +59,10 @@ struct IndexDifference {
 
 // "The next call of `method` answers this": for tests and trials. Reaches only the
 // owner of the socket, and only a vald that was started with fault injection allowed.
+// checkIndex, injectFault and stop have no faults.
 struct FaultInjection {
   enum class Action : std::uint8_t { AnswerError, DropConnection, Delay };
-  std::string method;  // the selector's first keyword, such as "enumerateItemsInFolder"
+  std::string method;  // as the schemas name it, such as "enumerateAllFolders" or "watchItem"
   Action action = Action::AnswerError;
   std::string errorDomain;
   std::int64_t errorCode = 0;
@@ -79,6 +81,10 @@ class LocalDaemonEvents {
 // Threads, replies and errors as VLDaemon says.
 class LocalDaemon : public VLDaemon {
  public:
+  // What it does to documents. Lives as long as this object; a proxy's has the same error
+  // handler.
+  virtual LocalFiles& files() = 0;
+
   // Null URL and an error for an identifier that names nothing.
   virtual void URLForFileObjectID(VLFileObjectID fileObjectID,
                                   Reply<NSURLPtr, NSErrorPtr> reply) = 0;

@@ -6,6 +6,7 @@ using Cxx = import "/capnp/c++.capnp";
 $Cxx.namespace("skein::wire");
 
 using Types = import "types.capnp";
+using Files = import "files.capnp";
 
 struct Account {
   name @0 :Data;
@@ -55,7 +56,7 @@ struct Fault {
   times @5 :UInt32;
 }
 
-interface Daemon {
+interface Daemon extends(Files.Files) {
   enumerateItemsInFolder @0 (folder :Types.ObjectID, sortOrder :UInt8, offset :UInt64,
                              limit :UInt64)
       -> (items :List(Types.Item), nextOffset :UInt64, error :Types.Error);

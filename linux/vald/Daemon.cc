@@ -241,9 +241,9 @@ void Daemon::checkIndex(std::uint64_t limit,
   });
 }
 
-void Daemon::injectFault(FaultInjection, Reply<NSErrorPtr> reply) {
-  answer(std::move(reply), [](Daemon&, auto& answered) {
-    answered(NSError::errorWithDomain(NSCocoaErrorDomain, NSFeatureUnsupportedError));
+void Daemon::injectFault(FaultInjection fault, Reply<NSErrorPtr> reply) {
+  answer(std::move(reply), [fault = std::move(fault)](Daemon& self, auto& answered) mutable {
+    answered(self._parts.faults.plan(std::move(fault)));
   });
 }
 

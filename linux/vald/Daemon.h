@@ -10,6 +10,7 @@
 #include "linux/vald/Accounts.h"
 #include "linux/vald/Containers.h"
 #include "linux/vald/EventSubscribers.h"
+#include "linux/vald/FaultInjector.h"
 #include "linux/vald/ItemUpdateSenders.h"
 #include "linux/vald/Store.h"
 
@@ -25,6 +26,8 @@ struct DaemonParts {
   Accounts& accounts;
   Containers& containers;
   EventSubscribers& subscribers;
+  LocalFiles& files;
+  FaultInjector& faults;
   Log& log;
   std::string drive;           // the drive's folder, absolute
   std::function<void()> stop;  // asks the process to end; returns at once
@@ -37,6 +40,8 @@ struct DaemonParts {
 class Daemon final : public LocalDaemon, public std::enable_shared_from_this<Daemon> {
  public:
   explicit Daemon(DaemonParts parts);
+
+  LocalFiles& files() override { return _parts.files; }
 
   void enumerateItemsInFolder(std::optional<VLFileObjectID> folder, std::uint8_t sortOrder,
                               std::uint64_t offset, std::uint64_t limit,
@@ -63,7 +68,7 @@ class Daemon final : public LocalDaemon, public std::enable_shared_from_this<Dae
   void status(Reply<LocalDaemonStatus, NSErrorPtr> reply) override;
   void checkIndex(std::uint64_t limit,
                   Reply<std::vector<IndexDifference>, NSErrorPtr> reply) override;
-  // Refuses: FaultingDaemon, around this one, has the faults.
+  // Plans it; the server has every call pass by the faults.
   void injectFault(FaultInjection fault, Reply<NSErrorPtr> reply) override;
   void stop(Reply<NSErrorPtr> reply) override;
 

@@ -1,30 +1,14 @@
 #include "linux/vald/FaultInjector.h"
 
 #include <algorithm>
-#include <array>
 #include <utility>
+#include <vector>
 
 #include "vellum/VLErrors.h"
 
 namespace skein::vald {
 namespace {
 
-// The methods that FaultingDaemon asks about.
-constexpr std::array<std::string_view, 13> kMethods = {
-    "enumerateItemsInFolder",
-    "enumerateAllFoldersWithSortOrder",
-    "currentNotifRankWithReply",
-    "enumerateWorkingSetChangesFromChangeToken",
-    "getItemUpdateSenderWithReceiver",
-    "URLForFileObjectID",
-    "queryItemForURL",
-    "account",
-    "logIn",
-    "logOut",
-    "containers",
-    "subscribe",
-    "status",
-};
 constexpr std::size_t kMostPlanned = 100;
 constexpr std::uint32_t kMostTimes = 1'000'000;
 constexpr std::uint32_t kLongestDelay = 60'000;
@@ -32,6 +16,22 @@ constexpr std::uint32_t kLongestDelay = 60'000;
 NSErrorPtr refused(std::string text) {
   return NSError::errorWithDomain(VLVellumErrorDomain, VLVellumErrorInvalidParameter,
                                   {{NSLocalizedDescriptionKey, std::move(text)}});
+}
+
+NSErrorPtr checkMethod(const FaultInjection& fault) {
+  const std::vector<FaultableMethod> methods = faultableMethods();
+  const auto found = std::find_if(methods.begin(), methods.end(),
+                                  [&](const auto& method) { return method.name == fault.method; });
+  if (found == methods.end()) {
+    std::string known;
+    for (const FaultableMethod& method : methods) known.append(" ").append(method.name);
+    return refused("No method \"" + fault.method + "\" takes faults; these do:" + known + ".");
+  }
+  if (fault.action == FaultInjection::Action::AnswerError && !found->answersErrors) {
+    return refused("\"" + fault.method +
+                   "\" answers no errors: it can be delayed, or lose its connection.");
+  }
+  return nullptr;
 }
 
 }  // namespace
@@ -42,11 +42,7 @@ NSErrorPtr FaultInjector::plan(FaultInjection fault) {
         "vald injects no faults: stop it and start it again with SKEIN_ALLOW_FAULTS=1 in its "
         "environment.");
   }
-  if (std::find(kMethods.begin(), kMethods.end(), fault.method) == kMethods.end()) {
-    std::string known;
-    for (const std::string_view method : kMethods) known.append(" ").append(method);
-    return refused("No method \"" + fault.method + "\" takes faults; these do:" + known + ".");
-  }
+  if (NSErrorPtr error = checkMethod(fault)) return error;
   if (fault.times == 0 || fault.times > kMostTimes || fault.delayMilliseconds > kLongestDelay) {
     return refused("A fault comes 1 to " + std::to_string(kMostTimes) +
                    " times and delays at most " + std::to_string(kLongestDelay) + " milliseconds.");

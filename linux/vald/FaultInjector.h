@@ -7,22 +7,21 @@
 #include <string_view>
 
 #include "base/Mutex.h"
-#include "linux/protocol/LocalDaemon.h"
+#include "linux/protocol/CallFaults.h"
 
 namespace skein::vald {
 
 // The faults that were asked for and have not come yet. Any thread.
-class FaultInjector {
+class FaultInjector final : public CallFaults {
  public:
   // `allowed`: whether vald was started with SKEIN_ALLOW_FAULTS=1.
   explicit FaultInjector(bool allowed) : _allowed(allowed) {}
 
   // Plans a fault behind those of the same method. An error when faults are not allowed,
-  // no such method can fail, or the numbers are out of bounds.
+  // no such method can have this one, or the numbers are out of bounds.
   NSErrorPtr plan(FaultInjection fault) SKEIN_EXCLUDES(_mutex);
 
-  // What the next call of `method` is to do; nil: nothing special.
-  std::optional<FaultInjection> take(std::string_view method) SKEIN_EXCLUDES(_mutex);
+  std::optional<FaultInjection> take(std::string_view method) override SKEIN_EXCLUDES(_mutex);
 
  private:
   const bool _allowed;

@@ -14,7 +14,6 @@
 #include <utility>
 #include <vector>
 
-#include "base/Mutex.h"
 #include "linux/protocol/DaemonServer.h"
 #include "linux/protocol/DrivePaths.h"
 #include "linux/protocol/LogFile.h"
@@ -29,10 +28,11 @@
 #include "linux/vald/DesktopEntries.h"
 #include "linux/vald/DriveListener.h"
 #include "linux/vald/EventSubscribers.h"
-#include "linux/vald/FaultingDaemon.h"
+#include "linux/vald/FaultInjector.h"
 #include "linux/vald/ItemUpdateSenders.h"
 #include "linux/vald/RunLock.h"
 #include "linux/vald/Store.h"
+#include "linux/vald/UnsupportedFiles.h"
 
 namespace skein::vald {
 namespace {
@@ -43,25 +43,6 @@ constexpr std::chrono::milliseconds kPatienceWithPredecessor{3000};
 // Who told vald to stop reads the reply meanwhile: were the connection closed at once, its
 // next write would fail and take the unread reply along.
 constexpr std::chrono::milliseconds kLastReply{200};
-
-// The server, as the faults reach it: there is none before it listens and after
-// it ended.
-class ServerSlot {
- public:
-  void put(std::unique_ptr<DaemonServer> server) SKEIN_EXCLUDES(_mutex) {
-    MutexLock lock(_mutex);
-    _server.swap(server);
-  }
-  // Only posts to the loop.
-  void dropConnections() SKEIN_EXCLUDES(_mutex) {
-    MutexLock lock(_mutex);
-    if (_server) _server->dropConnections();
-  }
-
- private:
-  Mutex _mutex;
-  std::unique_ptr<DaemonServer> _server SKEIN_GUARDED_BY(_mutex);
-};
 
 // As many descriptors as the system lets it have: clients and folders each cost
 // some.
@@ -120,29 +101,23 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
     wasToldToStop.store(true);
     kill(getpid(), SIGTERM);
   };
-  auto daemon =
-      std::make_shared<Daemon>(DaemonParts{executor, slowExecutor, *store, senders, accounts,
-                                           containers, subscribers, log, paths.store, stop});
+  UnsupportedFiles files(executor);
+  const auto faults = std::make_shared<FaultInjector>(faultsAreAllowed());
+  auto daemon = std::make_shared<Daemon>(DaemonParts{executor, slowExecutor, *store, senders,
+                                                     accounts, containers, subscribers, files,
+                                                     *faults, log, paths.store, stop});
   listener.setAfterChange([weak = std::weak_ptr<Daemon>(daemon)] {
     if (const auto changed = weak.lock()) changed->refreshDriveFolders();
   });
 
-  ServerSlot server;
-  auto served = std::make_shared<FaultingDaemon>(
-      FaultingDaemon::Parts{daemon, executor, faultsAreAllowed(),
-                            [executor](std::chrono::milliseconds delay) {
-                              ScopedWait wait(*executor);
-                              std::this_thread::sleep_for(delay);
-                            },
-                            [&server] { server.dropConnections(); }});
   const auto loop = RpcLoop::start("vald-io");
-  auto listening = DaemonServer::listen(loop, executor, served, paths.daemonSocket, log, &error);
-  if (!listening) {
+  auto server =
+      DaemonServer::listen(loop, executor, daemon, paths.daemonSocket, log, &error, faults);
+  if (!server) {
     executor->close();
     slowExecutor->close();
     return fail(error);
   }
-  server.put(std::move(listening));
   {
     const ApplicationsWatcher watcher(
         folders.applications, kQuietApplications, [&daemon] { daemon->refreshContainers(); }, log);
@@ -161,7 +136,7 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
 
   // From the outside in: no more calls come, those that came are answered, and with the
   // last work done nothing asks the store any more, which then closes its index.
-  server.put(nullptr);
+  server.reset();
   executor->close();
   slowExecutor->close();
   return EXIT_SUCCESS;

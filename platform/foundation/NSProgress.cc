@@ -9,6 +9,11 @@ std::int64_t NSProgress::totalUnitCount() const {
   return _total;
 }
 
+void NSProgress::setTotalUnitCount(std::int64_t count) {
+  MutexLock lock(_mutex);
+  _total = count;
+}
+
 std::int64_t NSProgress::completedUnitCount() const {
   MutexLock lock(_mutex);
   return _completed;

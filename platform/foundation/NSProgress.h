@@ -16,7 +16,9 @@ class NSProgress {
   }
   explicit NSProgress(std::int64_t totalUnitCount) : _total(totalUnitCount) {}
 
+  // 0 while nobody knows.
   std::int64_t totalUnitCount() const SKEIN_EXCLUDES(_mutex);
+  void setTotalUnitCount(std::int64_t count) SKEIN_EXCLUDES(_mutex);
   std::int64_t completedUnitCount() const SKEIN_EXCLUDES(_mutex);
   void setCompletedUnitCount(std::int64_t count) SKEIN_EXCLUDES(_mutex);
   bool isCancelled() const SKEIN_EXCLUDES(_mutex);

@@ -12,7 +12,7 @@
 #include "base/Mutex.h"
 #include "linux/protocol/LinkBreaking.h"
 #include "linux/protocol/LocalDaemon.h"
-#include "tests/protocol/Waiting.h"
+#include "tests/protocol/FakeFiles.h"
 
 namespace skein {
 
@@ -54,6 +54,9 @@ class FakeSender final : public VLItemNotificationSender, public LinkBreaking {
 
 class FakeDaemon final : public LocalDaemon {
  public:
+  FakeFiles fakeFiles;
+  LocalFiles& files() override { return fakeFiles; }
+
   // What is answered; set it before asking.
   VLQueryItems items;
   std::uint64_t number = 0;

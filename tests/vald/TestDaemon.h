@@ -12,6 +12,7 @@
 #include <vector>
 
 #include "linux/vald/Daemon.h"
+#include "linux/vald/UnsupportedFiles.h"
 #include "tests/support/ManualExecutor.h"
 #include "tests/vald/FakeStore.h"
 
@@ -76,19 +77,19 @@ class TestDaemon {
     accounts.emplace(*store, "somebody", log);
     containers.emplace(ContainerFolders{drive.path, state.path, {applications.path}}, log);
     daemon = std::make_shared<Daemon>(DaemonParts{executor, executor, *store, senders, *accounts,
-                                                  *containers, subscribers, log, drive.path,
-                                                  [this] { ++stops; }});
+                                                  *containers, subscribers, files, faults, log,
+                                                  drive.path, [this] { ++stops; }});
   }
 
   // Makes the call that `request(daemon, reply)` makes, and runs everything; the test
   // fails unless the reply comes once, and not inside the call.
   template <class... Values, class Request>
-  std::tuple<Values...> call(Request request, LocalDaemon* of = nullptr) {
+  std::tuple<Values...> call(Request request) {
     std::optional<std::tuple<Values...>> answer;
-    request(of != nullptr ? *of : *daemon, Reply<Values...>([&answer](Values... values) {
-              EXPECT_FALSE(answer) << "answered twice";
-              answer.emplace(std::move(values)...);
-            }));
+    request(*daemon, Reply<Values...>([&answer](Values... values) {
+      EXPECT_FALSE(answer) << "answered twice";
+      answer.emplace(std::move(values)...);
+    }));
     EXPECT_FALSE(answer) << "answered inside the call";
     executor->runAll();
     EXPECT_TRUE(answer) << "never answered";
@@ -101,6 +102,8 @@ class TestDaemon {
   FakeStore::Settings settings;
   ItemUpdateSenders senders;
   EventSubscribers subscribers{executor};
+  UnsupportedFiles files{executor};
+  FaultInjector faults{true};
   std::optional<FakeStore> store;
   std::optional<Accounts> accounts;
   std::optional<Containers> containers;

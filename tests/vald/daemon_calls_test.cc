@@ -5,7 +5,6 @@
 
 #include "linux/vald/ApplicationsWatcher.h"
 #include "linux/vald/ChangeToken.h"
-#include "linux/vald/FaultingDaemon.h"
 #include "platform/fileprovider/NSFileProviderError.h"
 #include "tests/vald/TestDaemon.h"
 #include "vellum/VLErrors.h"
@@ -301,56 +300,38 @@ TEST_F(DaemonCalls, ApplicationFoldersAreWatchedBeforeAndAfterTheyExist) {
 }
 
 TEST_F(DaemonCalls, FaultsComeAsOftenAsTheyWereAskedForAndOnlyWhenAllowed) {
-  int drops = 0;
-  std::vector<std::chrono::milliseconds> slept;
-  const auto faulting = [&](bool allowed) {
-    return std::make_shared<FaultingDaemon>(
-        FaultingDaemon::Parts{d.daemon, d.executor, allowed,
-                              [&](auto time) { slept.push_back(time); }, [&] { ++drops; }});
-  };
-  const auto inject = [&](const std::shared_ptr<FaultingDaemon>& daemon, FaultInjection fault) {
+  const auto inject = [&](FaultInjection fault) {
     return std::get<0>(d.call<NSErrorPtr>(
-        [&](LocalDaemon& to, auto reply) { to.injectFault(fault, std::move(reply)); },
-        daemon.get()));
-  };
-  const auto status = [&](const std::shared_ptr<FaultingDaemon>& daemon) {
-    return std::get<1>(d.call<LocalDaemonStatus, NSErrorPtr>(
-        [](LocalDaemon& to, auto reply) { to.status(std::move(reply)); }, daemon.get()));
+        [&](LocalDaemon& to, auto reply) { to.injectFault(fault, std::move(reply)); }));
   };
   FaultInjection fault{"status", FaultInjection::Action::AnswerError, "X", 7, 0, 2};
-
-  const auto closed = faulting(false);
-  const NSErrorPtr refusal = inject(closed, fault);
+  const NSErrorPtr refusal = FaultInjector(false).plan(fault);
   ASSERT_TRUE(refusal);
   EXPECT_NE(refusal->localizedDescription().find("SKEIN_ALLOW_FAULTS=1"), std::string::npos);
-  EXPECT_FALSE(status(closed));
 
-  const auto open = faulting(true);
-  EXPECT_FALSE(inject(open, fault));
+  EXPECT_FALSE(inject(fault));
   fault.action = FaultInjection::Action::Delay;
-  fault.delayMilliseconds = 30;
   fault.times = 1;
-  EXPECT_FALSE(inject(open, fault));
+  EXPECT_FALSE(inject(fault));
+  EXPECT_FALSE(d.faults.take("account"));
   for (int i = 0; i < 2; ++i) {
-    const NSErrorPtr error = status(open);
-    ASSERT_TRUE(error);
-    EXPECT_EQ(error->domain(), "X");
-    EXPECT_EQ(error->code(), 7);
+    EXPECT_EQ(d.faults.take("status").value().action, FaultInjection::Action::AnswerError);
   }
-  EXPECT_FALSE(status(open));
-  EXPECT_EQ(slept.size(), 1u);
-  EXPECT_FALSE(status(open));
+  EXPECT_EQ(d.faults.take("status").value().action, FaultInjection::Action::Delay);
+  EXPECT_FALSE(d.faults.take("status"));
 
-  fault.action = FaultInjection::Action::DropConnection;
-  EXPECT_FALSE(inject(open, fault));
-  open->status([](const LocalDaemonStatus&, const NSErrorPtr&) { FAIL() << "answered"; });
-  d.executor->runAll();
-  EXPECT_EQ(drops, 1);
-  fault.method = "nonsense";
-  EXPECT_TRUE(inject(open, fault));
+  // What is served on the way to something else can have faults too, but not every one.
+  fault.method = "boostPriority";
+  EXPECT_FALSE(inject(fault));
+  fault.action = FaultInjection::Action::AnswerError;
+  EXPECT_TRUE(inject(fault));
+  for (const char* kept : {"stop", "injectFault", "checkIndex", "nonsense"}) {
+    fault.method = kept;
+    EXPECT_TRUE(inject(fault)) << kept;
+  }
   fault.method = "status";
   fault.times = 0;
-  EXPECT_TRUE(inject(open, fault));
+  EXPECT_TRUE(inject(fault));
 }
 
 TEST_F(DaemonCalls, StopRepliesAndAsksTheProcessToEnd) {
