@@ -14,6 +14,8 @@
 #include "vellum/VLDaemonConnection.h"
 #include "vellum/VLDocuments.h"
 #include "vellum/VLFileOperations.h"
+#include "vellum/VLResourceValues.h"
+#include "vellum/VLSharingOperations.h"
 
 namespace skein {
 
@@ -37,6 +39,8 @@ struct Environment {
   VLFileManager& fileManager;
   VLOperations& operations;
   LSBundles& bundles;
+  VLSharingOperations& sharingOperations;
+  VLResourceValues& resourceValues;
   Log& fileProviderLog;  // fp_current_or_default_log
 };
 

@@ -107,6 +107,27 @@ class VLDaemon {
   virtual void getContainerURLForID(
       const std::string& containerID, bool recreateDocumentsIfNeeded,
       Reply<NSURLPtr, std::optional<std::string>, bool, NSErrorPtr> reply);
+
+  // The three below, as the one above, answer NSFeatureUnsupportedError here.
+
+  // checkIfItemIsShareableWithInode:reply: whether a folder or alias may be shared; `inode`
+  // is its identifier's number.
+  virtual void checkIfItemIsShareableWithInode(std::uint64_t inode, Reply<bool, NSErrorPtr> reply);
+
+  // refreshSharingStateForItemIdentifier:reply: the daemon asks the cloud anew whether and
+  // how the item is shared, and replies when its own state is up to date.
+  virtual void refreshSharingStateForItemIdentifier(const NSFileProviderItemIdentifier& identifier,
+                                                    Reply<NSErrorPtr> reply);
+
+  // getShareOptionsOfItemIdentifier:reply: how the item is shared. In order: a set of flags,
+  // one for each way in which the item is reached through a share, its own or that of a
+  // folder above it; its own share's public permission; those of the flags that are the
+  // item's own share's; the name of the shared folder, nil when there is none; an error.
+  // Flags of the first set that are not in the other tell of a shared folder above.
+  virtual void getShareOptionsOfItemIdentifier(
+      const NSFileProviderItemIdentifier& identifier,
+      Reply<std::int64_t, std::int64_t, std::int64_t, std::optional<std::string>, NSErrorPtr>
+          reply);
 };
 
 // The process's connection to vald; it is made anew when it was lost. Any thread.

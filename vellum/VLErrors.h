@@ -2,6 +2,7 @@
 #pragma once
 
 #include <cstdint>
+#include <functional>
 #include <string>
 
 #include "platform/foundation/NSError.h"
@@ -28,6 +29,20 @@ NSErrorPtr vlc_errorInvalidParameter(const std::string& name, const std::string&
 
 // vl_errorWithPOSIXCode:description: in NSPOSIXErrorDomain.
 NSErrorPtr vl_errorWithPOSIXCode(int code, const std::string& description);
+// vl_errorWithPOSIXCode: without a text, as the number need not mean here what it meant
+// where it was written.
+NSErrorPtr vl_errorWithPOSIXCode(int code);
+
+// vl_isVellumErrorCode: NO for null.
+bool vl_isVellumErrorCode(const NSErrorPtr& error, std::int64_t code);
+
+// vlc_isCloudKitUnknownItemError: CKErrorDomain CKErrorUnknownItem. NO for null.
+bool vlc_isCloudKitUnknownItemError(const NSErrorPtr& error);
+
+// vlc_checkErrorsFromCloudKit: whether `test` says yes to the error, to one of a partial
+// failure's errors, or to an error underneath. NO for null, which is not tested.
+bool vlc_checkErrorsFromCloudKit(const NSErrorPtr& error,
+                                 const std::function<bool(const NSErrorPtr&)>& test);
 
 // vald could not be reached or its connection broke; `reason` says how.
 NSErrorPtr vl_errorDaemonUnreachable(const std::string& reason);

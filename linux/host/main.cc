@@ -19,6 +19,7 @@
 #include "extension/VLFileProviderExtension.h"
 #include "linux/framework/LocalFramework.h"
 #include "linux/framework/UnsupportedFileOperations.h"
+#include "linux/framework/UnsupportedSharing.h"
 #include "linux/host/HostRequests.h"
 #include "linux/host/NSExtensionMain.h"
 #include "linux/protocol/HostServer.h"
@@ -188,6 +189,8 @@ int serve(const Arguments& arguments, const DrivePaths& paths, const FileDescrip
   UnsupportedFileManager fileManager(*log);
   UnsupportedOperations operations;
   UnsupportedBundles bundles;
+  UnsupportedSharingOperations sharingOperations;
+  UnsupportedResourceValues resourceValues;
   Environment environment{*log,
                           executor,
                           notificationCenter,
@@ -203,6 +206,8 @@ int serve(const Arguments& arguments, const DrivePaths& paths, const FileDescrip
                           fileManager,
                           operations,
                           bundles,
+                          sharingOperations,
+                          resourceValues,
                           *log};
 
   const NSExtensionPrincipalClasses classes{

@@ -1,4 +1,4 @@
-// The cloud's records, as far as thumbnails and shares need them.
+// The cloud's records, as far as thumbnails need them.
 #pragma once
 
 #include <compare>
@@ -17,9 +17,6 @@ namespace skein {
 
 // The owner name of one's own zones.
 inline constexpr char CKCurrentUserDefaultName[] = "__defaultOwner__";
-
-// The user-information key of a share that tells its type; "folder" is significant.
-inline constexpr char CKShareTypeKey[] = "cloudkit.type";
 
 // A zone and a record by name: values that work as keys.
 struct CKRecordZoneID {

@@ -15,6 +15,12 @@ std::string withoutTrailingSeparators(std::string path) {
 
 NSURL::NSURL(std::string path) : _path(withoutTrailingSeparators(std::move(path))) {}
 
+NSURLPtr NSURL::URLWithString(std::string string) {
+  const auto colon = string.find(':');
+  if (colon == std::string::npos || colon == 0 || string.starts_with("file:")) return nullptr;
+  return NSURLPtr(new NSURL({}, std::move(string)));
+}
+
 std::string NSURL::lastPathComponent() const {
   if (_path == "/") return _path;
   return _path.substr(_path.rfind('/') + 1);
@@ -31,6 +37,7 @@ NSURLPtr NSURL::URLByDeletingLastPathComponent() const {
 }
 
 std::string NSURL::absoluteString() const {
+  if (!isFileURL()) return _address;
   constexpr std::string_view kPlain =
       "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789-._~/!$&'()*+,;=:@";
   constexpr std::string_view kDigits = "0123456789ABCDEF";

@@ -100,6 +100,23 @@ class ScriptedDaemon::Proxy final : public VLDaemon {
     say("url of container " + containerID + (recreateDocumentsIfNeeded ? ", recreated" : ""));
     _daemon.containerURLs.hold(std::move(reply), _errorHandler);
   }
+  void checkIfItemIsShareableWithInode(std::uint64_t inode,
+                                       Reply<bool, NSErrorPtr> reply) override {
+    say("is inode " + std::to_string(inode) + " shareable");
+    _daemon.shareableChecks.hold(std::move(reply), _errorHandler);
+  }
+  void refreshSharingStateForItemIdentifier(const NSFileProviderItemIdentifier& identifier,
+                                            Reply<NSErrorPtr> reply) override {
+    say("refresh the sharing of " + identifier);
+    _daemon.sharingRefreshes.hold(std::move(reply), _errorHandler);
+  }
+  void getShareOptionsOfItemIdentifier(
+      const NSFileProviderItemIdentifier& identifier,
+      Reply<std::int64_t, std::int64_t, std::int64_t, std::optional<std::string>, NSErrorPtr> reply)
+      override {
+    say("share options of " + identifier);
+    _daemon.shareOptions.hold(std::move(reply), _errorHandler);
+  }
 
  private:
   void say(const std::string& call) { _daemon._transcript.add("daemon: " + call); }

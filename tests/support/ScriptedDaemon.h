@@ -59,6 +59,9 @@ class ScriptedDaemon final : public VLDaemonConnection {
         workingSetChanges(ledger),
         senders(ledger),
         containerURLs(ledger),
+        shareableChecks(ledger),
+        sharingRefreshes(ledger),
+        shareOptions(ledger),
         _transcript(transcript),
         _ledger(ledger) {}
 
@@ -79,6 +82,10 @@ class ScriptedDaemon final : public VLDaemonConnection {
       workingSetChanges;
   HeldCalls<std::shared_ptr<VLItemNotificationSender>, NSErrorPtr> senders;
   HeldCalls<NSURLPtr, std::optional<std::string>, bool, NSErrorPtr> containerURLs;
+  HeldCalls<bool, NSErrorPtr> shareableChecks;
+  HeldCalls<NSErrorPtr> sharingRefreshes;
+  HeldCalls<std::int64_t, std::int64_t, std::int64_t, std::optional<std::string>, NSErrorPtr>
+      shareOptions;
 
  private:
   class Proxy;

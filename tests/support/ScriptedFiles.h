@@ -3,6 +3,7 @@
 // transcript.
 #pragma once
 
+#include <atomic>
 #include <functional>
 #include <map>
 #include <set>
@@ -101,7 +102,11 @@ class ScriptedProvidingOperation final
   void cancel() override SKEIN_EXCLUDES(_mutex);
   void setFileProvidingCompletion(UniqueFunction<void(NSErrorPtr)> completion) override
       SKEIN_EXCLUDES(_mutex);
-  void setWantsCurrentVersion(bool /*wantsCurrentVersion*/) override {}
+  void setWantsCurrentVersion(bool wantsCurrentVersion) override {
+    wantsCurrent = wantsCurrentVersion;
+  }
+
+  std::atomic<bool> wantsCurrent{false};
 
   // False when it had reported before.
   bool finish(const NSErrorPtr& error) SKEIN_EXCLUDES(_mutex);

@@ -11,6 +11,7 @@
 #include "tests/support/HeldCalls.h"
 #include "tests/support/ScriptedDaemon.h"
 #include "tests/support/ScriptedFiles.h"
+#include "tests/support/ScriptedSharing.h"
 #include "tests/support/Transcript.h"
 #include "vellum/VLAccount.h"
 #include "vellum/VLContainer.h"
@@ -128,7 +129,9 @@ struct ScriptedFramework {
         fileOperations(transcript, ledger),
         fileManager(transcript),
         operations(transcript),
-        bundles(transcript) {}
+        bundles(transcript),
+        sharing(transcript),
+        resourceValues(transcript) {}
 
   // Every unanswered call's error handler runs, here, and receivers are let go of.
   void dropConnection(const NSErrorPtr& error) {
@@ -147,6 +150,8 @@ struct ScriptedFramework {
   ScriptedFileManager fileManager;
   ScriptedOperations operations;
   ScriptedBundles bundles;
+  ScriptedSharing sharing;
+  ScriptedResourceValues resourceValues;
 };
 
 }  // namespace skein

@@ -24,6 +24,8 @@ TestEnvironment::TestEnvironment(std::shared_ptr<Executor> other,
                   framework.fileManager,
                   framework.operations,
                   framework.bundles,
+                  framework.sharing,
+                  framework.resourceValues,
                   fileProviderLog} {
   framework.containers.add(VLUbiquitousDefaultContainerID, storeURL());
   _previousFaultHandler =
