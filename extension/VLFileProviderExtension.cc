@@ -12,6 +12,7 @@
 #include "extension/operations/TagData.h"
 #include "extension/operations/TrashItem.h"
 #include "extension/operations/UntrashItem.h"
+#include "services/SupportedServices.h"
 
 namespace skein {
 
@@ -172,6 +173,14 @@ void VLFileProviderExtension::_defaultApplicationContainerForBundleIdentifier(
     std::optional<std::string> bundleIdentifier, ItemCompletion completionHandler) {
   skein::_defaultApplicationContainerForBundleIdentifier(request(), bundleIdentifier,
                                                          std::move(completionHandler));
+}
+
+// Services.
+
+NSFileProviderServiceSources VLFileProviderExtension::supportedServiceSourcesForItemIdentifier(
+    const NSFileProviderItemIdentifier& identifier, NSErrorOut /*error*/) {
+  return skein::supportedServiceSourcesForItemIdentifier(identifier, request().lookup,
+                                                         _operationQueue, _environment);
 }
 
 }  // namespace skein

@@ -76,6 +76,8 @@ class VLFileProviderExtension final : public NSFileProviderExtension,
                        ItemCompletion completionHandler) override;
   void _defaultApplicationContainerForBundleIdentifier(std::optional<std::string> bundleIdentifier,
                                                        ItemCompletion completionHandler) override;
+  NSFileProviderServiceSources supportedServiceSourcesForItemIdentifier(
+      const NSFileProviderItemIdentifier& identifier, NSErrorOut error) override;
 
  private:
   explicit VLFileProviderExtension(Environment& environment);

@@ -7,6 +7,7 @@
 #include "platform/foundation/NSNotificationCenter.h"
 #include "platform/launchservices/LSBundleProxy.h"
 #include "platform/log/Log.h"
+#include "platform/xpc/NSXPCListener.h"
 #include "support/RootURL.h"
 #include "support/VLLogSection.h"
 #include "vellum/VLAccount.h"
@@ -41,6 +42,7 @@ struct Environment {
   LSBundles& bundles;
   VLSharingOperations& sharingOperations;
   VLResourceValues& resourceValues;
+  NSXPCListeners& xpcListeners;
   Log& fileProviderLog;  // fp_current_or_default_log
 };
 

@@ -5,15 +5,9 @@
 #include <vector>
 
 #include "platform/foundation/NSError.h"
+#include "platform/xpc/NSXPCListener.h"
 
 namespace skein {
-
-// A reference that a client process connects to, and through which it reaches one
-// exported object and nothing else. What it holds is the transport's.
-class NSXPCListenerEndpoint {
- public:
-  virtual ~NSXPCListenerEndpoint() = default;
-};
 
 // One service that an item offers to client apps. Any thread.
 class NSFileProviderServiceSource {

@@ -20,8 +20,13 @@ std::int64_t NSProgress::completedUnitCount() const {
 }
 
 void NSProgress::setCompletedUnitCount(std::int64_t count) {
-  MutexLock lock(_mutex);
-  _completed = count;
+  std::function<void(std::int64_t)> handler;
+  {
+    MutexLock lock(_mutex);
+    _completed = count;
+    handler = _countHandler;
+  }
+  if (handler) handler(count);
 }
 
 bool NSProgress::isCancelled() const {
@@ -43,6 +48,23 @@ void NSProgress::setCancellationHandler(std::function<void()> handler) {
     }
   }
   if (handler) handler();
+}
+
+void NSProgress::setCancellationHandlerWhileCountIsZero(std::function<void()> handler) {
+  {
+    MutexLock lock(_mutex);
+    if (_completed != 0) return;
+    if (!_cancelled) {
+      _handler = std::move(handler);
+      return;
+    }
+  }
+  if (handler) handler();
+}
+
+void NSProgress::setCountHandler(std::function<void(std::int64_t)> handler) {
+  MutexLock lock(_mutex);
+  _countHandler.swap(handler);
 }
 
 void NSProgress::cancel() {

@@ -28,6 +28,13 @@ class NSProgress {
 
   // Replaces the handler; runs it at once, on this thread, when already cancelled.
   void setCancellationHandler(std::function<void()> handler) SKEIN_EXCLUDES(_mutex);
+  // The same while nothing is completed; else it does nothing. In one step: whoever counts
+  // the first unit and then sets a handler of its own keeps that one.
+  void setCancellationHandlerWhileCountIsZero(std::function<void()> handler) SKEIN_EXCLUDES(_mutex);
+
+  // Runs with the completed count when that is set, on the setter's thread and without the
+  // lock. One for each progress: the transport's, which tells a client process.
+  void setCountHandler(std::function<void(std::int64_t)> handler) SKEIN_EXCLUDES(_mutex);
 
   // Runs the handler, once, on the calling thread and without the lock.
   void cancel() SKEIN_EXCLUDES(_mutex);
@@ -39,6 +46,7 @@ class NSProgress {
   bool _cancellable SKEIN_GUARDED_BY(_mutex) = true;
   bool _cancelled SKEIN_GUARDED_BY(_mutex) = false;
   std::function<void()> _handler SKEIN_GUARDED_BY(_mutex);
+  std::function<void(std::int64_t)> _countHandler SKEIN_GUARDED_BY(_mutex);
 };
 
 }  // namespace skein

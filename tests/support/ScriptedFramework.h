@@ -12,6 +12,7 @@
 #include "tests/support/ScriptedDaemon.h"
 #include "tests/support/ScriptedFiles.h"
 #include "tests/support/ScriptedSharing.h"
+#include "tests/support/ScriptedXPC.h"
 #include "tests/support/Transcript.h"
 #include "vellum/VLAccount.h"
 #include "vellum/VLContainer.h"
@@ -131,11 +132,13 @@ struct ScriptedFramework {
         operations(transcript),
         bundles(transcript),
         sharing(transcript),
-        resourceValues(transcript) {}
+        resourceValues(transcript),
+        xpcListeners(transcript) {}
 
   // Every unanswered call's error handler runs, here, and receivers are let go of.
   void dropConnection(const NSErrorPtr& error) {
     ledger.drop(error);
+    sharing.drop();
     daemon.releaseReceivers();
   }
 
@@ -152,6 +155,7 @@ struct ScriptedFramework {
   ScriptedBundles bundles;
   ScriptedSharing sharing;
   ScriptedResourceValues resourceValues;
+  ScriptedListeners xpcListeners;
 };
 
 }  // namespace skein

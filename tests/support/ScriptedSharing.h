@@ -59,6 +59,10 @@ class ScriptedShareOperation : public Operation {
     return true;
   }
 
+  void reportCancelled() {
+    finish(Values()..., NSError::errorWithDomain(NSCocoaErrorDomain, NSUserCancelledError));
+  }
+
   // Called as it starts; set before it is queued.
   std::function<void()> onStart;
 
@@ -70,10 +74,6 @@ class ScriptedShareOperation : public Operation {
   }
 
  private:
-  void reportCancelled() {
-    finish(Values()..., NSError::errorWithDomain(NSCocoaErrorDomain, NSUserCancelledError));
-  }
-
   const std::string _name;
   Transcript& _transcript;
   Mutex _mutex;
@@ -123,6 +123,16 @@ class MadeOperations {
     return operation;
   }
 
+  // Those that are left report that they were cancelled.
+  void drop() SKEIN_EXCLUDES(_mutex) {
+    std::deque<std::shared_ptr<Operation>> left;
+    {
+      MutexLock lock(_mutex);
+      left.swap(_operations);
+    }
+    for (const auto& operation : left) operation->reportCancelled();
+  }
+
   // Called with each as it is made; set before threads are.
   std::function<void(const std::shared_ptr<Operation>&)> made;
 
@@ -143,6 +153,15 @@ class ScriptedSharing final : public VLSharingOperations {
   std::shared_ptr<VLSharingCopyShareTokenOperation> copyShareTokenOperation(
       const NSURLPtr& url) override;
   CKSharePtr VLSharingCreateShareForItemAtURL(const NSURLPtr& url, NSErrorOut error) override;
+
+  // Every operation that is left reports.
+  void drop() {
+    copies.drop();
+    urls.drop();
+    saves.drop();
+    destroys.drop();
+    tokens.drop();
+  }
 
   MadeOperations<ScriptedShareCopy> copies;
   MadeOperations<ScriptedCopyShareURL> urls;

@@ -26,6 +26,7 @@ TestEnvironment::TestEnvironment(std::shared_ptr<Executor> other,
                   framework.bundles,
                   framework.sharing,
                   framework.resourceValues,
+                  framework.xpcListeners,
                   fileProviderLog} {
   framework.containers.add(VLUbiquitousDefaultContainerID, storeURL());
   _previousFaultHandler =
