@@ -152,6 +152,29 @@ class DaemonProxy final : public LocalDaemon {
         });
   }
 
+  void getContainerURLForID(
+      const std::string& containerID, bool recreateDocumentsIfNeeded,
+      Reply<NSURLPtr, std::optional<std::string>, bool, NSErrorPtr> reply) override {
+    call(
+        [=](wire::Daemon::Client& daemon) {
+          auto request = daemon.getContainerURLForIDRequest();
+          request.setContainerID(codec::bytes(containerID));
+          request.setRecreateDocumentsIfNeeded(recreateDocumentsIfNeeded);
+          return request.send();
+        },
+        [reply = std::move(reply)](const auto& results) mutable -> Task {
+          NSURLPtr url;
+          if (results.hasUrl()) url = NSURL::fileURLWithPath(codec::text(results.getUrl()));
+          std::optional<std::string> displayName;
+          if (results.hasDisplayName()) displayName = codec::text(results.getDisplayName());
+          return
+              [reply = std::move(reply), url = std::move(url), displayName = std::move(displayName),
+               recreated = results.getRecreated(), error = codec::errorOf(results)]() mutable {
+                reply(std::move(url), std::move(displayName), recreated, std::move(error));
+              };
+        });
+  }
+
   void URLForFileObjectID(VLFileObjectID fileObjectID, Reply<NSURLPtr, NSErrorPtr> reply) override {
     call(
         [=](wire::Daemon::Client& daemon) {

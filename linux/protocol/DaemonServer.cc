@@ -135,6 +135,23 @@ class DaemonObject : public wire::Daemon::Server, public FilesObject {
         });
   }
 
+  kj::Promise<void> getContainerURLForID(GetContainerURLForIDContext context) override {
+    const auto params = context.getParams();
+    return answer(
+        _service, context,
+        [&](auto reply) {
+          daemon().getContainerURLForID(codec::text(params.getContainerID()),
+                                        params.getRecreateDocumentsIfNeeded(), std::move(reply));
+        },
+        [](auto results, const NSURLPtr& url, const std::optional<std::string>& displayName,
+           bool recreated, const NSErrorPtr& error) {
+          if (url) results.setUrl(codec::bytes(url->path()));
+          if (displayName) results.setDisplayName(codec::bytes(*displayName));
+          results.setRecreated(recreated);
+          codec::setError(results, error);
+        });
+  }
+
   kj::Promise<void> urlForFileObjectID(UrlForFileObjectIDContext context) override {
     const VLFileObjectID id = codec::decode(context.getParams().getFileObjectID());
     return answer(

@@ -79,6 +79,8 @@ interface Daemon extends(Files.Files) {
   checkIndex @13 (limit :UInt64) -> (differences :List(Difference), error :Types.Error);
   injectFault @14 (fault :Fault) -> (error :Types.Error);
   stop @15 () -> (error :Types.Error);
+  getContainerURLForID @16 (containerID :Data, recreateDocumentsIfNeeded :Bool)
+      -> (url :Data, displayName :Data, recreated :Bool, error :Types.Error);
 }
 
 # vald's end of one watch; vald lets go of it with the last reference.

@@ -2,9 +2,13 @@
 
 #include <sys/stat.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <system_error>
 #include <utility>
+
+#include "linux/vald/files/FileErrors.h"
+#include "vellum/VLErrors.h"
 
 namespace skein::vald {
 namespace {
@@ -89,6 +93,40 @@ std::vector<VLContainer::Properties> Containers::list() const {
     containers.push_back(std::move(container));
   }
   return containers;
+}
+
+VLContainer::Properties Containers::find(const std::string& containerID, bool recreate,
+                                         bool& recreated, NSErrorOut error) {
+  recreated = false;
+  const std::vector<VLContainer::Properties> all = list();
+  const auto found = std::find_if(all.begin(), all.end(), [&](const auto& container) {
+    return container.containerID == containerID;
+  });
+  if (found == all.end()) {
+    error.store(vlc_errorInvalidParameter("containerID", containerID));
+    return {};
+  }
+  VLContainer::Properties container = *found;
+  const bool isDrive = containerID == VLUbiquitousDefaultContainerID;
+  std::string folder = _folders.drive;
+  if (isAppContainerID(containerID)) {
+    folder =
+        within(within(_folders.containers, containerID.c_str()), VLUbiquitousDocumentsFolderName);
+  } else if (!isDrive) {
+    folder = within(_folders.drive, container.displayName.c_str());
+  }
+  int failure = isFolder(folder) ? 0 : ENOENT;
+  if (failure != 0 && recreate && !isDrive) {
+    failure = makeFolder(folder.substr(0, folder.rfind('/')));
+    if (failure == 0) failure = makeFolder(folder);
+    recreated = failure == 0;
+  }
+  if (failure != 0) {
+    error.store(fileError(failure, "There is no folder of the container's at", folder));
+    return {};
+  }
+  container.documentsURL = NSURL::fileURLWithPath(folder);
+  return container;
 }
 
 std::vector<StoreRoot> Containers::storeRoots() const {

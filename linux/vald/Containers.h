@@ -5,7 +5,7 @@
 #include <vector>
 
 #include "base/Mutex.h"
-#include "linux/vald/DesktopEntries.h"
+#include "linux/desktop/DesktopEntries.h"
 #include "linux/vald/Store.h"
 #include "platform/log/Log.h"
 #include "vellum/VLContainer.h"
@@ -36,6 +36,13 @@ class Containers {
 
   // All of them, the drive's own first. Any thread.
   std::vector<VLContainer::Properties> list() const SKEIN_EXCLUDES(_mutex);
+
+  // One of them, whose documents folder is there: when it is gone it is made again if
+  // `recreate`, which `recreated` tells; the drive's own folder never is. An error for a
+  // container that is not known, and for a folder that is not there or cannot be made. As
+  // refresh().
+  VLContainer::Properties find(const std::string& containerID, bool recreate, bool& recreated,
+                               NSErrorOut error) SKEIN_EXCLUDES(_mutex);
 
   // The app containers that have a folder, as the store indexes them. Any thread.
   std::vector<StoreRoot> storeRoots() const SKEIN_EXCLUDES(_mutex);

@@ -144,6 +144,30 @@ void Daemon::getItemUpdateSenderWithReceiver(
       });
 }
 
+void Daemon::getContainerURLForID(
+    const std::string& containerID, bool recreateDocumentsIfNeeded,
+    Reply<NSURLPtr, std::optional<std::string>, bool, NSErrorPtr> reply) {
+  _containerQueue.async([self = shared_from_this(), containerID, recreateDocumentsIfNeeded,
+                         reply = std::move(reply)]() mutable {
+    NSErrorPtr error;
+    bool recreated = false;
+    const auto container =
+        self->_parts.containers.find(containerID, recreateDocumentsIfNeeded, recreated, &error);
+    if (error) return answerError(reply, error);
+    if (recreated) {
+      // It is another folder than the one that was there, and looked up next.
+      std::vector<StoreRoot> roots = self->_parts.containers.storeRoots();
+      std::vector<StoreRoot> others = roots;
+      std::erase_if(others, [&](const auto& root) { return root.containerID == containerID; });
+      self->_parts.store.setContainers(std::move(others));
+      self->_parts.store.setContainers(std::move(roots));
+      // So that it is in the index then; where that fails, the lookup says so.
+      self->_parts.store.itemAtPath(container.documentsURL->path(), /*scanFirst=*/true, nullptr);
+    }
+    reply(container.documentsURL, container.displayName, recreated, nullptr);
+  });
+}
+
 void Daemon::URLForFileObjectID(VLFileObjectID fileObjectID, Reply<NSURLPtr, NSErrorPtr> reply) {
   answer(std::move(reply), [fileObjectID](Daemon& self, auto& answered) {
     NSErrorPtr error;

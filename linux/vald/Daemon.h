@@ -57,6 +57,10 @@ class Daemon final : public LocalDaemon, public std::enable_shared_from_this<Dae
       std::shared_ptr<VLItemNotificationReceiving> receiver,
       Reply<std::shared_ptr<VLItemNotificationSender>, NSErrorPtr> reply) override;
 
+  void getContainerURLForID(
+      const std::string& containerID, bool recreateDocumentsIfNeeded,
+      Reply<NSURLPtr, std::optional<std::string>, bool, NSErrorPtr> reply) override;
+
   void URLForFileObjectID(VLFileObjectID fileObjectID, Reply<NSURLPtr, NSErrorPtr> reply) override;
   void queryItemForURL(NSURLPtr url, bool scanFirst,
                        Reply<VLQueryItemPtr, NSErrorPtr> reply) override;

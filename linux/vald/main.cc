@@ -14,6 +14,7 @@
 #include <utility>
 #include <vector>
 
+#include "linux/desktop/DesktopEntries.h"
 #include "linux/protocol/DaemonServer.h"
 #include "linux/protocol/DrivePaths.h"
 #include "linux/protocol/LogFile.h"
@@ -25,7 +26,6 @@
 #include "linux/vald/CommandLine.h"
 #include "linux/vald/Containers.h"
 #include "linux/vald/Daemon.h"
-#include "linux/vald/DesktopEntries.h"
 #include "linux/vald/DriveListener.h"
 #include "linux/vald/EventSubscribers.h"
 #include "linux/vald/FaultInjector.h"

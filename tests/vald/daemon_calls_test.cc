@@ -270,6 +270,41 @@ TEST_F(DaemonCalls, ContainersComeFromTheDriveAndFromDesktopEntries) {
   EXPECT_TRUE(std::filesystem::is_directory(d.state.path + "/org.c/Documents"));
 }
 
+TEST_F(DaemonCalls, AContainersFolderIsMadeAgainWhenThatIsWanted) {
+  writeEntry("org.b.desktop", "Name=Notes\nX-Skein-Services=SkeinDocuments;\n");
+  d.daemon->refreshContainers();
+  d.executor->runAll();
+  struct Found {
+    std::string path;
+    bool recreated = false;
+    std::int64_t error = 0;
+    bool operator==(const Found&) const = default;
+  };
+  const auto find = [&](const char* id, bool recreate) {
+    const auto [url, name, recreated, error] =
+        d.call<NSURLPtr, std::optional<std::string>, bool, NSErrorPtr>(
+            [&](LocalDaemon& daemon, auto reply) {
+              daemon.getContainerURLForID(id, recreate, std::move(reply));
+            });
+    return Found{url ? url->path() : "", recreated, error ? error->code() : 0};
+  };
+  // An app that keeps documents and lists no container has the one of its identifier.
+  const std::string app = d.state.path + "/org.b/Documents";
+  EXPECT_EQ(find("org.b", false), (Found{app, false, 0}));
+  std::filesystem::remove_all(d.state.path + "/org.b");
+  EXPECT_EQ(find("org.b", false), (Found{"", false, NSFileNoSuchFileError}));
+  EXPECT_EQ(find("org.b", true), (Found{app, true, 0}));
+  EXPECT_TRUE(std::filesystem::is_directory(app));
+  EXPECT_EQ(find("org.b", true), (Found{app, false, 0}));
+
+  const std::string documents = d.drive.path + "/Documents";
+  EXPECT_EQ(find(VLUbiquitousDocumentsContainerID, true), (Found{documents, true, 0}));
+  EXPECT_EQ(find(VLUbiquitousDefaultContainerID, true), (Found{d.drive.path, false, 0}));
+  for (const char* unknown : {"org.nobody", "../b", ""}) {
+    EXPECT_EQ(find(unknown, true), (Found{"", false, VLVellumErrorInvalidParameter})) << unknown;
+  }
+}
+
 TEST_F(DaemonCalls, ApplicationFoldersAreWatchedBeforeAndAfterTheyExist) {
   const std::string later = d.applications.path + "/share/applications";
   Mutex mutex;

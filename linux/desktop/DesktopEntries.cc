@@ -1,24 +1,34 @@
-#include "linux/vald/DesktopEntries.h"
+#include "linux/desktop/DesktopEntries.h"
 
 #include <glib.h>
 
 #include <algorithm>
+#include <array>
 #include <cstdint>
 #include <filesystem>
 #include <map>
 #include <memory>
 #include <set>
 #include <system_error>
+#include <utility>
 
 #include "vellum/VLContainer.h"
+#include "vellum/VLEntitlements.h"
 
-namespace skein::vald {
+namespace skein {
 namespace {
 
 namespace fs = std::filesystem;
 
 constexpr char kGroup[] = G_KEY_FILE_DESKTOP_GROUP;
-constexpr char kContainersKey[] = "X-Skein-Containers";
+constexpr char kSuffix[] = ".desktop";
+// The entry's keys, and the entitlements that they stand for.
+constexpr std::array<std::pair<const char*, const char*>, 4> kEntitlementKeys = {{
+    {"X-Skein-Application-Identifier", VLApplicationIdentifierEntitlement},
+    {"X-Skein-Services", VLSkeinServicesEntitlement},
+    {"X-Skein-Containers", VLSkeinContainerIdentifiersEntitlement},
+    {"X-Skein-Ubiquity-Containers", VLUbiquityContainerIdentifiersEntitlement},
+}};
 constexpr std::size_t kLongestID = 128;
 constexpr std::size_t kMostContainers = 1000;
 constexpr std::uintmax_t kLargestEntry = 1 << 20;
@@ -28,42 +38,40 @@ using KeyFile = std::unique_ptr<GKeyFile, decltype(&g_key_file_unref)>;
 using Text = std::unique_ptr<char, decltype(&g_free)>;
 using Texts = std::unique_ptr<char*, decltype(&g_strfreev)>;
 
-struct Claim {
-  std::vector<std::string> containerIDs;
-  std::string name;
-  std::optional<std::string> icon;
-};
-
 std::optional<std::string> localText(GKeyFile* file, const char* key) {
   const Text text(g_key_file_get_locale_string(file, kGroup, key, nullptr, nullptr), g_free);
   if (!text || *text == '\0') return std::nullopt;
   return std::string(text.get());
 }
 
-// What one desktop entry claims; nothing for one that is hidden or unreadable.
-Claim readEntry(const fs::path& path) {
+// The app of one entry; nil for one that is hidden or unreadable.
+std::optional<InstalledApp> readEntry(const std::string& identifier, const fs::path& path) {
   std::error_code failure;
   if (!fs::is_regular_file(path, failure) || fs::file_size(path, failure) > kLargestEntry) {
-    return {};
+    return std::nullopt;
   }
   const KeyFile file(g_key_file_new(), g_key_file_unref);
-  if (!g_key_file_load_from_file(file.get(), path.c_str(), G_KEY_FILE_NONE, nullptr)) return {};
-  if (g_key_file_get_boolean(file.get(), kGroup, G_KEY_FILE_DESKTOP_KEY_HIDDEN, nullptr)) return {};
-  const Texts ids(g_key_file_get_string_list(file.get(), kGroup, kContainersKey, nullptr, nullptr),
-                  g_strfreev);
-  if (!ids) return {};
-
-  Claim claim;
-  for (char** id = ids.get(); *id != nullptr; ++id) {
-    if (isAppContainerID(*id)) claim.containerIDs.emplace_back(*id);
+  if (!g_key_file_load_from_file(file.get(), path.c_str(), G_KEY_FILE_NONE, nullptr) ||
+      g_key_file_get_boolean(file.get(), kGroup, G_KEY_FILE_DESKTOP_KEY_HIDDEN, nullptr)) {
+    return std::nullopt;
   }
-  claim.name = localText(file.get(), G_KEY_FILE_DESKTOP_KEY_NAME).value_or("");
-  claim.icon = localText(file.get(), G_KEY_FILE_DESKTOP_KEY_ICON);
-  return claim;
+  InstalledApp app;
+  app.identifier = identifier;
+  app.name = localText(file.get(), G_KEY_FILE_DESKTOP_KEY_NAME).value_or("");
+  app.icon = localText(file.get(), G_KEY_FILE_DESKTOP_KEY_ICON);
+  app.entitlements[VLApplicationIdentifierEntitlement] = {identifier};
+  for (const auto& [key, entitlement] : kEntitlementKeys) {
+    const Texts values(g_key_file_get_string_list(file.get(), kGroup, key, nullptr, nullptr),
+                       g_strfreev);
+    if (!values) continue;
+    std::vector<std::string>& claimed = app.entitlements[entitlement];
+    claimed.clear();
+    for (char** value = values.get(); *value != nullptr; ++value) claimed.emplace_back(*value);
+  }
+  return app;
 }
 
-// The entries below `folder`: the name that the desktop knows each by (its path, with a
-// dash for each separator) and where it is.
+// The entries below `folder`: the identifier of each and where it is.
 std::map<std::string, fs::path> entriesInFolder(const std::string& folder) {
   std::map<std::string, fs::path> entries;
   std::error_code failure;
@@ -71,8 +79,8 @@ std::map<std::string, fs::path> entriesInFolder(const std::string& folder) {
                                          failure);
   for (; !failure && entry != fs::recursive_directory_iterator(); entry.increment(failure)) {
     if (entry.depth() >= kDeepestFolder) entry.disable_recursion_pending();
-    if (entry->path().extension() != ".desktop") continue;
-    std::string name = entry->path().lexically_relative(folder).native();
+    if (entry->path().extension() != kSuffix) continue;
+    std::string name = entry->path().lexically_relative(folder).replace_extension().native();
     std::replace(name.begin(), name.end(), '/', '-');
     entries.emplace(std::move(name), entry->path());
   }
@@ -105,16 +113,27 @@ std::vector<std::string> applicationFolders() {
   return folders;
 }
 
+std::optional<InstalledApp> appInFolders(const std::vector<std::string>& folders,
+                                         const std::string& identifier) {
+  for (const std::string& folder : folders) {
+    const auto entries = entriesInFolder(folder);
+    const auto found = entries.find(identifier);
+    if (found != entries.end()) return readEntry(identifier, found->second);
+  }
+  return std::nullopt;
+}
+
 std::vector<AppContainer> appContainersInFolders(const std::vector<std::string>& folders) {
   std::set<std::string> seenEntries;
   std::map<std::string, AppContainer> byID;
   for (const std::string& folder : folders) {
-    for (const auto& [entryName, path] : entriesInFolder(folder)) {
-      if (!seenEntries.insert(entryName).second) continue;
-      const Claim claim = readEntry(path);
-      for (const std::string& id : claim.containerIDs) {
-        if (byID.size() < kMostContainers) {
-          byID.try_emplace(id, AppContainer{id, asFileName(claim.name, id), claim.icon});
+    for (const auto& [identifier, path] : entriesInFolder(folder)) {
+      if (!seenEntries.insert(identifier).second) continue;
+      const std::optional<InstalledApp> app = readEntry(identifier, path);
+      if (!app) continue;
+      for (const std::string& id : VLEntitledContainerIdentifiers(app->entitlements)) {
+        if (isAppContainerID(id) && byID.size() < kMostContainers) {
+          byID.try_emplace(id, AppContainer{id, asFileName(app->name, id), app->icon});
         }
       }
     }
@@ -133,4 +152,4 @@ std::vector<AppContainer> appContainersInFolders(const std::vector<std::string>&
   return containers;
 }
 
-}  // namespace skein::vald
+}  // namespace skein
