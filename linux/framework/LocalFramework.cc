@@ -2,7 +2,12 @@
 
 #include <utility>
 
+#include "linux/desktop/DesktopEntries.h"
+#include "linux/framework/LocalBundles.h"
 #include "linux/framework/LocalDocuments.h"
+#include "linux/framework/LocalFileManager.h"
+#include "linux/framework/LocalFileOperations.h"
+#include "linux/framework/LocalOperations.h"
 #include "linux/framework/LocalQueryItemLookup.h"
 
 namespace skein {
@@ -53,7 +58,7 @@ class LocalDaemonConnection final : public VLDaemonConnection {
 }  // namespace
 
 LocalFramework::LocalFramework(std::shared_ptr<RpcLoop> loop, std::shared_ptr<Executor> executor,
-                               NSNotificationCenter& notificationCenter,
+                               NSNotificationCenter& notificationCenter, Log& log,
                                DaemonClient::Options options)
     : _access{loop, executor, std::make_shared<DaemonClient>(loop, executor, std::move(options))},
       _state(std::make_shared<DriveState>(_access, notificationCenter)),
@@ -61,7 +66,11 @@ LocalFramework::LocalFramework(std::shared_ptr<RpcLoop> loop, std::shared_ptr<Ex
       _containers(std::make_unique<LocalContainers>(_state)),
       _connection(std::make_unique<LocalDaemonConnection>(_access.client)),
       _documents(std::make_unique<LocalDocuments>(_access, _state)),
-      _queryItems(std::make_unique<LocalQueryItemLookup>(_access)) {
+      _queryItems(std::make_unique<LocalQueryItemLookup>(_access)),
+      _fileOperations(std::make_unique<LocalFileOperations>(_access, _state)),
+      _fileManager(std::make_unique<LocalFileManager>(_access, log)),
+      _operations(std::make_unique<LocalOperations>(_access)),
+      _bundles(std::make_unique<LocalBundles>(applicationFolders())) {
   _state->attach();
 }
 

@@ -6,26 +6,29 @@
 #include "linux/framework/SyncCall.h"
 #include "linux/protocol/DaemonClient.h"
 #include "linux/protocol/DrivePaths.h"
+#include "platform/launchservices/LSBundleProxy.h"
+#include "platform/log/Log.h"
 #include "vellum/VLAccount.h"
 #include "vellum/VLContainer.h"
 #include "vellum/VLDaemonConnection.h"
 #include "vellum/VLDocuments.h"
+#include "vellum/VLFileOperations.h"
 
 namespace skein {
 
 // The Vellum framework's roles on this system, all over one connection to vald. Any
 // thread. Wired once, in main:
 //
-//   LocalFramework framework(loop, executor, notificationCenter,
+//   LocalFramework framework(loop, executor, notificationCenter, log,
 //                            LocalFramework::optionsFor(paths));
 //   Environment environment{log, executor, notificationCenter, providerManager,
 //                           framework.accounts(), framework.containers(), ...};
 class LocalFramework {
  public:
-  // The center has to outlive the framework and the work on the executor. Nothing is sent
-  // until something is asked.
+  // The center and the log have to outlive the framework and the work on the executor.
+  // Nothing is sent until something is asked.
   LocalFramework(std::shared_ptr<RpcLoop> loop, std::shared_ptr<Executor> executor,
-                 NSNotificationCenter& notificationCenter, DaemonClient::Options options);
+                 NSNotificationCenter& notificationCenter, Log& log, DaemonClient::Options options);
   // To reach the drive's vald, and to start it.
   static DaemonClient::Options optionsFor(const DrivePaths& paths);
   ~LocalFramework();
@@ -37,6 +40,10 @@ class LocalFramework {
   VLDaemonConnection& daemonConnection() { return *_connection; }
   VLDocuments& documents() { return *_documents; }
   VLQueryItemLookup& queryItems() { return *_queryItems; }
+  VLFileOperations& fileOperations() { return *_fileOperations; }
+  VLFileManager& fileManager() { return *_fileManager; }
+  VLOperations& operations() { return *_operations; }
+  LSBundles& bundles() { return *_bundles; }
 
   // vald with what only this host has.
   const std::shared_ptr<DaemonClient>& client() const { return _access.client; }
@@ -49,6 +56,10 @@ class LocalFramework {
   const std::unique_ptr<VLDaemonConnection> _connection;
   const std::unique_ptr<VLDocuments> _documents;
   const std::unique_ptr<VLQueryItemLookup> _queryItems;
+  const std::unique_ptr<VLFileOperations> _fileOperations;
+  const std::unique_ptr<VLFileManager> _fileManager;
+  const std::unique_ptr<VLOperations> _operations;
+  const std::unique_ptr<LSBundles> _bundles;
 };
 
 }  // namespace skein

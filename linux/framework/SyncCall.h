@@ -1,5 +1,6 @@
 #pragma once
 
+#include <chrono>
 #include <memory>
 #include <utility>
 
@@ -20,11 +21,15 @@ struct DaemonAccess {
 // would bring the answer; that is a fault too.
 NSErrorPtr errorIfMayNotWait(const DaemonAccess& access);
 
+// The answer of a thread that has waited for `limit`.
+NSErrorPtr waitedTooLong(std::chrono::seconds limit);
+
 // Calls start(daemon, reply) and waits until `reply` was called with a value and an error,
-// or the message failed. The wait ends with the message's deadline at the latest. Any
-// thread but the loop's.
+// or the message failed: with the message's deadline, for most, and at the latest after
+// `limit`; what was asked for may happen all the same then. Any thread but the loop's.
 template <class T, class Start>
-std::pair<T, NSErrorPtr> askDaemon(const DaemonAccess& access, Start start) {
+std::pair<T, NSErrorPtr> askDaemon(const DaemonAccess& access, Start start,
+                                   std::chrono::seconds limit = std::chrono::seconds(60)) {
   struct Answer {
     Mutex mutex;
     CondVar came;
@@ -46,8 +51,11 @@ std::pair<T, NSErrorPtr> askDaemon(const DaemonAccess& access, Start start) {
   start(*daemon,
         [answer](T result, NSErrorPtr error) { answer->set(std::move(result), std::move(error)); });
   ScopedWait wait(*access.executor);
+  const auto deadline = std::chrono::steady_clock::now() + limit;
   MutexLock lock(answer->mutex);
-  while (!answer->there) answer->came.wait(answer->mutex);
+  while (!answer->there) {
+    if (!answer->came.waitUntil(answer->mutex, deadline)) return {T{}, waitedTooLong(limit)};
+  }
   return std::move(answer->value);
 }
 

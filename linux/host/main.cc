@@ -18,7 +18,6 @@
 #include "base/ThreadPool.h"
 #include "extension/VLFileProviderExtension.h"
 #include "linux/framework/LocalFramework.h"
-#include "linux/framework/UnsupportedFileOperations.h"
 #include "linux/framework/UnsupportedSharing.h"
 #include "linux/host/HostRequests.h"
 #include "linux/host/NSExtensionMain.h"
@@ -176,7 +175,8 @@ int serve(const Arguments& arguments, const DrivePaths& paths, const FileDescrip
   const std::shared_ptr<Timers> timers = std::make_shared<SteadyTimers>(executor);
   const std::shared_ptr<RpcLoop> loop = RpcLoop::start("host-io");
   NSNotificationCenter notificationCenter;
-  LocalFramework framework(loop, executor, notificationCenter, LocalFramework::optionsFor(paths));
+  LocalFramework framework(loop, executor, notificationCenter, *log,
+                           LocalFramework::optionsFor(paths));
   const DaemonProxies daemon = [client = framework.client()](auto errorHandler) {
     return client->remoteObjectProxyWithErrorHandler(std::move(errorHandler));
   };
@@ -185,10 +185,6 @@ int serve(const Arguments& arguments, const DrivePaths& paths, const FileDescrip
       HostTools{executor, timers}, std::make_unique<WorkingSetWatch>(daemon, timers), *log);
   VLLogSections logSections(executor);
   RootURL rootURL;
-  UnsupportedFileOperations fileOperations(executor);
-  UnsupportedFileManager fileManager(*log);
-  UnsupportedOperations operations;
-  UnsupportedBundles bundles;
   UnsupportedSharingOperations sharingOperations;
   UnsupportedResourceValues resourceValues;
   Environment environment{*log,
@@ -202,10 +198,10 @@ int serve(const Arguments& arguments, const DrivePaths& paths, const FileDescrip
                           framework.queryItems(),
                           logSections,
                           rootURL,
-                          fileOperations,
-                          fileManager,
-                          operations,
-                          bundles,
+                          framework.fileOperations(),
+                          framework.fileManager(),
+                          framework.operations(),
+                          framework.bundles(),
                           sharingOperations,
                           resourceValues,
                           *log};

@@ -24,7 +24,7 @@ class Framework : public ProtocolTest {
   Framework() {
     DaemonClient::Options options;
     options.socketPath = socketPath;
-    framework = std::make_unique<LocalFramework>(clientLoop, executor, center, options);
+    framework = std::make_unique<LocalFramework>(clientLoop, executor, center, log, options);
     center.addObserver(observer, &Observer::accountChanged, VLAccountTokenDidChangeNotification);
     center.addObserver(observer, &Observer::containersChanged,
                        VLContainerListDidChangeNotification);
