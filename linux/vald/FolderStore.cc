@@ -376,6 +376,10 @@ void FolderStore::setContainers(std::vector<StoreRoot> containers) {
       [this, containers = std::move(containers)] { _writer->setContainers(containers); });
 }
 
+void FolderStore::tellAnew(VLFileObjectID id, bool withContents) {
+  _writer->perform([this, id, withContents] { _writer->tellAnew(id, withContents); });
+}
+
 std::optional<std::string> FolderStore::setting(const std::string& key) {
   auto reader = _readers.lease();
   return reader ? reader->setting("value " + key) : std::nullopt;

@@ -33,6 +33,7 @@ class FolderStore final : public Store {
   void retainFolderWatch(VLFileObjectID folder) override;
   void releaseFolderWatch(VLFileObjectID folder) override;
   void setContainers(std::vector<StoreRoot> containers) override;
+  void tellAnew(VLFileObjectID id, bool withContents) override;
   void status(LocalDaemonStatus& status) override { _writer->status(status); }
   std::vector<IndexDifference> check(std::uint64_t limit) override;
   std::optional<std::string> setting(const std::string& key) override;

@@ -101,6 +101,10 @@ class Store {
   // Replaces the app containers' roots; items that come or go are journalled.
   virtual void setContainers(std::vector<StoreRoot> containers) = 0;
 
+  // Journals an item as changed, though its file did not: what is told of it beside the file
+  // did. `withContents`: and everything below it. Nothing for an item that is not there.
+  virtual void tellAnew(VLFileObjectID id, bool withContents) = 0;
+
   // Fills the fields that the store knows.
   virtual void status(LocalDaemonStatus& status) = 0;
   virtual std::vector<IndexDifference> check(std::uint64_t limit) = 0;

@@ -2,6 +2,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
+#include <iterator>
 
 #include "linux/vald/StoreWriter.h"
 #include "linux/vald/index/IndexFile.h"
@@ -367,6 +368,23 @@ Look StoreWriter::lookAtName(FolderKey folder, const std::string& name) {
   afterDecisions();
   commit();
   return look;
+}
+
+void StoreWriter::tellAnew(VLFileObjectID id, bool withContents) {
+  if (_isBulk) endBulkLoad();
+  begin();
+  std::vector<ItemRow> rows;
+  if (auto row = _index.rowWithID(id)) rows.push_back(std::move(*row));
+  while (!rows.empty()) {
+    ItemRow row = std::move(rows.back());
+    rows.pop_back();
+    _journal.update(row, row.parent);
+    if (!withContents || row.folder == kNoFolder) continue;
+    std::vector<ItemRow> children = _index.childrenOf(row.folder);
+    rows.insert(rows.end(), std::make_move_iterator(children.begin()),
+                std::make_move_iterator(children.end()));
+  }
+  commit();
 }
 
 // ---- changes that the watcher saw

@@ -45,6 +45,7 @@ class StoreWriter {
   Look lookAtFolder(FolderKey folder, int& error);
   Look lookAtName(FolderKey folder, const std::string& name);
   void setContainers(const std::vector<StoreRoot>& containers);
+  void tellAnew(VLFileObjectID id, bool withContents);
   void retain(VLFileObjectID folder, bool isRetained);
   bool setSetting(const std::string& key, const std::optional<std::string>& value);
 

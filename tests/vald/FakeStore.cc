@@ -46,6 +46,16 @@ void FakeStore::touch(VLFileObjectID id) {
   record(node.item, node.parent, node.parent);
 }
 
+void FakeStore::tellAnew(VLFileObjectID id, bool withContents) {
+  const auto found = _nodes.find(id);
+  if (found == _nodes.end()) return;
+  record(found->second.item, found->second.parent, found->second.parent);
+  if (!withContents) return;
+  for (const auto& [child, node] : _nodes) {
+    if (node.parent == id && child != id) tellAnew(child, true);
+  }
+}
+
 void FakeStore::move(VLFileObjectID id, VLFileObjectID to) {
   Node& node = _nodes.at(id);
   const VLFileObjectID from = std::exchange(node.parent, to);

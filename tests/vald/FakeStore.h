@@ -43,6 +43,7 @@ class FakeStore final : public Store {
   void retainFolderWatch(VLFileObjectID folder) override { addWatch(folder, 1); }
   void releaseFolderWatch(VLFileObjectID folder) override { addWatch(folder, -1); }
   void setContainers(std::vector<StoreRoot> roots) override { containers = std::move(roots); }
+  void tellAnew(VLFileObjectID id, bool withContents) override;
   void status(LocalDaemonStatus& status) override { status.documents = _nodes.size(); }
   std::vector<IndexDifference> check(std::uint64_t limit) override;
   std::optional<std::string> setting(const std::string& key) override;
