@@ -7,6 +7,7 @@
 #include "linux/protocol/DaemonCalls.h"
 #include "linux/protocol/DaemonCodec.h"
 #include "linux/protocol/FilesProxy.h"
+#include "linux/protocol/SharesProxy.h"
 #include "linux/protocol/UpdateLink.h"
 
 namespace skein {
@@ -55,9 +56,12 @@ Task replyWithPage(VLDaemon::ItemsReply& reply, const Results& results) {
 class DaemonProxy final : public LocalDaemon {
  public:
   explicit DaemonProxy(DaemonCalls calls)
-      : _calls(std::move(calls)), _files(makeFilesProxy(_calls)) {}
+      : _calls(std::move(calls)),
+        _files(makeFilesProxy(_calls)),
+        _shares(makeSharesProxy(_calls)) {}
 
   LocalFiles& files() override { return *_files; }
+  LocalShares& shares() override { return *_shares; }
 
   void enumerateItemsInFolder(std::optional<VLFileObjectID> folder, std::uint8_t sortOrder,
                               std::uint64_t offset, std::uint64_t limit,
@@ -317,6 +321,7 @@ class DaemonProxy final : public LocalDaemon {
 
   const DaemonCalls _calls;
   const std::unique_ptr<LocalFiles> _files;
+  const std::unique_ptr<LocalShares> _shares;
 };
 
 }  // namespace

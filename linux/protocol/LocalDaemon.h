@@ -11,6 +11,7 @@
 #include <vector>
 
 #include "linux/protocol/LocalFiles.h"
+#include "linux/protocol/LocalShares.h"
 #include "vellum/VLContainer.h"
 #include "vellum/VLDaemonConnection.h"
 
@@ -84,6 +85,17 @@ class LocalDaemon : public VLDaemon {
   // What it does to documents. Lives as long as this object; a proxy's has the same error
   // handler.
   virtual LocalFiles& files() = 0;
+  // Its shares, likewise.
+  virtual LocalShares& shares() = 0;
+
+  // The framework's questions about sharing, asked of shares().
+  void checkIfItemIsShareableWithInode(std::uint64_t inode, Reply<bool, NSErrorPtr> reply) final;
+  void refreshSharingStateForItemIdentifier(const NSFileProviderItemIdentifier& identifier,
+                                            Reply<NSErrorPtr> reply) final;
+  void getShareOptionsOfItemIdentifier(
+      const NSFileProviderItemIdentifier& identifier,
+      Reply<std::int64_t, std::int64_t, std::int64_t, std::optional<std::string>, NSErrorPtr> reply)
+      final;
 
   // Null URL and an error for an identifier that names nothing.
   virtual void URLForFileObjectID(VLFileObjectID fileObjectID,

@@ -7,6 +7,7 @@ $Cxx.namespace("skein::wire");
 
 using Types = import "types.capnp";
 using Files = import "files.capnp";
+using Shares = import "shares.capnp";
 
 struct Account {
   name @0 :Data;
@@ -56,7 +57,7 @@ struct Fault {
   times @5 :UInt32;
 }
 
-interface Daemon extends(Files.Files) {
+interface Daemon extends(Files.Files, Shares.Shares) {
   enumerateItemsInFolder @0 (folder :Types.ObjectID, sortOrder :UInt8, offset :UInt64,
                              limit :UInt64)
       -> (items :List(Types.Item), nextOffset :UInt64, error :Types.Error);

@@ -27,6 +27,7 @@ struct DaemonParts {
   Containers& containers;
   EventSubscribers& subscribers;
   LocalFiles& files;
+  LocalShares& shares;
   FaultInjector& faults;
   Log& log;
   std::string drive;           // the drive's folder, absolute
@@ -42,6 +43,7 @@ class Daemon final : public LocalDaemon, public std::enable_shared_from_this<Dae
   explicit Daemon(DaemonParts parts);
 
   LocalFiles& files() override { return _parts.files; }
+  LocalShares& shares() override { return _parts.shares; }
 
   void enumerateItemsInFolder(std::optional<VLFileObjectID> folder, std::uint8_t sortOrder,
                               std::uint64_t offset, std::uint64_t limit,

@@ -33,6 +33,8 @@
 #include "linux/vald/RunLock.h"
 #include "linux/vald/Store.h"
 #include "linux/vald/UnsupportedFiles.h"
+#include "linux/vald/shares/Shares.h"
+#include "linux/vald/shares/SharingStore.h"
 
 namespace skein::vald {
 namespace {
@@ -81,21 +83,36 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
 
   const auto executor = std::make_shared<ClosableExecutor>(kWorkers, "vald");
   const auto slowExecutor = std::make_shared<ClosableExecutor>(1, "vald-slow");
-  const ContainerFolders folders{paths.store, paths.containersDirectory, applicationFolders()};
+  const ContainerFolders containerFolders{paths.store, paths.containersDirectory,
+                                          applicationFolders()};
   ItemUpdateSenders senders(executor);
   DriveListener listener(senders);
   EventSubscribers subscribers(executor);
-  Containers containers(folders, log);
+  Containers containers(containerFolders, log);
 
   NSErrorPtr error;
   StoreOptions options;
   options.databasePath = paths.database;
   options.drive.path = paths.store;
   options.containers = containers.storeRoots();
-  const std::unique_ptr<Store> store = Store::open(std::move(options), listener, log, &error);
-  if (!store) return fail(error);
+  SharedItems sharedItems;
+  SharingListener sharingListener(sharedItems, listener);
+  auto records = ShareRecords::open(paths.stateDirectory + "/shares.sqlite");
+  if (!records) return fail(records.error());
+  std::unique_ptr<Store> folders = Store::open(std::move(options), sharingListener, log, &error);
+  if (!folders) return fail(error);
+  SharingStore store(std::move(folders), sharingListener, sharedItems);
 
-  Accounts accounts(*store, loginName(), log);
+  Accounts accounts(store, loginName(), log);
+  const auto shares = std::make_shared<Shares>(
+      SharesParts{executor, store, **records, sharedItems, accounts, containers, log, paths.store});
+  sharingListener.setCoverageHandler([weak = std::weak_ptr(shares)](VLFileObjectID folder) {
+    if (const auto changed = weak.lock()) changed->coverageDidChange(folder);
+  });
+  if (NSErrorPtr unreadable = shares->load()) {
+    executor->close();
+    return fail(unreadable);
+  }
   std::atomic<bool> wasToldToStop{false};
   const auto stop = [&wasToldToStop] {
     wasToldToStop.store(true);
@@ -103,9 +120,9 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
   };
   UnsupportedFiles files(executor);
   const auto faults = std::make_shared<FaultInjector>(faultsAreAllowed());
-  auto daemon = std::make_shared<Daemon>(DaemonParts{executor, slowExecutor, *store, senders,
+  auto daemon = std::make_shared<Daemon>(DaemonParts{executor, slowExecutor, store, senders,
                                                      accounts, containers, subscribers, files,
-                                                     *faults, log, paths.store, stop});
+                                                     *shares, *faults, log, paths.store, stop});
   listener.setAfterChange([weak = std::weak_ptr<Daemon>(daemon)] {
     if (const auto changed = weak.lock()) changed->refreshDriveFolders();
   });
@@ -120,7 +137,8 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
   }
   {
     const ApplicationsWatcher watcher(
-        folders.applications, kQuietApplications, [&daemon] { daemon->refreshContainers(); }, log);
+        containerFolders.applications, kQuietApplications,
+        [&daemon] { daemon->refreshContainers(); }, log);
     VL_NOTICE(log, "[NOTICE] vald serves %@", paths.store);
     background.isReady();
 

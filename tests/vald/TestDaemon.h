@@ -13,6 +13,7 @@
 
 #include "linux/vald/Daemon.h"
 #include "linux/vald/UnsupportedFiles.h"
+#include "linux/vald/shares/Shares.h"
 #include "tests/support/ManualExecutor.h"
 #include "tests/vald/FakeStore.h"
 
@@ -76,9 +77,12 @@ class TestDaemon {
     store.emplace(drive.path, senders, settings);
     accounts.emplace(*store, "somebody", log);
     containers.emplace(ContainerFolders{drive.path, state.path, {applications.path}}, log);
+    shareRecords = std::move(*ShareRecords::open(state.path + "/shares.sqlite"));
+    shares = std::make_shared<Shares>(SharesParts{executor, *store, *shareRecords, sharedItems,
+                                                  *accounts, *containers, log, drive.path});
     daemon = std::make_shared<Daemon>(DaemonParts{executor, executor, *store, senders, *accounts,
-                                                  *containers, subscribers, files, faults, log,
-                                                  drive.path, [this] { ++stops; }});
+                                                  *containers, subscribers, files, *shares, faults,
+                                                  log, drive.path, [this] { ++stops; }});
   }
 
   // Makes the call that `request(daemon, reply)` makes, and runs everything; the test
@@ -107,6 +111,9 @@ class TestDaemon {
   std::optional<FakeStore> store;
   std::optional<Accounts> accounts;
   std::optional<Containers> containers;
+  SharedItems sharedItems;
+  std::unique_ptr<ShareRecords> shareRecords;
+  std::shared_ptr<Shares> shares;
   std::shared_ptr<Daemon> daemon;
   int stops = 0;
 };
