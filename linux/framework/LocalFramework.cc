@@ -9,6 +9,8 @@
 #include "linux/framework/LocalFileOperations.h"
 #include "linux/framework/LocalOperations.h"
 #include "linux/framework/LocalQueryItemLookup.h"
+#include "linux/framework/LocalResourceValues.h"
+#include "linux/framework/LocalSharingOperations.h"
 
 namespace skein {
 namespace {
@@ -70,7 +72,9 @@ LocalFramework::LocalFramework(std::shared_ptr<RpcLoop> loop, std::shared_ptr<Ex
       _fileOperations(std::make_unique<LocalFileOperations>(_access, _state)),
       _fileManager(std::make_unique<LocalFileManager>(_access, log)),
       _operations(std::make_unique<LocalOperations>(_access)),
-      _bundles(std::make_unique<LocalBundles>(applicationFolders())) {
+      _bundles(std::make_unique<LocalBundles>(applicationFolders())),
+      _sharingOperations(std::make_unique<LocalSharingOperations>(_access)),
+      _resourceValues(std::make_unique<LocalResourceValues>(_access)) {
   _state->attach();
 }
 

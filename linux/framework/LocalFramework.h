@@ -13,6 +13,8 @@
 #include "vellum/VLDaemonConnection.h"
 #include "vellum/VLDocuments.h"
 #include "vellum/VLFileOperations.h"
+#include "vellum/VLResourceValues.h"
+#include "vellum/VLSharingOperations.h"
 
 namespace skein {
 
@@ -44,6 +46,8 @@ class LocalFramework {
   VLFileManager& fileManager() { return *_fileManager; }
   VLOperations& operations() { return *_operations; }
   LSBundles& bundles() { return *_bundles; }
+  VLSharingOperations& sharingOperations() { return *_sharingOperations; }
+  VLResourceValues& resourceValues() { return *_resourceValues; }
 
   // vald with what only this host has.
   const std::shared_ptr<DaemonClient>& client() const { return _access.client; }
@@ -60,6 +64,8 @@ class LocalFramework {
   const std::unique_ptr<VLFileManager> _fileManager;
   const std::unique_ptr<VLOperations> _operations;
   const std::unique_ptr<LSBundles> _bundles;
+  const std::unique_ptr<VLSharingOperations> _sharingOperations;
+  const std::unique_ptr<VLResourceValues> _resourceValues;
 };
 
 }  // namespace skein

@@ -18,7 +18,6 @@
 #include "base/ThreadPool.h"
 #include "extension/VLFileProviderExtension.h"
 #include "linux/framework/LocalFramework.h"
-#include "linux/framework/UnsupportedSharing.h"
 #include "linux/host/HostRequests.h"
 #include "linux/host/NSExtensionMain.h"
 #include "linux/protocol/HostServer.h"
@@ -185,8 +184,6 @@ int serve(const Arguments& arguments, const DrivePaths& paths, const FileDescrip
       HostTools{executor, timers}, std::make_unique<WorkingSetWatch>(daemon, timers), *log);
   VLLogSections logSections(executor);
   RootURL rootURL;
-  UnsupportedSharingOperations sharingOperations;
-  UnsupportedResourceValues resourceValues;
   Environment environment{*log,
                           executor,
                           notificationCenter,
@@ -202,8 +199,8 @@ int serve(const Arguments& arguments, const DrivePaths& paths, const FileDescrip
                           framework.fileManager(),
                           framework.operations(),
                           framework.bundles(),
-                          sharingOperations,
-                          resourceValues,
+                          framework.sharingOperations(),
+                          framework.resourceValues(),
                           *log};
 
   const NSExtensionPrincipalClasses classes{
