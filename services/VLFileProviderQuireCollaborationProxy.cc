@@ -1,6 +1,7 @@
 #include "services/VLFileProviderQuireCollaborationProxy.h"
 
 #include <algorithm>
+#include <span>
 #include <utility>
 
 namespace skein {
@@ -10,16 +11,16 @@ constexpr std::uint64_t kProtocolVersion = 1;
 constexpr std::uint64_t kCapabilities = 82;
 constexpr char kFileProviderIdentifier[] = "com.tessel.Vellum";
 
-constexpr std::string_view kSelectors[] = {
-    "fetchVersionAndCapabilitiesWithCompletionHandler:",
-    "fetchCollaborationTokenWithCompletionHandler:",
-    "fetchLatestRevisionWithCompletionHandler:",
-    "refreshSharingStateWithCompletionHandler:",
-    "fetchFileProviderIdentifierWithCompletionHandler:",
-    "fetchURLForSharingFileWithCompletionHandler:",
-    "fetchFolderSharingStateWithCompletionHandler:",
-    "fetchSharedFolderInfoWithCompletionHandler:",
+// What a client must ask about before it calls.
+constexpr std::string_view kLeftOut[] = {
+    "setEnvironmentType:",
+    "fetchPrivacyStateWithCompletionHandler:",
+    "documentIsInUseWithTimeout:",
 };
+
+bool contains(std::span<const std::string_view> selectors, std::string_view selector) {
+  return std::find(selectors.begin(), selectors.end(), selector) != selectors.end();
+}
 
 template <class Operation>
 std::function<void()> cancelling(const std::shared_ptr<Operation>& operation) {
@@ -31,7 +32,8 @@ std::function<void()> cancelling(const std::shared_ptr<Operation>& operation) {
 }  // namespace
 
 bool VLFileProviderQuireCollaborationProxy::respondsToSelector(std::string_view selector) const {
-  return std::find(std::begin(kSelectors), std::end(kSelectors), selector) != std::end(kSelectors);
+  return contains(VLFileProviderQuireCollaborationSelectors, selector) &&
+         !contains(kLeftOut, selector);
 }
 
 VLFileProviderQuireCollaborationProxy::Progress

@@ -9,7 +9,7 @@ std::string VLFileProviderQuireCollaborationServiceSource::serviceName() const {
 }
 
 NSXPCInterface VLFileProviderQuireCollaborationServiceSource::exportedInterface() const {
-  return NSXPCInterface::interfaceWithProtocol("VLFileProviderQuireCollaboration");
+  return NSXPCInterface::interfaceWithProtocol(VLQuireCollaborationProtocolName);
 }
 
 std::shared_ptr<NSXPCExportedObject>

@@ -16,6 +16,22 @@
 namespace skein {
 
 inline constexpr char VLQuireCollaborationServiceName[] = "com.tessel.QuireCollaboration";
+inline constexpr char VLQuireCollaborationProtocolName[] = "VLFileProviderQuireCollaboration";
+
+// The protocol's methods, in the order of their declaration.
+inline constexpr std::string_view VLFileProviderQuireCollaborationSelectors[] = {
+    "fetchVersionAndCapabilitiesWithCompletionHandler:",
+    "setEnvironmentType:",
+    "fetchCollaborationTokenWithCompletionHandler:",
+    "fetchLatestRevisionWithCompletionHandler:",
+    "refreshSharingStateWithCompletionHandler:",
+    "fetchPrivacyStateWithCompletionHandler:",
+    "documentIsInUseWithTimeout:",
+    "fetchFileProviderIdentifierWithCompletionHandler:",
+    "fetchURLForSharingFileWithCompletionHandler:",
+    "fetchFolderSharingStateWithCompletionHandler:",
+    "fetchSharedFolderInfoWithCompletionHandler:",
+};
 
 // Working together on one document, as a client process meets it. Threads and replies as
 // in VLSharingServiceV1. Only the first method is required: an object says which others it

@@ -19,7 +19,9 @@
 #include "extension/VLFileProviderExtension.h"
 #include "linux/framework/LocalFramework.h"
 #include "linux/host/HostRequests.h"
+#include "linux/host/LocalListeners.h"
 #include "linux/host/NSExtensionMain.h"
+#include "linux/host/ServiceRequests.h"
 #include "linux/protocol/HostServer.h"
 #include "linux/protocol/LogFile.h"
 #include "linux/protocol/ProcessLauncher.h"
@@ -184,6 +186,7 @@ int serve(const Arguments& arguments, const DrivePaths& paths, const FileDescrip
       HostTools{executor, timers}, std::make_unique<WorkingSetWatch>(daemon, timers), *log);
   VLLogSections logSections(executor);
   RootURL rootURL;
+  LocalListeners xpcListeners(executor);
   Environment environment{*log,
                           executor,
                           notificationCenter,
@@ -201,6 +204,7 @@ int serve(const Arguments& arguments, const DrivePaths& paths, const FileDescrip
                           framework.bundles(),
                           framework.sharingOperations(),
                           framework.resourceValues(),
+                          xpcListeners,
                           *log};
 
   const NSExtensionPrincipalClasses classes{
@@ -216,7 +220,9 @@ int serve(const Arguments& arguments, const DrivePaths& paths, const FileDescrip
   host->setExtension(std::move(extension));
 
   const auto requests = std::make_shared<HostRequests>(host, daemon, framework.containers(), *log);
-  auto server = HostServer::listen(loop, executor, requests, paths.hostSocket, *log, &error);
+  const auto services = std::make_shared<ServiceRequests>(host, requests);
+  auto server =
+      HostServer::listen(loop, executor, requests, services, paths.hostSocket, *log, &error);
   if (!server) return fail(kExitFailure, error->localizedDescription());
   VL_NOTICE(*log, "[NOTICE] serving %s", paths.store);
   report(parent, 0);

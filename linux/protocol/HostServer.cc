@@ -8,6 +8,7 @@
 #include "base/SerialQueue.h"
 #include "linux/protocol/Answer.h"
 #include "linux/protocol/HostCodec.h"
+#include "linux/protocol/ServicesServer.h"
 #include "linux/protocol/SocketServer.h"
 
 namespace skein {
@@ -21,6 +22,7 @@ struct HostPeer {
   std::shared_ptr<RpcLoop> loop;
   std::shared_ptr<Executor> executor;
   std::shared_ptr<HostService> service;
+  std::shared_ptr<HostServices> services;
   std::size_t unanswered = 0;  // on the loop's thread
 };
 using HostPeerPtr = std::shared_ptr<HostPeer>;
@@ -143,7 +145,9 @@ constexpr auto encodeError = [](auto results, const NSErrorPtr& error) {
 // The host, as one connection sees it. Lives on the loop's thread.
 class HostObject final : public wire::Host::Server {
  public:
-  explicit HostObject(HostPeerPtr peer) : _peer(std::move(peer)) {}
+  explicit HostObject(HostPeerPtr peer)
+      : _peer(std::move(peer)),
+        _services(makeServicesObject(_peer->loop, _peer->executor, _peer->services)) {}
 
   kj::Promise<void> list(ListContext context) override {
     const auto params = context.getParams();
@@ -278,10 +282,16 @@ class HostObject final : public wire::Host::Server {
         encodeError);
   }
 
+  kj::Promise<void> services(ServicesContext context) override {
+    context.getResults().setServices(_services);
+    return kj::READY_NOW;
+  }
+
  private:
   const std::shared_ptr<HostService>& service() const { return _peer->service; }
 
   const HostPeerPtr _peer;
+  capnp::Capability::Client _services;
 };
 
 }  // namespace
@@ -294,14 +304,15 @@ class HostServer::Implementation {
 std::unique_ptr<HostServer> HostServer::listen(const std::shared_ptr<RpcLoop>& loop,
                                                const std::shared_ptr<Executor>& executor,
                                                const std::shared_ptr<HostService>& service,
+                                               const std::shared_ptr<HostServices>& services,
                                                const std::string& socketPath, Log& log,
                                                NSErrorOut error) {
   auto implementation = std::make_unique<Implementation>();
   implementation->server = SocketServer::listen(
       loop, socketPath,
-      [loop, executor, service]() -> capnp::Capability::Client {
+      [loop, executor, service, services]() -> capnp::Capability::Client {
         return kj::heap<HostObject>(
-            std::make_shared<HostPeer>(HostPeer{loop, executor, service, 0}));
+            std::make_shared<HostPeer>(HostPeer{loop, executor, service, services, 0}));
       },
       log, {}, error);
   if (!implementation->server) return nullptr;

@@ -6,11 +6,12 @@
 #include "base/Executor.h"
 #include "linux/protocol/HostService.h"
 #include "linux/protocol/RpcLoop.h"
+#include "linux/protocol/ServiceEndpoints.h"
 #include "platform/log/Log.h"
 
 namespace skein {
 
-// Serves a HostService on a socket, to clients that run as this user.
+// Serves a HostService, and items' services, on a socket, to clients that run as this user.
 //
 // The service is called on the executor and answers from any thread; a Reply that it
 // destroys uncalled makes the call fail. A stream belongs to its client: when the client
@@ -22,6 +23,7 @@ class HostServer {
   static std::unique_ptr<HostServer> listen(const std::shared_ptr<RpcLoop>& loop,
                                             const std::shared_ptr<Executor>& executor,
                                             const std::shared_ptr<HostService>& service,
+                                            const std::shared_ptr<HostServices>& services,
                                             const std::string& socketPath, Log& log,
                                             NSErrorOut error);
   // Closes the socket and every connection.

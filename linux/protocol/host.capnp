@@ -55,6 +55,7 @@ interface Host {
   status @9 () -> (status :HostStatus, error :Types.Error);
   check @10 () -> (check :Check, error :Types.Error);
   setDebugLog @11 (enabled :Bool) -> (error :Types.Error);
+  services @12 () -> (services :Capability);  # Services of services.capnp
 }
 
 # Streams: each ends when its last reference goes. next may be called again before the
