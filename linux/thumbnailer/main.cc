@@ -1,0 +1,66 @@
+// skein-thumbnailer: draws documents for vald in a process that can do nothing else.
+//
+// vald starts it with a socket as descriptor 3 (see linux/rendering/RenderMessages.h). It
+// loads what the decoders need, gives up everything but the socket and its memory, and
+// answers until the socket closes.
+#include <sys/resource.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <cstdio>
+#include <cstdlib>
+#include <string>
+#include <vector>
+
+#include "linux/thumbnailer/Fonts.h"
+#include "linux/thumbnailer/LockDown.h"
+#include "linux/thumbnailer/RequestLoop.h"
+#include "linux/thumbnailer/WarmUp.h"
+
+#ifdef SKEIN_SANITIZED
+// In place of the limit of the address space. A leak checker would need system calls that
+// are taken away by then.
+extern "C" const char* __asan_default_options();   // NOLINT
+extern "C" const char* __asan_default_options() {  // NOLINT
+  return "max_allocation_size_mb=512:allocator_may_return_null=1:detect_leaks=0";
+}
+#endif
+
+namespace skein::thumbnailer {
+namespace {
+
+constexpr int kSocket = 3;
+constexpr int kNiceness = 10;  // after everything that a person waits for
+
+bool isPacketSocket(int descriptor) {
+  int type = 0;
+  socklen_t length = sizeof type;
+  return getsockopt(descriptor, SOL_SOCKET, SO_TYPE, &type, &length) == 0 && type == SOCK_SEQPACKET;
+}
+
+int run() {
+  if (!isPacketSocket(kSocket)) {
+    std::fputs("skein-thumbnailer: vald starts this program, with a socket as descriptor 3\n",
+               stderr);
+    return 2;
+  }
+  setpriority(PRIO_PROCESS, 0, kNiceness);
+  Greeting greeting;
+  const std::vector<std::string> fontFolders = prepareFonts();
+  greeting.kinds = warmUp();
+  const LockDown outcome = lockDown(fontFolders);
+  if (!outcome.problem.empty()) {
+    std::fprintf(stderr, "skein-thumbnailer: %s\n", outcome.problem.c_str());
+    return EXIT_FAILURE;
+  }
+  greeting.isFiltered = outcome.isFiltered ? 1 : 0;
+  greeting.hasFonts = outcome.hasFonts ? 1 : 0;
+  if (!outcome.hasFonts) greeting.kinds &= ~(1U << static_cast<unsigned>(PictureKind::Text));
+  // Not exit(): what runs at the end of a process asks for more than is left.
+  _exit(serveRequests(kSocket, greeting));
+}
+
+}  // namespace
+}  // namespace skein::thumbnailer
+
+int main() { return skein::thumbnailer::run(); }
