@@ -1,13 +1,11 @@
 #include "linux/protocol/ProcessLauncher.h"
 
 #include <fcntl.h>
-#include <spawn.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
-#include <csignal>
 #include <cstring>
 #include <memory>
 #include <optional>
@@ -16,6 +14,7 @@
 
 #include "base/Mutex.h"
 #include "linux/protocol/FileDescriptor.h"
+#include "linux/protocol/SpawnSettings.h"
 #include "linux/protocol/UnixSocket.h"
 #include "vellum/VLErrors.h"
 
@@ -69,35 +68,8 @@ class Child {
   std::shared_ptr<Ending> _ending;
 };
 
-class SpawnSettings {
- public:
-  SpawnSettings() {
-    posix_spawnattr_init(&attributes);
-    posix_spawn_file_actions_init(&actions);
-  }
-  ~SpawnSettings() {
-    posix_spawnattr_destroy(&attributes);
-    posix_spawn_file_actions_destroy(&actions);
-  }
-  SpawnSettings(const SpawnSettings&) = delete;
-  SpawnSettings& operator=(const SpawnSettings&) = delete;
-
-  posix_spawnattr_t attributes;
-  posix_spawn_file_actions_t actions;
-};
-
 int spawn(const std::string& file, const ProgramToStart& program, pid_t& pid) {
   SpawnSettings settings;
-  // This process may ignore signals or block them in its threads; the program starts
-  // with the system's own settings.
-  sigset_t none;
-  sigset_t all;
-  sigemptyset(&none);
-  sigfillset(&all);
-  posix_spawnattr_setsigmask(&settings.attributes, &none);
-  posix_spawnattr_setsigdefault(&settings.attributes, &all);
-  posix_spawnattr_setflags(&settings.attributes,
-                           POSIX_SPAWN_SETSID | POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETSIGDEF);
   posix_spawn_file_actions_addopen(&settings.actions, STDIN_FILENO, "/dev/null", O_RDONLY, 0);
   posix_spawn_file_actions_addopen(&settings.actions, STDOUT_FILENO, program.logPath.c_str(),
                                    O_WRONLY | O_CREAT | O_APPEND, 0600);

@@ -42,6 +42,8 @@ inline constexpr std::uint32_t kRenderVersion = 1;
 inline constexpr std::uint32_t kLargestSide = 1024;
 inline constexpr std::uint64_t kMostPictureBytes = 16 << 20;
 inline constexpr std::size_t kRequestDescriptors = 2;
+// Of processor time, in a worker's whole life.
+inline constexpr std::uint64_t kWorkerSeconds = 600;
 
 struct Greeting {
   std::uint32_t version = kRenderVersion;

@@ -27,8 +27,9 @@ struct Limit {
   rlim_t value;
   const char* name;
 };
+// vald sets a shorter limit of time for each document.
 constexpr Limit kLimits[] = {
-    {RLIMIT_CPU, kLifetimeSeconds, "processor time"},
+    {RLIMIT_CPU, kWorkerSeconds, "processor time"},
     {RLIMIT_NOFILE, kDescriptors, "open files"},
     {RLIMIT_FSIZE, kMostPictureBytes, "file sizes"},
     {RLIMIT_CORE, 0, "core dumps"},

@@ -20,8 +20,6 @@ LockDown lockDown(const std::vector<std::string>& fontFolders);
 // What a worker's address space may grow to. Sanitizers reserve far more than that for
 // themselves; builds with them limit each allocation instead (see main.cc).
 inline constexpr unsigned long kAddressSpace = 1UL << 30;
-// Seconds of processor time in a worker's life. vald sets a shorter limit for each document.
-inline constexpr unsigned long kLifetimeSeconds = 600;
 
 #if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
 #define SKEIN_SANITIZED 1

@@ -84,8 +84,11 @@ TEST_F(ContentsTest, ARecordKeepsItsPlaceAndCountsItsRevisions) {
   const std::string path = rig.write("a", "one");
   const VLFileObjectID document = documentNumber(0xffffffffffffffff);
   ASSERT_TRUE(std::holds_alternative<UploadDone>(rig.upload(document, path)));
-  ASSERT_EQ(brief(rig.records->setThumbnail(document, "/thumbnails/1")), "none");
   const auto first = **rig.records->record(document);
+  EXPECT_EQ(rig.records->documentsWithoutThumbnail(std::nullopt, 9)->size(), 1u);
+  EXPECT_EQ(rig.records->documentsWithoutThumbnail(document, 9)->size(), 0u);
+  ASSERT_EQ(brief(rig.records->setThumbnail(document, first.contents.hash, "/thumbnails/1")),
+            "none");
   EXPECT_EQ(first.revision, 1);
   EXPECT_EQ(first.recordID(),
             (CKRecordID{"dffffffffffffffff", {kDocumentsZone, CKCurrentUserDefaultName}}));
@@ -97,6 +100,9 @@ TEST_F(ContentsTest, ARecordKeepsItsPlaceAndCountsItsRevisions) {
   EXPECT_EQ((*rig.records->record(document))->thumbnail, "/thumbnails/1");
   rig.write("a", "two");
   ASSERT_TRUE(std::holds_alternative<UploadDone>(rig.upload(document, path)));
+  // One of the first revision that comes late.
+  ASSERT_EQ(brief(rig.records->setThumbnail(document, first.contents.hash, "/thumbnails/1")),
+            "none");
 
   // All of it is there for the next process.
   rig.records = std::move(*CloudRecords::open((rig.top / "cloud/records").string()));

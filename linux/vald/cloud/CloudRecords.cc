@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cstring>
+#include <limits>
 #include <utility>
 
 namespace skein::vald {
@@ -170,13 +171,36 @@ NSErrorPtr CloudRecords::remove(VLFileObjectID document) {
   return error;
 }
 
-NSErrorPtr CloudRecords::setThumbnail(VLFileObjectID document,
+NSErrorPtr CloudRecords::setThumbnail(VLFileObjectID document, const ContentHash& contents,
                                       const std::optional<std::string>& path) {
   MutexLock lock(_mutex);
-  return _database->prepare("UPDATE records SET thumbnail = ? WHERE document = ?")
-      ->bind(1, path)
-      .bind(2, key(document))
-      .run();
+  return _database->withoutWaiting([&]() SKEIN_NO_THREAD_SAFETY_ANALYSIS {
+    return _database->prepare("UPDATE records SET thumbnail = ? WHERE document = ? AND hash = ?")
+        ->bind(1, path)
+        .bind(2, key(document))
+        .bindBytes(3, bytesOf(contents))
+        .run();
+  });
+}
+
+Outcome<std::vector<VLFileObjectID>> CloudRecords::documentsWithoutThumbnail(
+    std::optional<VLFileObjectID> last, std::size_t limit) {
+  MutexLock lock(_mutex);
+  const auto row = _database->prepare(
+      "SELECT document FROM records WHERE thumbnail IS NULL AND document >= ? AND document IS NOT "
+      "? "
+      "ORDER BY document LIMIT ?");
+  const std::int64_t from = last ? key(*last) : std::numeric_limits<std::int64_t>::min();
+  row->bind(1, from)
+      .bind(2, last ? std::optional(from) : std::nullopt)
+      .bind(3, static_cast<std::int64_t>(limit));
+  std::vector<VLFileObjectID> documents;
+  while (row->step()) {
+    documents.push_back(
+        VLFileObjectID::documentWithRawID(static_cast<std::uint64_t>(row->integer(0))));
+  }
+  if (NSErrorPtr error = row->error()) return error;
+  return documents;
 }
 
 Outcome<std::uint64_t> CloudRecords::references(const ContentHash& hash) {

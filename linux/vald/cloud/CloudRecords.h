@@ -57,7 +57,13 @@ class CloudRecords {
       SKEIN_EXCLUDES(_mutex);
   // Forgets all about the document; its contents become garbage unless others refer to them.
   NSErrorPtr remove(VLFileObjectID document) SKEIN_EXCLUDES(_mutex);
-  NSErrorPtr setThumbnail(VLFileObjectID document, const std::optional<std::string>& path)
+  // Only while the record still is of these contents: a thumbnail takes a while to make. A
+  // power cut may lose it: it is then missing, and made again.
+  NSErrorPtr setThumbnail(VLFileObjectID document, const ContentHash& contents,
+                          const std::optional<std::string>& path) SKEIN_EXCLUDES(_mutex);
+  // At most `limit` documents, in the records' own order after `last` (nil: from the start).
+  Outcome<std::vector<VLFileObjectID>> documentsWithoutThumbnail(std::optional<VLFileObjectID> last,
+                                                                 std::size_t limit)
       SKEIN_EXCLUDES(_mutex);
 
   // How many records refer to the contents.
