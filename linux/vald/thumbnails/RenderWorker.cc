@@ -85,11 +85,12 @@ Outcome<std::shared_ptr<RenderWorker>> RenderWorker::start(Options options) {
     return notStarted(options.program, std::string("has no socket: ") + std::strerror(errno));
   }
   FileDescriptor own(sockets[0]);
-  const FileDescriptor others(sockets[1]);
+  FileDescriptor others(sockets[1]);
   pid_t process = 0;
   if (const int code = spawn(options.program, others.get(), options.keepsStandardError, process)) {
     return notStarted(options.program, std::string("cannot be run: ") + std::strerror(code));
   }
+  others.reset();  // now the worker's end alone keeps the socket open
   std::shared_ptr<RenderWorker> worker(
       new RenderWorker(std::move(options), process, std::move(own)));
   if (NSErrorPtr error = worker->awaitGreeting()) return error;
