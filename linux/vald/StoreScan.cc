@@ -442,15 +442,16 @@ void StoreWriter::reconcile(DirtySet& dirty) {
   }
   // What is left is on its way: its parent's change was not seen yet.
   const bool mayRetry = !dirty.folders.empty() && ++_laterTries < kMostTries;
-  if (mayRetry) {
-    _later.folders.merge(dirty.folders);
-  } else {
+  if (!mayRetry) {
     _laterTries = 0;
+    dirty.folders.clear();
   }
-  for (auto& [key, changes] : unread.folders) {
-    DirtyFolder& later = _later.folders[key];
-    later.whole = later.whole || changes.whole;
-    later.names.merge(changes.names);
+  for (DirtySet* left : {&dirty, &unread}) {
+    for (auto& [key, changes] : left->folders) {
+      DirtyFolder& later = _later.folders[key];
+      later.whole = later.whole || changes.whole;
+      later.names.merge(changes.names);
+    }
   }
   commit();
 }
