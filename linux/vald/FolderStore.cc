@@ -6,7 +6,9 @@
 #include <cerrno>
 #include <cstring>
 
+#include "linux/vald/files/FileNames.h"
 #include "linux/vald/index/IndexFile.h"
+#include "linux/vald/scan/StoreNames.h"
 #include "platform/foundation/uuid.h"
 #include "vellum/VLErrors.h"
 
@@ -178,7 +180,11 @@ Page FolderStore::list(const FolderRow& folder, SortOrder order, std::uint64_t o
     }
   }
   page.items.reserve(items.size());
-  for (const FoundItem& item : items) page.items.push_back(item.item());
+  for (const FoundItem& item : items) {
+    // Folders in the trash are none of all folders.
+    if (folder.number == kNoFolder && item.holder.isTrashed) continue;
+    page.items.push_back(item.item());
+  }
   return page;
 }
 
@@ -214,6 +220,8 @@ VLQueryItemPtr FolderStore::itemWithID(VLFileObjectID id, NSErrorOut error) {
     auto reader = _readers.lease();
     if (storeFailure(reader, error)) return nullptr;
     if (const auto found = reader->itemWithID(id)) return found->item();
+    const auto folder = reader->folderWithID(id);
+    if (folder && isTrashFolderName(folder->name)) return trashItem(*reader.get(), *folder);
     drive = reader->folder(kDriveFolder);
     if (storeFailure(reader, error)) return nullptr;
   }
@@ -222,35 +230,57 @@ VLQueryItemPtr FolderStore::itemWithID(VLFileObjectID id, NSErrorOut error) {
   return nullptr;
 }
 
+VLQueryItemPtr FolderStore::trashItem(IndexReader& reader, const FolderRow& trash) {
+  const auto root = reader.folder(trash.parent);
+  if (!root) return nullptr;
+  return makeTrashItem(trash.id, {root->id, root->number == kDriveFolder, true},
+                       trash.scanned ? std::optional(trash.children) : std::nullopt);
+}
+
+std::optional<FolderRow> FolderStore::rootAbove(IndexReader& reader, const std::string& path,
+                                                std::string& rest) {
+  for (const RootRow& root : reader.roots()) {
+    if (!isAtOrBelow(path, root.path)) continue;
+    rest = path.size() > root.path.size() ? path.substr(root.path.size() + 1) : "";
+    auto folder = reader.folder(root.folder);
+    // The trash is a folder of the root by a way of two names.
+    const std::string trashName = ownTrashFolderName();
+    if (!isAtOrBelow(rest, trashName)) return folder;
+    for (FolderRow& trash : reader.trashes()) {
+      if (trash.parent != root.folder) continue;
+      rest = rest.size() > trashName.size() ? rest.substr(trashName.size() + 1) : "";
+      return std::move(trash);
+    }
+    return folder;
+  }
+  return std::nullopt;
+}
+
+VLQueryItemPtr FolderStore::driveItem(const FolderRow& folder, NSErrorOut error) {
+  int code = 0;
+  FileDescriptor handle;
+  FileState state;
+  if (vald::openFolder(_drive, "", _drive.key, handle, code) != Look::Seen ||
+      !readSelf(handle.get(), state)) {
+    rootIsThere(error);
+    return nullptr;
+  }
+  const std::size_t slash = _drive.path.rfind('/');
+  return makeDriveItem(folder.id, _drive.path.substr(slash + 1), state,
+                       folder.scanned ? std::optional(folder.children) : std::nullopt);
+}
+
 VLQueryItemPtr FolderStore::itemAtPath(const std::string& path, bool scanFirst, NSErrorOut error) {
-  std::vector<RootRow> roots;
   std::optional<FolderRow> folder;
   std::string rest;
   {
     auto reader = _readers.lease();
     if (storeFailure(reader, error)) return nullptr;
-    for (const RootRow& root : reader->roots()) {
-      if (path != root.path && !path.starts_with(root.path + '/')) continue;
-      folder = reader->folder(root.folder);
-      rest = path.size() > root.path.size() ? path.substr(root.path.size() + 1) : "";
-      if (folder && rest.empty()) {
-        if (root.containerID) {
-          const auto found = reader->itemWithID(folder->id);
-          if (found) return found->item();
-        }
-        int code = 0;
-        FileDescriptor handle;
-        FileState state;
-        if (vald::openFolder(_drive, "", _drive.key, handle, code) != Look::Seen ||
-            !readSelf(handle.get(), state)) {
-          rootIsThere(error);
-          return nullptr;
-        }
-        const std::size_t slash = _drive.path.rfind('/');
-        return makeDriveItem(folder->id, _drive.path.substr(slash + 1), state,
-                             folder->scanned ? std::optional(folder->children) : std::nullopt);
-      }
-      break;
+    folder = rootAbove(*reader.get(), path, rest);
+    if (folder && rest.empty()) {
+      if (isTrashFolderName(folder->name)) return trashItem(*reader.get(), *folder);
+      if (const auto found = reader->itemWithID(folder->id)) return found->item();
+      return driveItem(*folder, error);
     }
     if (storeFailure(reader, error)) return nullptr;
   }
@@ -295,9 +325,9 @@ std::optional<std::string> FolderStore::pathForID(VLFileObjectID id, NSErrorOut 
   if (storeFailure(reader, error)) return std::nullopt;
   std::optional<std::string> path;
   if (const auto folder = reader->folderWithID(id)) {
-    path = pathOfFolder(*reader.operator->(), folder->number);
+    path = pathOfFolder(*reader.get(), folder->number);
   } else if (const auto found = reader->itemWithID(id)) {
-    path = pathOfFolder(*reader.operator->(), found->row.parent);
+    path = pathOfFolder(*reader.get(), found->row.parent);
     if (path) *path += '/' + found->row.name;
   }
   if (storeFailure(reader, error)) return std::nullopt;
@@ -387,73 +417,6 @@ std::optional<std::string> FolderStore::setting(const std::string& key) {
 
 void FolderStore::setSetting(const std::string& key, std::optional<std::string> value) {
   _writer->perform([this, key, value = std::move(value)] { _writer->setSetting(key, value); });
-}
-
-std::vector<IndexDifference> FolderStore::check(std::uint64_t limit) {
-  using Kind = IndexDifference::Kind;
-  // What is under way is no difference.
-  settle(std::chrono::seconds(30));
-  std::vector<IndexDifference> differences;
-  const auto add = [&](Kind kind, const std::string& path, const std::string& detail) {
-    if (differences.size() < limit) differences.push_back({kind, path, detail});
-  };
-  auto reader = _readers.lease();
-  if (!reader) return differences;
-  for (const RootRow& rootRow : reader->roots()) {
-    int error = 0;
-    const auto root = findRoot(rootRow.path, error);
-    if (!root) {
-      add(Kind::MissingInStore, rootRow.path, std::strerror(error));
-      continue;
-    }
-    std::vector<std::pair<FolderKey, std::string>> folders{{rootRow.folder, ""}};
-    while (!folders.empty() && differences.size() < limit) {
-      const auto [key, relative] = std::move(folders.back());
-      folders.pop_back();
-      const auto folder = reader->folder(key);
-      if (!folder) continue;
-      const std::string path = root->path + (relative.empty() ? "" : '/' + relative);
-      FileDescriptor handle;
-      Look look = vald::openFolder(*root, relative, relative.empty() ? root->key : folder->key,
-                                   handle, error);
-      const FolderSnapshot snapshot =
-          look == Look::Seen ? readFolder(handle.get(), Detail::Full) : FolderSnapshot{};
-      if (look != Look::Seen || snapshot.look != Look::Seen) {
-        if (look == Look::Gone) add(Kind::MissingInStore, path, "the folder is gone");
-        continue;
-      }
-      std::vector<ItemRow> rows = reader->children(key);
-      std::erase_if(rows, [](const ItemRow& row) { return row.containerID.has_value(); });
-      auto row = rows.begin();
-      auto entry = snapshot.entries.begin();
-      while (row != rows.end() || entry != snapshot.entries.end()) {
-        if (entry == snapshot.entries.end() || (row != rows.end() && row->name < entry->name)) {
-          add(Kind::MissingInStore, path + '/' + row->name, row->id.asString());
-          ++row;
-          continue;
-        }
-        const std::string entryPath = path + '/' + std::string(entry->name);
-        if (row == rows.end() || entry->name < row->name) {
-          add(Kind::MissingInIndex, entryPath, "the index has no item of this name");
-          ++entry;
-          continue;
-        }
-        if (row->state.kind != entry->state.kind || !row->state.key.names(entry->state.key)) {
-          add(Kind::Identity, entryPath, "the index knows another file by this name");
-        } else if (row->folder == kNoFolder && (row->state.size != entry->state.size ||
-                                                row->state.modified != entry->state.modified)) {
-          add(Kind::Attributes, entryPath, "size or dates differ");
-        }
-        if (row->folder != kNoFolder) {
-          folders.emplace_back(row->folder,
-                               relative.empty() ? row->name : relative + '/' + row->name);
-        }
-        ++row;
-        ++entry;
-      }
-    }
-  }
-  return differences;
 }
 
 }  // namespace skein::vald

@@ -1,8 +1,11 @@
 #pragma once
 
+#include <functional>
 #include <map>
 #include <memory>
 #include <string>
+#include <utility>
+#include <vector>
 
 #include "base/Mutex.h"
 #include "linux/vald/Store.h"
@@ -40,6 +43,41 @@ class FolderStore final : public Store {
   void setSetting(const std::string& key, std::optional<std::string> value) override;
   bool settle(std::chrono::milliseconds deadline) override { return _writer->settle(deadline); }
 
+  // What the operations on files need beside reading. Any thread; waits for the writer.
+
+  // Looks at these absolute paths as at one change, so that an answer that follows tells of
+  // them as they are now. Folders that were not read yet are left to their scan.
+  void lookAtPaths(const std::vector<std::string>& paths);
+  // Changes what the index alone keeps of an item; durable when it returns.
+  NSErrorPtr changeDetails(VLFileObjectID id, std::function<void(ItemDetails&)> change);
+  ItemDetails details(VLFileObjectID id);
+  // Every tag with the number of its items, by name.
+  std::vector<std::pair<std::string, std::uint64_t>> tagsInUse();
+  // What lies in the roots' trashes, unordered, with absolute paths.
+  struct Trashed {
+    VLQueryItemPtr item;
+    std::string path;
+    std::int64_t changed = 0;  // the file's time of change, in nanoseconds since 1970
+  };
+  std::vector<Trashed> trashedItems(NSErrorOut error);
+  // What the store saw go from a path, newest first.
+  struct Removal {
+    VLFileObjectID id = VLFileObjectID::documentWithRawID(0);
+    NSDate when;
+  };
+  std::vector<Removal> removalsAt(const std::string& path, std::uint64_t limit);
+
+  // Documents after `rank` in whose upload nothing is known to be in order.
+  struct Unsettled {
+    VLFileObjectID id = VLFileObjectID::documentWithRawID(0);
+    std::string path;  // absolute
+    std::uint64_t size = 0;
+  };
+  // `rank` moves to where to go on from; it stays when there are no more.
+  std::vector<Unsettled> unsettledAfter(std::uint64_t& rank, std::uint64_t limit);
+  void noteUploads(std::vector<UploadedFile> files);
+  bool isReadingAttributes() const { return _writer->isReadingAttributes(); }
+
   // For tests: as the kernel does when its queue is full.
   void loseEvents(bool on) { _writer->watcher().loseEvents(on); }
 
@@ -51,6 +89,13 @@ class FolderStore final : public Store {
   bool ensureRead(const FolderRow& folder, bool isFirstPage, NSErrorOut error);
   Page list(const FolderRow& folder, SortOrder order, std::uint64_t offset, std::uint64_t limit,
             NSErrorOut error);
+  // The root, or its trash, that a path lies in, and the way from there.
+  std::optional<FolderRow> rootAbove(IndexReader& reader, const std::string& path,
+                                     std::string& rest);
+  // The folder that a path's item is in and its name; nil for roots and for what is not read.
+  std::optional<StoreWriter::Place> placeOf(IndexReader& reader, const std::string& path);
+  VLQueryItemPtr trashItem(IndexReader& reader, const FolderRow& trash);
+  VLQueryItemPtr driveItem(const FolderRow& folder, NSErrorOut error);
   std::optional<std::string> pathOfFolder(IndexReader& reader, FolderKey folder);
   bool storeFailure(IndexReaders::Lease& reader, NSErrorOut error);
   bool rootIsThere(NSErrorOut error);

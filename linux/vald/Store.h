@@ -47,6 +47,8 @@ struct StoreChange {
   // that hold it (a sender watches by these). Equal unless it moved.
   VLFileObjectID folder = VLFileObjectID::folderOrAliasWithRawID(0);
   VLFileObjectID previousFolder = VLFileObjectID::folderOrAliasWithRawID(0);
+  // Whether something changed on disk, and not only what the index alone knows.
+  bool isOfFile = true;
 };
 
 struct ChangePage {

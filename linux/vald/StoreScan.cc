@@ -7,14 +7,16 @@
 #include "linux/vald/StoreWriter.h"
 #include "linux/vald/index/IndexFile.h"
 #include "linux/vald/scan/DocumentNumbers.h"
+#include "linux/vald/scan/StoreNames.h"
 
 namespace skein::vald {
 namespace {
 
 constexpr char kComplete[] = "scanned once";
+constexpr char kAttributesRead[] = "attributes read";
+constexpr char kAttributesUntil[] = "attributes until";
 // A bulk load tells so many items one by one; a small folder is all there is to many.
 constexpr std::uint64_t kMostToldInBulk = 5000;
-constexpr int kMostTries = 25;
 
 bool isSameRoot(const FileKey& a, const FileKey& b) {
   return a.inode == b.inode && a.generation == b.generation;
@@ -61,6 +63,19 @@ void StoreWriter::load() {
   }
   commit();
   setContainers(_options.containers);
+  checkTrashes(false);
+  const auto rankOf = [&](const char* name) {
+    const auto text = _index.setting(name);
+    return text ? std::stoull(*text) : 0;
+  };
+  _attributesAt = rankOf(kAttributesRead);
+  _attributesUntil = rankOf(kAttributesUntil);
+  if (!_isBulk && _attributesUntil == 0) {
+    // A first scan that was cut off, or an index from before attributes were read.
+    _attributesUntil = _index.rank();
+    _index.setSetting(kAttributesUntil, std::to_string(_attributesUntil));
+  }
+  _isReadingAttributes = _attributesAt < _attributesUntil;
   startRound(_isBulk || !_index.setting(kComplete) ? LocalDaemonStatus::Scan::First
                                                    : LocalDaemonStatus::Scan::Verifying);
 }
@@ -80,6 +95,7 @@ void StoreWriter::setContainers(const std::vector<StoreRoot>& containers) {
   if (!unwanted.empty() && _isBulk) endBulkLoad();
   begin();
   for (const FolderKey folder : unwanted) {
+    removeTrash(folder);
     const Folder* found = _folders.find(folder);
     if (found != nullptr) {
       if (const auto row = _index.rowWithID(found->row.id)) _reconciler.buryTree(*row);
@@ -136,6 +152,7 @@ void StoreWriter::setContainers(const std::vector<StoreRoot>& containers) {
   afterDecisions();
   commit();
   enqueue(fresh);
+  checkTrashes(false);
 }
 
 void StoreWriter::checkRoots() {
@@ -159,6 +176,7 @@ void StoreWriter::checkRoots() {
     root.isLost = !isThere;
   }
   if (isBack) startRound(LocalDaemonStatus::Scan::Rescanning);
+  checkTrashes(false);
 }
 
 void StoreWriter::startRound(LocalDaemonStatus::Scan kind) {
@@ -171,7 +189,10 @@ void StoreWriter::startRound(LocalDaemonStatus::Scan kind) {
   _scanned = 0;
   _scanKind = kind;
   std::vector<FolderKey> roots;
-  for (const auto& [folder, root] : _folders.roots()) roots.push_back(folder);
+  for (const auto& [folder, root] : _folders.roots()) {
+    roots.push_back(folder);
+    if (const FolderKey trash = _folders.trashOf(folder)) roots.push_back(trash);
+  }
   // The drive's own folder is read first.
   std::sort(roots.begin(), roots.end());
   enqueue(roots);
@@ -249,7 +270,8 @@ void StoreWriter::accept(FolderKey key, const FolderSnapshot& snapshot, bool inR
   switch (snapshot.look) {
     case Look::Seen: break;
     case Look::Gone:
-      // Its parent tells where it went.
+      // Its parent tells where it went; a trash is asked for by itself.
+      if (isTrashFolderName(folder->row.name)) return;
       if (folder->row.parent != kNoFolder) {
         _later.folders[folder->row.parent].names.insert(folder->row.name);
       }
@@ -283,8 +305,15 @@ void StoreWriter::loadFolder(FolderKey key, const FolderSnapshot& snapshot) {
     row.name = entry.name;
     row.state = entry.state;
     row.folder = kNoFolder;
+    row.hasDetails = false;
+    row.isUploaded = entry.state.isEvicted;
     if (entry.state.kind == ItemKind::Document) {
       row.id = VLFileObjectID::documentWithRawID(drawDocumentNumber());
+      // A marker names its document; a second one is a copy.
+      const std::uint64_t marked = entry.state.markedDocument;
+      if (marked != 0 && _bulkIDs.insert(marked).second) {
+        row.id = VLFileObjectID::documentWithRawID(marked);
+      }
     } else {
       std::uint32_t attempt = 0;
       do {
@@ -329,6 +358,9 @@ void StoreWriter::endBulkLoad() {
   if (!commit()) return;
   _isBulk = false;
   _bulkIDs.clear();
+  _attributesUntil = _index.rank();
+  _isReadingAttributes = _attributesAt < _attributesUntil;
+  _index.setSetting(kAttributesUntil, std::to_string(_attributesUntil));
   if (!buildSecondaryIndexes(*_database)) {
     fail();
     return;
@@ -357,13 +389,21 @@ Look StoreWriter::lookAtFolder(FolderKey key, int& error) {
 }
 
 Look StoreWriter::lookAtName(FolderKey folder, const std::string& name) {
+  return lookAtNames({{folder, name}});
+}
+
+Look StoreWriter::lookAtNames(const std::vector<Place>& places) {
   if (_isBulk) endBulkLoad();
+  checkTrashes(false);
   _disk.forget();
-  FileState state;
-  const Look look = _disk.at(folder, name, state);
   begin();
-  if (look == Look::Seen) _reconciler.addName(folder, name, state);
-  if (look == Look::Gone) _reconciler.addName(folder, name, std::nullopt);
+  Look look = Look::Gone;
+  for (const auto& [folder, name] : places) {
+    FileState state;
+    look = _disk.at(folder, name, state);
+    if (look == Look::Seen) _reconciler.addName(folder, name, state);
+    if (look == Look::Gone) _reconciler.addName(folder, name, std::nullopt);
+  }
   _reconciler.decide(false);
   afterDecisions();
   commit();
@@ -385,101 +425,6 @@ void StoreWriter::tellAnew(VLFileObjectID id, bool withContents) {
                 std::make_move_iterator(children.end()));
   }
   commit();
-}
-
-// ---- changes that the watcher saw
-
-void StoreWriter::reconcile(DirtySet& dirty) {
-  begin();
-  DirtySet unread;
-  // A folder whose way changed in this very batch is found once its own change is decided.
-  for (bool isProgress = true; isProgress && !dirty.folders.empty();) {
-    isProgress = false;
-    _disk.forget();
-    for (auto entry = dirty.folders.begin(); entry != dirty.folders.end();) {
-      const FolderKey key = entry->first;
-      const Folder* folder = _folders.find(key);
-      int descriptor = -1;
-      int error = 0;
-      // A folder that was not read yet will be. It may be on its way here, read before this
-      // change: then the change waits until the folder has arrived.
-      const bool isKnown = folder != nullptr && folder->row.scanned;
-      if (!isKnown && _scanner.pending() > 0) {
-        unread.folders.insert(std::move(*entry));
-        entry = dirty.folders.erase(entry);
-        continue;
-      }
-      const Look look = isKnown ? _disk.open(key, descriptor, error) : Look::RootLost;
-      if (look == Look::Gone) {
-        ++entry;
-        continue;
-      }
-      if (look == Look::Unreadable) noteUnreadable(key, error);
-      if (look == Look::Seen) {
-        const auto& names = entry->second.names;
-        if (entry->second.whole || (names.size() > 64 && names.size() * 2 > folder->row.children)) {
-          const FolderSnapshot snapshot = readFolder(descriptor, Detail::Full);
-          if (snapshot.look == Look::Seen) {
-            _reconciler.addFolder(key, snapshot);
-          } else {
-            noteUnreadable(key, snapshot.error);
-          }
-        } else {
-          for (const std::string& name : names) {
-            FileState state;
-            const Look there = readEntry(descriptor, name, state, error);
-            if (there == Look::Seen) _reconciler.addName(key, name, state);
-            if (there == Look::Gone) _reconciler.addName(key, name, std::nullopt);
-          }
-        }
-        _reconciler.addSelf(key);
-      }
-      isProgress = true;
-      entry = dirty.folders.erase(entry);
-    }
-    _reconciler.decide(false);
-    afterDecisions();
-  }
-  // What is left is on its way: its parent's change was not seen yet.
-  const bool mayRetry = !dirty.folders.empty() && ++_laterTries < kMostTries;
-  if (!mayRetry) {
-    _laterTries = 0;
-    dirty.folders.clear();
-  }
-  for (DirtySet* left : {&dirty, &unread}) {
-    for (auto& [key, changes] : left->folders) {
-      DirtyFolder& later = _later.folders[key];
-      later.whole = later.whole || changes.whole;
-      later.names.merge(changes.names);
-    }
-  }
-  commit();
-}
-
-void StoreWriter::retain(VLFileObjectID id, bool isRetained) {
-  const FolderKey key = _folders.folderWithID(id);
-  Folder* folder = _folders.find(key);
-  if (folder == nullptr) return;
-  if (!isRetained) {
-    if (folder->retained > 0) --folder->retained;
-    return;
-  }
-  ++folder->retained;
-  if (_watcher.isWatched(key)) return;
-  int descriptor = -1;
-  int error = 0;
-  _disk.forget();
-  if (_disk.open(key, descriptor, error) != Look::Seen) return;
-  if (!_watcher.watch(key, descriptor)) {
-    const auto victim = _watcher.victim([&](FolderKey candidate) {
-      const Folder* other = _folders.find(candidate);
-      return other == nullptr || (other->retained == 0 && !_folders.roots().contains(candidate));
-    });
-    if (!victim) return;
-    _watcher.unwatch(*victim);
-    noteWatch(*victim, false);
-  }
-  lookAtFolder(key, error);
 }
 
 }  // namespace skein::vald

@@ -14,6 +14,7 @@ using namespace std::chrono_literals;
 constexpr auto kGatherWindow = 40ms;
 constexpr auto kTransactionLength = 150ms;
 constexpr auto kTick = 2s;
+constexpr auto kAttributePause = 2ms;
 constexpr auto kSlowRound = 30s;
 constexpr auto kLongestBulkWait = 10s;
 // Beyond this, receivers list afresh rather than hear of every item.
@@ -45,7 +46,9 @@ StoreWriter::StoreWriter(StoreOptions options, RootFolder drive,
       _index(*_database),
       _disk(_folders),
       _journal(_index, _folders),
-      _reconciler(_index, _journal, _folders, _disk, _options.graceWindow, millisecondsNow),
+      _details(_index, _disk),
+      _reconciler(_index, _journal, _folders, _disk, _details, _options.graceWindow,
+                  millisecondsNow),
       _drive(std::move(drive)) {
   _thread = std::thread([this] { run(); });
 }
@@ -105,6 +108,7 @@ StoreWriter::Instant StoreWriter::nextDeadline() {
   if (_scanner.hasResult() || (_inRound && _scanner.pending() == 0)) return now;
   Instant deadline = _lastTick + kTick;
   if (_inTransaction) deadline = std::min(deadline, _transactionStart + kTransactionLength);
+  if (_isReadingAttributes && !_inRound) deadline = std::min(deadline, now + kAttributePause);
   if (!_later.empty()) deadline = std::min(deadline, now + kGatherWindow);
   if (const auto since = _watcher.dirtySince()) {
     deadline = std::min(deadline, _isBulk ? _bulkStart + kLongestBulkWait : *since + kGatherWindow);
@@ -128,6 +132,7 @@ void StoreWriter::run() {
     if (!_isBroken && !_reload) {
       takeScans();
       takeDirt();
+      readSomeAttributes();
     }
     answerSettled();
     tick();

@@ -2,6 +2,7 @@
 
 #include <atomic>
 #include <chrono>
+#include <functional>
 #include <memory>
 #include <string>
 #include <thread>
@@ -20,6 +21,12 @@
 #include "linux/vald/watch/Watcher.h"
 
 namespace skein::vald {
+
+// A file that the cloud has the contents of, as it looked then.
+struct UploadedFile {
+  VLFileObjectID document = VLFileObjectID::documentWithRawID(0);
+  FileState state;  // kind, inode, size and times
+};
 
 // The store's one writer thread: takes what the scanner read and the watcher saw, and
 // brings the index to it, one transaction per batch. Everything that writes goes through
@@ -44,6 +51,16 @@ class StoreWriter {
   // Inside perform().
   Look lookAtFolder(FolderKey folder, int& error);
   Look lookAtName(FolderKey folder, const std::string& name);
+  // Several names as one change: what went from one of them to another moved.
+  struct Place {
+    FolderKey folder = kNoFolder;
+    std::string name;
+  };
+  Look lookAtNames(const std::vector<Place>& places);
+  // False when there is no such item, or it could not be written. Durable.
+  bool changeDetails(VLFileObjectID id, const std::function<void(ItemDetails&)>& change);
+  // What the cloud has now; said of a file that looks otherwise by now, it is ignored.
+  void noteUploads(const std::vector<UploadedFile>& files);
   void setContainers(const std::vector<StoreRoot>& containers);
   void tellAnew(VLFileObjectID id, bool withContents);
   void retain(VLFileObjectID folder, bool isRetained);
@@ -57,6 +74,8 @@ class StoreWriter {
   // Why the index cannot be used; empty while it can.
   std::string failure() const SKEIN_EXCLUDES(_mutex);
   Watcher& watcher() { return _watcher; }
+  // Whether the attributes of what the first scan found are still being read.
+  bool isReadingAttributes() const { return _isReadingAttributes.load(); }
 
  private:
   struct Waiter;
@@ -76,6 +95,11 @@ class StoreWriter {
   void load();
   void adoptRoot(FolderKey folder, RootFolder found, std::optional<std::string> containerID);
   void checkRoots();
+  // Finds the roots' trash folders, and those that went. Those that came, unless `now`, are
+  // scanned like other folders.
+  void checkTrashes(bool now);
+  void addTrash(FolderKey root, const FileKey& key, bool now);
+  void removeTrash(FolderKey root);
   void startRound(LocalDaemonStatus::Scan kind);
   void finishRound();
   void enqueue(const std::vector<FolderKey>& folders);
@@ -89,6 +113,10 @@ class StoreWriter {
   void loadFolder(FolderKey folder, const FolderSnapshot& snapshot);
   void endBulkLoad();
   void reconcile(DirtySet& dirty);
+  // What changed in one folder that is open.
+  void gather(FolderKey folder, int descriptor, const DirtyFolder& changes);
+  // A piece of the round over attributes that follows a first scan.
+  void readSomeAttributes();
 
   // Transactions.
   void begin();
@@ -111,6 +139,7 @@ class StoreWriter {
   FolderTable _folders;
   Disk _disk;
   Journal _journal;
+  Details _details;
   Reconciler _reconciler;
   RootFolder _drive;
   bool _isBulk = false;
@@ -128,6 +157,9 @@ class StoreWriter {
   std::unordered_set<FolderKey> _unreadable;
   DirtySet _later;  // what could not be read yet
   int _laterTries = 0;
+  // The attributes of rows with ranks from here to there are yet to be read.
+  std::uint64_t _attributesAt = 0;
+  std::uint64_t _attributesUntil = 0;
   Instant _lastTick;
   Instant _lastSlowRound;
   bool _isBroken = false;  // the index is damaged: nothing is written any more
@@ -147,6 +179,7 @@ class StoreWriter {
   LocalDaemonStatus _status SKEIN_GUARDED_BY(_mutex);
   std::atomic<std::uint64_t> _rank{0};
   std::atomic<std::uint64_t> _oldestRank{0};
+  std::atomic<bool> _isReadingAttributes{false};
   std::thread _thread;
 };
 

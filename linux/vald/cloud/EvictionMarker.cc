@@ -19,7 +19,6 @@ constexpr std::string_view kPartSuffix = ".skein-part";
 constexpr std::string_view kFreshSuffix = ".skein-new";
 constexpr std::string_view kAsideSuffix = ".skein-old";
 constexpr std::size_t kLongestPlainName = 240;
-constexpr std::size_t kLongestBeginning = 200;
 constexpr std::size_t kLargestMarker = 4096;
 
 // Bytes that would end a line or a word, and "%" itself, as "%" and two digits.
@@ -156,7 +155,7 @@ MarkerNames::MarkerNames(const std::string& name) {
   std::string stem = name;
   if (name.size() > kLongestPlainName) {
     shortened = true;
-    std::size_t cut = kLongestBeginning;
+    std::size_t cut = kLongestMarkerBeginning;
     // Not within a character: such a byte continues one.
     while (cut > 0 && (static_cast<unsigned char>(name[cut]) & 0xc0) == 0x80) --cut;
     ContentHasher hasher;
@@ -184,7 +183,22 @@ bool isCloudTemporaryName(const std::string& name) {
 
 std::string nameOfDocument(const EvictionMarker& marker, const std::string& markerName) {
   if (marker.name && MarkerNames(*marker.name).marker == markerName) return *marker.name;
+  return documentNameOfMarker(markerName);
+}
+
+std::string documentNameOfMarker(const std::string& markerName) {
   return markerName.substr(1, markerName.size() - 1 - kSuffix.size());
+}
+
+std::optional<EvictionMarker> readMarkerText(int file) {
+  std::string text(kLargestMarker + 1, '\0');
+  ssize_t size = 0;
+  do {
+    size = pread(file, text.data(), text.size(), 0);
+  } while (size < 0 && errno == EINTR);
+  if (size < 0 || static_cast<std::size_t>(size) > kLargestMarker) return std::nullopt;
+  text.resize(static_cast<std::size_t>(size));
+  return EvictionMarker::parse(text);
 }
 
 Outcome<OpenMarker> openMarker(const DirectoryHandle& folder, const std::string& markerName,
@@ -193,14 +207,7 @@ Outcome<OpenMarker> openMarker(const DirectoryHandle& folder, const std::string&
   if (const int code = folder.openFile(markerName, file)) {
     return fileError(code, "can't open the marker of", path);
   }
-  std::string text(kLargestMarker + 1, '\0');
-  ssize_t size = 0;
-  do {
-    size = pread(file.get(), text.data(), text.size(), 0);
-  } while (size < 0 && errno == EINTR);
-  if (size < 0) return fileError(errno, "can't read the marker of", path);
-  text.resize(static_cast<std::size_t>(size));
-  auto marker = text.size() <= kLargestMarker ? EvictionMarker::parse(text) : std::nullopt;
+  auto marker = readMarkerText(file.get());
   if (!marker) {
     return fileErrorWithWords(
         NSFileReadCorruptFileError, 0,

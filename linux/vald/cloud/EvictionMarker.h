@@ -72,6 +72,13 @@ bool isCloudTemporaryName(const std::string& name);
 // marker renames the document.
 std::string nameOfDocument(const EvictionMarker& marker, const std::string& markerName);
 
+// The document's name by its marker's name alone: what renaming a marker changes.
+std::string documentNameOfMarker(const std::string& markerName);
+// A document's name longer than this may be shortened in its marker's.
+inline constexpr std::size_t kLongestMarkerBeginning = 200;
+// What an open file says, if it is a marker. Its position stays.
+std::optional<EvictionMarker> readMarkerText(int file);
+
 // A marker and the open file it was read from. NSCocoaErrorDomain 4 when there is no such
 // file, 259 when it is no marker. `path` is for errors.
 struct OpenMarker {

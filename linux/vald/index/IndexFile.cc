@@ -14,7 +14,7 @@ namespace skein::vald {
 namespace {
 
 constexpr int kApplicationID = 0x534b4e49;  // "SKNI"
-constexpr int kVersion = 1;
+constexpr int kVersion = 2;
 constexpr const char* kParts[] = {"", "-wal", "-shm"};
 
 constexpr char kTables[] = R"(
@@ -35,7 +35,8 @@ CREATE TABLE item (
   born INTEGER NOT NULL,     -- modification less birth
   seen INTEGER NOT NULL,
   folder INTEGER NOT NULL,
-  container BLOB
+  container BLOB,
+  flags INTEGER NOT NULL DEFAULT 0
 );
 CREATE INDEX item_by_name ON item(parent, name);
 CREATE TABLE folder (
@@ -76,18 +77,48 @@ CREATE TABLE setting (name BLOB PRIMARY KEY, value BLOB NOT NULL) WITHOUT ROWID;
 COMMIT;
 )";
 
+constexpr char kDetailTables[] = R"(
+BEGIN IMMEDIATE;
+CREATE TABLE detail (
+  id INTEGER NOT NULL,
+  is_document INTEGER NOT NULL,
+  tags BLOB NOT NULL,
+  on_file INTEGER NOT NULL,
+  created INTEGER,
+  used INTEGER,
+  favorite INTEGER,
+  PRIMARY KEY (id, is_document)
+) WITHOUT ROWID;
+CREATE TABLE tag (
+  name BLOB NOT NULL,
+  id INTEGER NOT NULL,
+  is_document INTEGER NOT NULL,
+  PRIMARY KEY (name, id, is_document)
+) WITHOUT ROWID;
+COMMIT;
+)";
+
+// An index of version 1 knew nothing but what the disk tells.
+constexpr char kFromVersion1[] =
+    "ALTER TABLE item ADD COLUMN flags INTEGER NOT NULL DEFAULT 0; PRAGMA user_version = 2";
+
 enum class Verdict { Usable, Empty, Foreign };
 
 Verdict judge(SqliteDatabase& database) {
   if (database.integer("SELECT count(*) FROM sqlite_schema") == 0 && !database.failed()) {
     return Verdict::Empty;
   }
-  const bool ours = database.integer("PRAGMA application_id") == kApplicationID &&
-                    database.integer("PRAGMA user_version") == kVersion;
+  bool ours = database.integer("PRAGMA application_id") == kApplicationID;
+  const std::int64_t version = database.integer("PRAGMA user_version");
+  if (ours && version == 1) {
+    ours = database.execute(kDetailTables) && database.execute(kFromVersion1);
+  } else {
+    ours = ours && version == kVersion;
+  }
   // Touches every table's first page.
   for (const char* sql : {"SELECT count(*) FROM root", "SELECT max(rank) FROM item",
                           "SELECT max(rank) FROM tombstone", "SELECT max(key) FROM folder",
-                          "SELECT count(*) FROM setting"}) {
+                          "SELECT count(*) FROM setting", "SELECT max(id) FROM detail"}) {
     if (ours) database.integer(sql);
   }
   return ours && !database.failed() ? Verdict::Usable : Verdict::Foreign;
@@ -151,6 +182,7 @@ std::unique_ptr<SqliteDatabase> openIndexFile(const std::string& path, Log& log,
     const Verdict verdict = judge(*database);
     if (verdict == Verdict::Empty) {
       database->execute(kTables);
+      database->execute(kDetailTables);
       const std::string marks = "PRAGMA application_id = " + std::to_string(kApplicationID) +
                                 "; PRAGMA user_version = " + std::to_string(kVersion);
       database->execute(marks.c_str());

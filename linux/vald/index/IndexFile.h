@@ -17,6 +17,8 @@ namespace skein::vald {
 //   folder     one row per folder, the roots included: where it is, whether it was read
 //   root       the drive (container NULL) and the app containers' folders
 //   tombstone  what is gone, for the journal and for items that come back
+//   detail     what few items have: tags, dates and ranks that the disk does not keep
+//   tag        which items have a tag
 //   setting    small values by name
 //
 // Four secondary indexes of `item` are built after the first scan, when that is cheapest.

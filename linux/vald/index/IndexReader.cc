@@ -1,16 +1,20 @@
 #include "linux/vald/index/IndexReader.h"
 
+#include "linux/vald/scan/StoreNames.h"
+
 namespace skein::vald {
 namespace {
 
 constexpr std::size_t kMostIdle = 4;
 
 // The item, its holder's number, and what its own folder row says.
-#define SKEIN_FOUND                                         \
-  "SELECT " SKEIN_ITEM_COLUMNS                              \
-  ", holder.id, self.scanned, self.children FROM item "     \
-  "LEFT JOIN folder AS holder ON holder.key = item.parent " \
-  "LEFT JOIN folder AS self ON self.key = item.folder "
+#define SKEIN_FOUND                                                                              \
+  "SELECT " SKEIN_ITEM_COLUMNS ", holder.id, self.scanned, self.children, " SKEIN_DETAIL_COLUMNS \
+  " FROM item "                                                                                  \
+  "LEFT JOIN folder AS holder ON holder.key = item.parent "                                      \
+  "LEFT JOIN folder AS self ON self.key = item.folder "                                          \
+  "LEFT JOIN detail ON item.flags & 8 AND detail.id = item.id AND detail.is_document = "         \
+  "(item.kind=0) "
 #define SKEIN_FOLDER \
   "SELECT key, id, parent, name, scanned, children, changes, inode, generation, born FROM folder "
 
@@ -68,18 +72,21 @@ IndexReader::IndexReader(std::unique_ptr<SqliteDatabase> database)
 
 FoundItem IndexReader::found(SqliteStatement& statement) {
   FoundItem found{itemFromRow(statement),
-                  {VLFileObjectID::folderOrAliasWithRawID(statement.number(kItemColumns)), false},
-                  std::nullopt};
+                  {VLFileObjectID::folderOrAliasWithRawID(statement.number(kItemColumns))},
+                  std::nullopt,
+                  {}};
   found.holder.isDrive = found.row.parent == kDriveFolder;
   if (statement.integer(kItemColumns + 1) != 0) {
     found.children = statement.number(kItemColumns + 2);
   }
+  if (found.row.hasDetails) found.details = detailsFromRow(statement, kItemColumns + 3);
   return found;
 }
 
 std::vector<FoundItem> IndexReader::all(SqliteStatement& statement) {
   std::vector<FoundItem> items;
   while (statement.step()) items.push_back(found(statement));
+  for (FoundItem& item : items) item.holder.isTrashed = isTrashed(item.row.parent);
   return items;
 }
 
@@ -106,6 +113,66 @@ std::vector<RootRow> IndexReader::roots() {
     roots.push_back(std::move(root));
   }
   return roots;
+}
+
+std::vector<FolderRow> IndexReader::trashes() {
+  std::vector<FolderRow> trashes;
+  for (const RootRow& root : roots()) {
+    const auto key = setting(trashSetting(root.folder));
+    auto trash = key ? folder(std::stoll(*key)) : std::nullopt;
+    if (trash) trashes.push_back(std::move(*trash));
+  }
+  return trashes;
+}
+
+bool IndexReader::isTrashed(FolderKey folder) {
+  if (folder == kNoFolder || folder == kDriveFolder) return false;
+  const auto known = _trashed.find(folder);
+  if (known != _trashed.end()) return known->second;
+  _trashed[folder] = false;  // a ring ends here
+  const auto row = this->folder(folder);
+  const bool answer = row && (isTrashFolderName(row->name) || isTrashed(row->parent));
+  _trashed[folder] = answer;
+  return answer;
+}
+
+std::vector<Tombstone> IndexReader::tombstonesAt(FolderKey folder, std::string_view name,
+                                                 std::uint64_t limit) {
+  std::vector<Tombstone> tombstones;
+  SqliteStatement statement(*_database,
+                            "SELECT rank, id, kind, died FROM tombstone WHERE parent=? AND name=? "
+                            "ORDER BY rank DESC LIMIT ?");
+  statement.start(folder, name, limit);
+  while (statement.step()) {
+    Tombstone tombstone;
+    tombstone.rank = statement.number(0);
+    tombstone.kind = static_cast<ItemKind>(statement.integer(2));
+    tombstone.id = idOfKind(tombstone.kind, statement.number(1));
+    tombstone.died = statement.integer(3);
+    tombstones.push_back(std::move(tombstone));
+  }
+  return tombstones;
+}
+
+std::vector<ItemRow> IndexReader::unsettledAfter(std::uint64_t rank, std::uint64_t limit) {
+  std::vector<ItemRow> rows;
+  SqliteStatement statement(*_database, "SELECT " SKEIN_ITEM_COLUMNS
+                                        " FROM item WHERE rank>? AND kind=0 AND flags & 5 = 0 "
+                                        "ORDER BY rank LIMIT ?");
+  statement.start(rank, limit);
+  while (statement.step()) rows.push_back(itemFromRow(statement));
+  return rows;
+}
+
+std::vector<std::pair<std::string, std::uint64_t>> IndexReader::tags() {
+  std::vector<std::pair<std::string, std::uint64_t>> tags;
+  SqliteStatement statement(*_database,
+                            "SELECT tag.name, count(*) FROM tag WHERE EXISTS (SELECT 1 FROM item "
+                            "WHERE item.id=tag.id AND (item.kind=0)=tag.is_document) "
+                            "GROUP BY tag.name ORDER BY tag.name");
+  statement.start();
+  while (statement.step()) tags.emplace_back(statement.bytes(0), statement.number(1));
+  return tags;
 }
 
 std::optional<RootRow> IndexReader::root(FolderKey folder) {

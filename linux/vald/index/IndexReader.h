@@ -3,6 +3,8 @@
 #include <memory>
 #include <optional>
 #include <string>
+#include <unordered_map>
+#include <utility>
 #include <vector>
 
 #include "base/Mutex.h"
@@ -17,8 +19,9 @@ struct FoundItem {
   ItemRow row;
   ItemHolder holder;
   std::optional<std::uint64_t> children;
+  ItemDetails details;
 
-  VLQueryItemPtr item() const { return makeItem(row, holder, children); }
+  VLQueryItemPtr item() const { return makeItem(row, holder, children, details); }
 };
 
 // The read side of the index: one connection, for one thread at a time. Failures are
@@ -28,7 +31,10 @@ class IndexReader {
   explicit IndexReader(std::unique_ptr<SqliteDatabase> database);
 
   // What is read until end() is of one moment.
-  void begin() { _database->execute("BEGIN"); }
+  void begin() {
+    _trashed.clear();
+    _database->execute("BEGIN");
+  }
   void end() { _database->rollback(); }
   bool failed() const { return _database->failed(); }
   const std::string& message() const { return _database->message(); }
@@ -37,6 +43,10 @@ class IndexReader {
   std::optional<FolderRow> folderWithID(VLFileObjectID id);
   std::optional<RootRow> root(FolderKey folder);
   std::vector<RootRow> roots();
+  // The roots' trash folders.
+  std::vector<FolderRow> trashes();
+  // Whether the folder is a trash, or lies in one.
+  bool isTrashed(FolderKey folder);
 
   std::optional<FoundItem> itemWithID(VLFileObjectID id);
   std::optional<FoundItem> itemNamed(FolderKey folder, std::string_view name);
@@ -50,6 +60,11 @@ class IndexReader {
 
   std::vector<FoundItem> itemsAfter(std::uint64_t rank, std::uint64_t limit);
   std::vector<Tombstone> tombstonesAfter(std::uint64_t rank, std::uint64_t limit);
+  // What was removed under a name, newest first.
+  std::vector<Tombstone> tombstonesAt(FolderKey folder, std::string_view name, std::uint64_t limit);
+  // Documents after `rank`, in that order, whose upload is to be looked at.
+  std::vector<ItemRow> unsettledAfter(std::uint64_t rank, std::uint64_t limit);
+  std::vector<std::pair<std::string, std::uint64_t>> tags();
   std::uint64_t number(const char* sql);
   std::optional<std::string> setting(const std::string& name);
 
@@ -58,6 +73,8 @@ class IndexReader {
   std::vector<FoundItem> all(SqliteStatement& statement);
 
   std::unique_ptr<SqliteDatabase> _database;
+  // Of this moment; forgotten at its end.
+  std::unordered_map<FolderKey, bool> _trashed;
   SqliteStatement _folder, _folderWithID, _itemWithID, _itemNamed, _itemsAfter, _tombstonesAfter;
   SqliteStatement _byName, _byAge, _byNameAfter, _byAgeAfter;
   SqliteStatement _allByName, _allByAge, _allByNameAfter, _allByAgeAfter;
@@ -78,6 +95,7 @@ class IndexReaders {
     // Whether the index could be opened.
     explicit operator bool() const { return _reader != nullptr; }
     IndexReader* operator->() { return _reader.get(); }
+    IndexReader* get() { return _reader.get(); }
 
    private:
     IndexReaders& _readers;

@@ -3,11 +3,15 @@
 #include <algorithm>
 #include <sstream>
 
+#include "linux/vald/files/TagAttributes.h"
+
 namespace skein::vald {
 namespace {
 
 constexpr char kCounts[] = "counts";
 constexpr char kOldestRank[] = "oldest rank";
+
+int isDocument(VLFileObjectID id) { return id.isFolderOrAliasID() ? 0 : 1; }
 
 Tombstone tombstoneFromRow(SqliteStatement& statement) {
   Tombstone tombstone;
@@ -29,10 +33,12 @@ IndexWriter::IndexWriter(SqliteDatabase& database)
     : _database(database),
       _insert(database,
               "INSERT INTO item(rank, parent, name, id, kind, inode, generation, size, age, "
-              "changed, born, seen, folder, container) VALUES(?,?,?,?,?,?,?,?,?,?,?,?,?,?)"),
+              "changed, born, seen, folder, container, flags) "
+              "VALUES(?,?,?,?,?,?,?,?,?,?,?,?,?,?,?)"),
       _update(database,
               "UPDATE item SET rank=?, parent=?, name=?, id=?, kind=?, inode=?, generation=?, "
-              "size=?, age=?, changed=?, born=?, seen=?, folder=?, container=? WHERE rank=?"),
+              "size=?, age=?, changed=?, born=?, seen=?, folder=?, container=?, flags=? "
+              "WHERE rank=?"),
       _erase(database, "DELETE FROM item WHERE rank=?"),
       _children(database,
                 "SELECT " SKEIN_ITEM_COLUMNS " FROM item WHERE parent=? ORDER BY name, rank"),
@@ -53,7 +59,13 @@ IndexWriter::IndexWriter(SqliteDatabase& database)
       _putFolder(database,
                  "INSERT OR REPLACE INTO folder(key, id, parent, name, scanned, children, changes, "
                  "inode, generation, born) VALUES(?,?,?,?,?,?,?,?,?,?)"),
-      _eraseFolder(database, "DELETE FROM folder WHERE key=?") {
+      _eraseFolder(database, "DELETE FROM folder WHERE key=?"),
+      _setFlags(database, "UPDATE item SET flags=? WHERE rank=?"),
+      _details(database,
+               "SELECT " SKEIN_DETAIL_COLUMNS " FROM detail WHERE id=? AND is_document=?"),
+      _putDetails(database,
+                  "INSERT OR REPLACE INTO detail(id, is_document, tags, on_file, created, used, "
+                  "favorite) VALUES(?,?,?,?,?,?,?)") {
   load();
 }
 
@@ -85,7 +97,7 @@ void IndexWriter::insert(ItemRow& row) {
       .start(row.rank, row.parent, row.name, row.id.rawID(), static_cast<int>(state.kind),
              state.key.inode, state.key.generation, state.size, difference(0, state.modified),
              difference(state.modified, state.changed), difference(state.modified, state.key.born),
-             row.seen, row.folder, row.containerID)
+             row.seen, row.folder, row.containerID, flagsOf(row))
       .run();
   ++_counts.of(state.kind);
 }
@@ -98,8 +110,39 @@ void IndexWriter::update(ItemRow& row) {
       .start(row.rank, row.parent, row.name, row.id.rawID(), static_cast<int>(state.kind),
              state.key.inode, state.key.generation, state.size, difference(0, state.modified),
              difference(state.modified, state.changed), difference(state.modified, state.key.born),
-             row.seen, row.folder, row.containerID, previous)
+             row.seen, row.folder, row.containerID, flagsOf(row), previous)
       .run();
+}
+
+void IndexWriter::putFlags(const ItemRow& row) { _setFlags.start(flagsOf(row), row.rank).run(); }
+
+ItemDetails IndexWriter::details(VLFileObjectID id) {
+  ItemDetails details;
+  _details.start(id.rawID(), isDocument(id));
+  if (_details.step()) details = detailsFromRow(_details, 0);
+  _details.reset();
+  return details;
+}
+
+void IndexWriter::putDetails(VLFileObjectID id, const ItemDetails& details) {
+  const std::uint64_t rawID = id.rawID();
+  SqliteStatement forget(_database, "DELETE FROM tag WHERE name=? AND id=? AND is_document=?");
+  for (const std::string& name : splitTags(this->details(id).tags)) {
+    forget.start(name, rawID, isDocument(id)).run();
+  }
+  if (details.isEmpty()) {
+    SqliteStatement erase(_database, "DELETE FROM detail WHERE id=? AND is_document=?");
+    erase.start(rawID, isDocument(id)).run();
+    return;
+  }
+  _putDetails
+      .start(rawID, isDocument(id), details.tags, details.tagsAreOnFile ? 1 : 0, details.created,
+             details.used, details.favorite)
+      .run();
+  SqliteStatement tag(_database, "INSERT INTO tag(name, id, is_document) VALUES(?,?,?)");
+  for (const std::string& name : splitTags(details.tags)) {
+    tag.start(name, rawID, isDocument(id)).run();
+  }
 }
 
 void IndexWriter::erase(const ItemRow& row) {
@@ -150,6 +193,13 @@ std::vector<ItemRow> IndexWriter::rowsWithInode(std::uint64_t inode) {
   return rows(_withInode.start(inode));
 }
 
+std::vector<ItemRow> IndexWriter::rowsAfter(std::uint64_t rank, std::uint64_t until,
+                                            std::size_t limit) {
+  SqliteStatement statement(_database, "SELECT " SKEIN_ITEM_COLUMNS
+                                       " FROM item WHERE rank>? AND rank<=? ORDER BY rank LIMIT ?");
+  return rows(statement.start(rank, until, limit));
+}
+
 std::optional<ItemRow> IndexWriter::rowWithID(VLFileObjectID id) {
   auto found = rows(_withID.start(id.rawID(), id.isFolderOrAliasID() ? 0 : 1));
   if (found.empty()) return std::nullopt;
@@ -182,6 +232,15 @@ void IndexWriter::pruneTombstones(std::uint64_t retention) {
   if (!last.step()) return;
   _oldestRank = last.number(0);
   last.reset();
+  // What came back under its identifier has a row.
+  for (const char* table : {"detail", "tag"}) {
+    const std::string sql = std::string("DELETE FROM ") + table +
+                            " WHERE (id, is_document) IN (SELECT id, kind=0 FROM tombstone WHERE "
+                            "rank<=?) AND NOT EXISTS (SELECT 1 FROM item WHERE item.id=" +
+                            table + ".id AND (item.kind=0)=" + table + ".is_document)";
+    SqliteStatement forget(_database, sql.c_str());
+    forget.start(_oldestRank).run();
+  }
   SqliteStatement prune(_database, "DELETE FROM tombstone WHERE rank<=?");
   if (prune.start(_oldestRank).run()) _tombstones = retention;
 }

@@ -55,6 +55,14 @@ class IndexWriter {
   void insert(ItemRow& row);
   // Rewrites the row that has row.rank, under a new rank. Its kind stays.
   void update(ItemRow& row);
+  // Writes the row's flags alone, without a new rank: nobody is told.
+  void putFlags(const ItemRow& row);
+
+  // Empty when the item has none.
+  ItemDetails details(VLFileObjectID id);
+  // The caller sees to the row's hasDetails.
+  void putDetails(VLFileObjectID id, const ItemDetails& details);
+
   // Takes the row away without a trace: for items that go on under another row.
   void erase(const ItemRow& row);
   // Takes the row away and leaves a tombstone.
@@ -64,6 +72,8 @@ class IndexWriter {
   std::vector<FolderKey> subfoldersOf(FolderKey folder);
   std::vector<ItemRow> rowsNamed(FolderKey folder, std::string_view name);
   std::vector<ItemRow> rowsWithInode(std::uint64_t inode);
+  // With ranks above `rank` up to `until`, in that order.
+  std::vector<ItemRow> rowsAfter(std::uint64_t rank, std::uint64_t until, std::size_t limit);
   std::optional<ItemRow> rowWithID(VLFileObjectID id);
 
   std::vector<Tombstone> tombstonesWithInode(std::uint64_t inode);
@@ -98,7 +108,7 @@ class IndexWriter {
 
   SqliteStatement _insert, _update, _erase, _children, _subfolders, _named, _withInode, _withID;
   SqliteStatement _bury, _tombstonesWithInode, _tombstoneAt, _dropTombstone;
-  SqliteStatement _putFolder, _eraseFolder;
+  SqliteStatement _putFolder, _eraseFolder, _setFlags, _details, _putDetails;
 };
 
 }  // namespace skein::vald

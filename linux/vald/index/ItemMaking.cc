@@ -1,6 +1,8 @@
 #include "linux/vald/index/ItemMaking.h"
 
+#include "linux/vald/files/TagAttributes.h"
 #include "linux/vald/index/ContentTypes.h"
+#include "platform/fileprovider/FPTags.h"
 
 namespace skein::vald {
 namespace {
@@ -25,10 +27,20 @@ void setState(VLQueryItem::Properties& properties, const FileState& state) {
   if (state.key.born != 0) properties.creationDate = date(state.key.born);
 }
 
+void setDetails(VLQueryItem::Properties& properties, const ItemDetails& details) {
+  if (details.created) properties.creationDate = date(*details.created);
+  if (details.used) properties.lastUsedDate = date(*details.used);
+  properties.favoriteRank = details.favorite;
+  if (details.tags.empty()) return;
+  std::vector<FPTag> tags;
+  for (std::string& name : splitTags(details.tags)) tags.push_back({std::move(name)});
+  properties.tagData = FPGetTagsDataFromTags(tags);
+}
+
 }  // namespace
 
 VLQueryItemPtr makeItem(const ItemRow& row, const ItemHolder& holder,
-                        std::optional<std::uint64_t> children) {
+                        std::optional<std::uint64_t> children, const ItemDetails& details) {
   VLQueryItem::Properties properties;
   properties.fileObjectID = row.id;
   properties.itemIdentifier = row.id.asString();
@@ -39,6 +51,25 @@ VLQueryItemPtr makeItem(const ItemRow& row, const ItemHolder& holder,
   properties.containerID = row.containerID;
   properties.childItemCount = children;
   setState(properties, row.state);
+  properties.isTrashed = holder.isTrashed;
+  properties.isUploaded = row.isUploaded || row.state.isEvicted;
+  properties.isDownloaded = !row.state.isEvicted;
+  setDetails(properties, details);
+  return std::make_shared<const VLQueryItem>(std::move(properties));
+}
+
+VLQueryItemPtr makeTrashItem(VLFileObjectID id, const ItemHolder& holder,
+                             std::optional<std::uint64_t> children) {
+  VLQueryItem::Properties properties;
+  properties.fileObjectID = id;
+  properties.itemIdentifier = id.asString();
+  properties.parentItemIdentifier = identifierOf(holder);
+  properties.filename = "Trash";
+  properties.typeIdentifier = ContentTypes::shared().typeForName("Trash", ItemKind::Folder);
+  properties.kind = ItemKind::Folder;
+  properties.capabilities = NSFileProviderItemCapabilitiesAllowsReading;
+  properties.childItemCount = children;
+  properties.isTrashed = true;
   return std::make_shared<const VLQueryItem>(std::move(properties));
 }
 

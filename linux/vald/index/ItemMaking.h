@@ -12,11 +12,15 @@ namespace skein::vald {
 struct ItemHolder {
   VLFileObjectID id;
   bool isDrive = false;
+  bool isTrashed = false;  // it is the trash, or lies in it
 };
 
 // The framework's item made of a row. `children`: of a folder that has been read.
 VLQueryItemPtr makeItem(const ItemRow& row, const ItemHolder& holder,
-                        std::optional<std::uint64_t> children);
+                        std::optional<std::uint64_t> children, const ItemDetails& details);
+// A root's trash, as what lies in it names its parent.
+VLQueryItemPtr makeTrashItem(VLFileObjectID id, const ItemHolder& holder,
+                             std::optional<std::uint64_t> children);
 // The drive's own folder.
 VLQueryItemPtr makeDriveItem(VLFileObjectID id, const std::string& name, const FileState& state,
                              std::optional<std::uint64_t> children);

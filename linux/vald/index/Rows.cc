@@ -18,7 +18,30 @@ ItemRow itemFromRow(SqliteStatement& statement) {
   row.seen = statement.integer(11);
   row.folder = statement.integer(12);
   if (!statement.isNull(13)) row.containerID = statement.bytes(13);
+  const std::int64_t flags = statement.integer(14);
+  row.state.isEvicted = (flags & kIsEvicted) != 0;
+  row.isUploaded = (flags & kIsUploaded) != 0;
+  row.isSettled = (flags & kIsSettled) != 0;
+  row.hasDetails = (flags & kHasDetails) != 0;
   return row;
+}
+
+std::int64_t flagsOf(const ItemRow& row) {
+  return (row.state.isEvicted ? kIsEvicted : 0) | (row.isUploaded ? kIsUploaded : 0) |
+         (row.isSettled ? kIsSettled : 0) | (row.hasDetails ? kHasDetails : 0);
+}
+
+ItemDetails detailsFromRow(SqliteStatement& statement, int column) {
+  const auto optional = [&](int at) {
+    return statement.isNull(at) ? std::nullopt : std::optional(statement.integer(at));
+  };
+  ItemDetails details;
+  details.tags = statement.bytes(column);
+  details.tagsAreOnFile = statement.integer(column + 1) != 0;
+  details.created = optional(column + 2);
+  details.used = optional(column + 3);
+  details.favorite = optional(column + 4);
+  return details;
 }
 
 }  // namespace skein::vald

@@ -12,6 +12,10 @@
 #include <cerrno>
 #include <cstring>
 #include <limits>
+#include <utility>
+
+#include "linux/vald/cloud/EvictionMarker.h"
+#include "linux/vald/scan/StoreNames.h"
 
 namespace skein::vald {
 namespace {
@@ -99,16 +103,45 @@ int openBelow(int root, const std::string& relativePath) {
   return current.release();
 }
 
+// Where a name is among a snapshot's.
+struct Place {
+  std::size_t offset;
+  std::size_t length;
+};
+
+// Sorts the entries; a marker whose document is present is none.
+void fillEntries(FolderSnapshot& snapshot, const std::vector<std::pair<Place, FileState>>& found,
+                 const std::vector<std::pair<std::string, FileState>>& markers) {
+  std::vector<Place> names;
+  for (const auto& [document, state] : markers) {
+    names.push_back({snapshot.names.size(), document.size()});
+    snapshot.names.insert(snapshot.names.end(), document.begin(), document.end());
+  }
+  const auto nameAt = [&](const Place& place) {
+    return std::string_view(snapshot.names.data() + place.offset, place.length);
+  };
+  const auto before = [](const DiskEntry& a, const DiskEntry& b) { return a.name < b.name; };
+  snapshot.entries.reserve(found.size() + markers.size());
+  for (const auto& [place, state] : found) snapshot.entries.push_back({nameAt(place), state});
+  std::sort(snapshot.entries.begin(), snapshot.entries.end(), before);
+  if (markers.empty()) return;
+  std::vector<DiskEntry> evicted;
+  for (std::size_t i = 0; i < markers.size(); ++i) {
+    const DiskEntry entry{nameAt(names[i]), markers[i].second};
+    if (!std::binary_search(snapshot.entries.begin(), snapshot.entries.end(), entry, before)) {
+      evicted.push_back(entry);
+    }
+  }
+  snapshot.entries.insert(snapshot.entries.end(), evicted.begin(), evicted.end());
+  std::sort(snapshot.entries.begin(), snapshot.entries.end(), before);
+}
+
 Look lookOfError(int error) {
   // A name that became a symbolic link, or something else, is no folder any more.
   return error == ENOENT || error == ENOTDIR || error == ELOOP ? Look::Gone : Look::Unreadable;
 }
 
 }  // namespace
-
-bool isHiddenFromStore(std::string_view name) {
-  return name == "." || name == ".." || name.starts_with(".Trash-");
-}
 
 bool readSelf(int folder, FileState& state) {
   struct statx status {};
@@ -170,13 +203,24 @@ Look openFolder(const RootFolder& root, const std::string& relativePath, const F
 
 Look readEntry(int folder, const std::string& name, FileState& state, int& error) {
   if (isHiddenFromStore(name)) return Look::Gone;
+  std::string found = name;
   struct statx status {};
-  if (statx(folder, name.c_str(), AT_SYMLINK_NOFOLLOW | AT_NO_AUTOMOUNT, kMask, &status) != 0) {
+  const auto look = [&] {
+    return statx(folder, found.c_str(), AT_SYMLINK_NOFOLLOW | AT_NO_AUTOMOUNT, kMask, &status);
+  };
+  if (look() != 0) {
     error = errno;
-    return error == ENOENT ? Look::Gone : Look::Unreadable;
+    if (error == ENAMETOOLONG) return Look::Gone;
+    if (error != ENOENT) return Look::Unreadable;
+    found = MarkerNames(name).marker;
+    if (look() != 0) return Look::Gone;
   }
-  if (fill(status, state) == Kept::No) return Look::Gone;
-  state.key.generation = generationOf(folder, name.c_str(), 0, state.key.inode);
+  FileState seen;
+  if (fill(status, seen) == Kept::No) return Look::Gone;
+  const std::string document = readMarker(folder, found, seen);
+  if (found == name ? !document.empty() : document != name) return Look::Gone;
+  seen.key.generation = generationOf(folder, found.c_str(), 0, seen.key.inode);
+  state = seen;
   return Look::Seen;
 }
 
@@ -192,10 +236,6 @@ FolderSnapshot readFolder(int folder, Detail detail) {
   if (!readSelf(folder, snapshot.self)) return fail(errno);
 
   alignas(dirent64) char buffer[32 * 1024];
-  struct Place {
-    std::size_t offset;
-    std::size_t length;
-  };
   std::vector<Place> places;
   for (;;) {
     const ssize_t count = getdents64(folder, buffer, sizeof buffer);
@@ -216,7 +256,9 @@ FolderSnapshot readFolder(int folder, Detail detail) {
     }
   }
 
-  snapshot.entries.reserve(places.size());
+  std::vector<std::pair<Place, FileState>> found;
+  std::vector<std::pair<std::string, FileState>> markers;
+  found.reserve(places.size());
   for (const Place& place : places) {
     const char* name = snapshot.names.data() + place.offset;
     struct statx status {};
@@ -224,16 +266,20 @@ FolderSnapshot readFolder(int folder, Detail detail) {
       if (errno == ENOENT) continue;  // gone since; its deletion is told by itself
       return fail(errno);
     }
-    DiskEntry entry{{name, place.length}, {}};
-    if (fill(status, entry.state) == Kept::No) continue;
-    if (detail == Detail::Full || entry.state.kind != ItemKind::Document ||
-        entry.state.key.born == 0) {
-      entry.state.key.generation = generationOf(folder, name, 0, entry.state.key.inode);
+    FileState state;
+    if (fill(status, state) == Kept::No) continue;
+    if (detail == Detail::Full || state.kind != ItemKind::Document || state.key.born == 0) {
+      state.key.generation = generationOf(folder, name, 0, state.key.inode);
     }
-    snapshot.entries.push_back(entry);
+    std::string document;
+    if (name[0] == '.') document = readMarker(folder, name, state);
+    if (document.empty()) {
+      found.emplace_back(place, state);
+    } else {
+      markers.emplace_back(std::move(document), state);
+    }
   }
-  std::sort(snapshot.entries.begin(), snapshot.entries.end(),
-            [](const DiskEntry& a, const DiskEntry& b) { return a.name < b.name; });
+  fillEntries(snapshot, found, markers);
   snapshot.look = Look::Seen;
   return snapshot;
 }

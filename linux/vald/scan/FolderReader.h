@@ -35,7 +35,8 @@ struct DiskEntry {
 };
 
 // One folder as it was read: its own state, and its entries sorted by the bytes of their
-// names. Sockets, pipes, devices and the trash folders (".Trash-*") are left out.
+// names. A marker is an entry of its document's name, unless a file has that name: then the
+// file is the document. Sockets, pipes, devices and hidden names are left out.
 struct FolderSnapshot {
   Look look = Look::Unreadable;
   int error = 0;  // why it is unreadable
@@ -52,7 +53,8 @@ enum class Detail : std::uint8_t {
 
 // Reads folders by handles. Below the root no symbolic link is followed and no mount point
 // is crossed: a file system that is mounted inside the store is listed as a folder that
-// cannot be read. Nothing is written and no file is opened. Stateless; any thread.
+// cannot be read. Nothing is written, and no file is opened but markers. Stateless; any
+// thread.
 
 // Opens the root anew, so that vald never keeps a volume from being unmounted.
 std::optional<RootFolder> findRoot(const std::string& path, int& error);
@@ -64,13 +66,11 @@ Look openFolder(const RootFolder& root, const std::string& relativePath, const F
 // Reads an open folder.
 FolderSnapshot readFolder(int folder, Detail detail);
 
-// One name in an open folder: Seen, Gone (also for what is never listed), or Unreadable.
+// The document of one name in an open folder, present or not: Seen, Gone (also for what is never
+// listed), or Unreadable.
 Look readEntry(int folder, const std::string& name, FileState& state, int& error);
 
 // The folder itself.
 bool readSelf(int folder, FileState& state);
-
-// Whether a name is never listed.
-bool isHiddenFromStore(std::string_view name);
 
 }  // namespace skein::vald

@@ -2,17 +2,21 @@
 
 #include <algorithm>
 
+#include "linux/vald/scan/StoreNames.h"
+
 namespace skein::vald {
 
 void FolderTable::load(std::vector<FolderRow> rows, FolderKey next) {
   _folders.clear();
   _folderByID.clear();
   _touched.clear();
+  _trashes.clear();
   _next = next;
   for (FolderRow& row : rows) {
     _next = std::max(_next, row.number + 1);
     _folderByID[row.id.rawID()] = row.number;
     const FolderKey number = row.number;
+    if (isTrashFolderName(row.name)) _trashes[row.parent] = number;
     _folders[number].row = std::move(row);
   }
 }
@@ -31,6 +35,7 @@ FolderKey FolderTable::add(FolderRow row) {
   row.number = _next++;
   const FolderKey folder = row.number;
   _folderByID[row.id.rawID()] = folder;
+  if (isTrashFolderName(row.name)) _trashes[row.parent] = folder;
   _folders[folder].row = std::move(row);
   touch(folder);
   return folder;
@@ -40,6 +45,7 @@ void FolderTable::remove(FolderKey folder) {
   const auto found = _folders.find(folder);
   if (found == _folders.end()) return;
   _folderByID.erase(found->second.row.id.rawID());
+  if (isTrashFolderName(found->second.row.name)) _trashes.erase(found->second.row.parent);
   _folders.erase(found);
 }
 
@@ -88,7 +94,22 @@ std::string FolderTable::pathOf(FolderKey folder) {
 ItemHolder FolderTable::holder(FolderKey folder) {
   const Folder* found = find(folder);
   return {found != nullptr ? found->row.id : VLFileObjectID::folderOrAliasWithRawID(0),
-          folder == kDriveFolder};
+          folder == kDriveFolder, isTrashed(folder)};
+}
+
+bool FolderTable::isTrashed(FolderKey folder) {
+  std::size_t steps = 0;
+  while (const Folder* found = find(folder)) {
+    if (isTrashFolderName(found->row.name)) return true;
+    if (_roots.contains(folder) || ++steps > _folders.size()) return false;
+    folder = found->row.parent;
+  }
+  return false;
+}
+
+FolderKey FolderTable::trashOf(FolderKey root) const {
+  const auto found = _trashes.find(root);
+  return found != _trashes.end() ? found->second : kNoFolder;
 }
 
 }  // namespace skein::vald

@@ -53,6 +53,10 @@ class FolderTable {
   std::string pathOf(FolderKey folder);
 
   ItemHolder holder(FolderKey folder);
+  // Whether the folder is a trash, or lies in one.
+  bool isTrashed(FolderKey folder);
+  // The trash of a root; kNoFolder while it has none.
+  FolderKey trashOf(FolderKey root) const;
   std::size_t size() const { return _folders.size(); }
   template <class F>
   void forEach(F&& visit) {
@@ -63,6 +67,7 @@ class FolderTable {
   std::unordered_map<FolderKey, Folder> _folders;
   std::unordered_map<std::uint64_t, FolderKey> _folderByID;
   std::unordered_map<FolderKey, TreeRoot> _roots;
+  std::unordered_map<FolderKey, FolderKey> _trashes;  // by root
   std::vector<FolderKey> _touched;
   FolderKey _next = kDriveFolder;
 };

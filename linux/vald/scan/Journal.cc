@@ -13,7 +13,7 @@ void Journal::count(FolderKey folder, int by) {
   _folders.touch(folder);
 }
 
-void Journal::note(const ItemRow& row, bool isDead, FolderKey previousParent) {
+void Journal::note(const ItemRow& row, bool isDead, FolderKey previousParent, bool isOfFile) {
   const auto [entry, isNew] = _changes.try_emplace(row.id);
   Change& change = entry->second;
   if (isNew) {
@@ -21,8 +21,9 @@ void Journal::note(const ItemRow& row, bool isDead, FolderKey previousParent) {
     change.previousHolder = _folders.holder(previousParent).id;
   }
   change.row = row;
+  change.isOfFile = change.isOfFile || isOfFile;
   change.isDead = isDead;
-  change.holder = _folders.holder(row.parent).id;
+  change.holder = _folders.holder(row.parent);
 }
 
 void Journal::insert(ItemRow& row) {
@@ -37,6 +38,12 @@ void Journal::update(ItemRow& row, FolderKey previousParent) {
   count(previousParent, previousParent != row.parent ? -1 : 0);
   if (previousParent != row.parent) count(row.parent, 1);
   note(row, false, previousParent);
+}
+
+void Journal::updateDetails(ItemRow& row) {
+  _index.update(row);
+  count(row.parent, 0);
+  note(row, false, row.parent, false);
 }
 
 void Journal::bury(const ItemRow& row, std::int64_t now) {
@@ -62,10 +69,11 @@ std::vector<StoreChange> Journal::takeChanges() {
   std::vector<StoreChange> changes;
   changes.reserve(_changes.size());
   for (auto& [id, change] : _changes) {
-    const ItemHolder holder{change.holder, change.row.parent == kDriveFolder};
+    const ItemHolder& holder = change.holder;
     StoreChange told;
     told.rank = change.row.rank;
-    told.folder = change.holder;
+    told.folder = holder.id;
+    told.isOfFile = change.isOfFile;
     told.previousFolder = change.previousHolder;
     if (change.isDead) {
       told.item = makeDeadItem(id, change.row.state.kind, holder);
@@ -74,7 +82,9 @@ std::vector<StoreChange> Journal::takeChanges() {
       if (const Folder* folder = _folders.find(change.row.folder)) {
         if (folder->row.scanned) children = folder->row.children;
       }
-      told.item = makeItem(change.row, holder, children);
+      const ItemDetails details =
+          change.row.hasDetails ? _index.details(change.row.id) : ItemDetails();
+      told.item = makeItem(change.row, holder, children, details);
     }
     changes.push_back(std::move(told));
   }

@@ -18,6 +18,8 @@ class Journal {
   void insert(ItemRow& row);
   // `previousParent`: the folder that holds the row as it stands in the index.
   void update(ItemRow& row, FolderKey previousParent);
+  // The file stands as it was; what the index alone knows of the item changed.
+  void updateDetails(ItemRow& row);
   void bury(const ItemRow& row, std::int64_t now);
 
   // Writes the folders' rows and what else the transaction leaves. Before the commit.
@@ -31,11 +33,12 @@ class Journal {
   struct Change {
     ItemRow row;
     bool isDead = false;
+    bool isOfFile = false;
     FolderKey previousParent = kNoFolder;
-    VLFileObjectID holder = VLFileObjectID::folderOrAliasWithRawID(0);
+    ItemHolder holder{VLFileObjectID::folderOrAliasWithRawID(0)};
     VLFileObjectID previousHolder = VLFileObjectID::folderOrAliasWithRawID(0);
   };
-  void note(const ItemRow& row, bool isDead, FolderKey previousParent);
+  void note(const ItemRow& row, bool isDead, FolderKey previousParent, bool isOfFile = true);
   void count(FolderKey folder, int by);
 
   IndexWriter& _index;

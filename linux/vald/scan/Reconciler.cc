@@ -17,11 +17,12 @@ std::string departureKey(FolderKey folder, const std::string& name) {
 }  // namespace
 
 Reconciler::Reconciler(IndexWriter& index, Journal& journal, FolderTable& folders, Disk& disk,
-                       std::chrono::milliseconds graceWindow, Clock clock)
+                       Details& details, std::chrono::milliseconds graceWindow, Clock clock)
     : _index(index),
       _journal(journal),
       _folders(folders),
       _disk(disk),
+      _details(details),
       _grace(graceWindow.count()),
       _clock(std::move(clock)) {}
 
@@ -73,11 +74,10 @@ void Reconciler::addName(FolderKey folder, const std::string& name,
   _selves.insert(folder);
 }
 
-void Reconciler::compare(const ItemRow& row, FileState state) {
+void Reconciler::compare(const ItemRow& row, const FileState& state) {
   if (row.state.kind != state.kind || !row.state.key.names(state.key)) {
     _replaced.push_back({{row.parent, row.name}, state});
   } else if (!row.state.looksLike(state) && row.folder == kNoFolder) {
-    if (state.key.generation == 0) state.key.generation = row.state.key.generation;
     retarget(row, state);
   } else if (!row.state.looksLike(state)) {
     _selves.insert(row.folder);
@@ -271,7 +271,9 @@ void Reconciler::refreshSelves() {
       if (row.folder != key) continue;
       // A folder whose children came or went is told even if its dates stand.
       if (row.state.looksLike(state) && !folder->isCountUntold) continue;
+      const bool isChanged = row.state.changed != state.changed;
       row.state = state;
+      if (isChanged) _details.refresh(row, true);
       _journal.update(row, row.parent);
     }
   }
@@ -383,6 +385,8 @@ bool Reconciler::handBack(const Place& place, const FileState& state,
   row.name = place.name;
   row.id = tombstone->id;
   row.state = state;
+  _details.recall(row);
+  _details.refresh(row, tombstone->key.names(state.key));
   _journal.insert(row);
   return true;
 }
@@ -408,6 +412,8 @@ bool Reconciler::returned(const Place& place, const FileState& state) {
       row.folder = _folders.add(std::move(folder));
       _newFolders.push_back(row.folder);
     }
+    _details.recall(row);
+    _details.refresh(row, true);
     _journal.insert(row);
     return true;
   }
@@ -428,8 +434,9 @@ void Reconciler::insertNew(const Place& place, const FileState& state) {
   ItemRow row;
   row.parent = place.folder;
   row.name = place.name;
-  row.id = newID(state);
   row.state = state;
+  const auto hinted = _details.hinted(row);
+  row.id = hinted ? *hinted : newID(state);
   // A file that a round finds was there before, unless its dates say otherwise.
   const std::int64_t changed = state.changed / 1'000'000;
   row.seen = _now - changed < kYouth ? _now : 0;
@@ -442,27 +449,47 @@ void Reconciler::insertNew(const Place& place, const FileState& state) {
     row.folder = _folders.add(std::move(folder));
     _newFolders.push_back(row.folder);
   }
+  if (hinted) _details.recall(row);
+  _details.refresh(row, false);
   _journal.insert(row);
+}
+
+void Reconciler::take(ItemRow& row, const FileState& state) {
+  const FileState before = std::exchange(row.state, state);
+  const bool isSameFile = before.key.names(state.key);
+  if (isSameFile && row.state.key.generation == 0) {
+    row.state.key.generation = before.key.generation;
+  }
+  if (state.kind != ItemKind::Document) {
+    if (!before.looksLike(state)) _details.refresh(row, isSameFile);
+    return;
+  }
+  // Evicting and downloading change neither size nor date.
+  const bool isEqual = before.size == state.size && before.modified == state.modified;
+  if (!isEqual || (!isSameFile && before.isEvicted == state.isEvicted)) row.isUploaded = false;
+  row.isUploaded = row.isUploaded || state.isEvicted;
+  row.isSettled = false;
+  _details.refresh(row, isSameFile);
 }
 
 void Reconciler::move(ItemRow row, const Place& place, const FileState& state) {
   const FolderKey from = row.parent;
   row.parent = place.folder;
   row.name = place.name;
-  row.state = state;
   if (Folder* folder = _folders.find(row.folder)) {
     folder->row.parent = place.folder;
     folder->row.name = place.name;
     _folders.touch(row.folder);
     _disk.forget();
   }
+  take(row, state);
   _journal.update(row, from);
   _selves.insert(from);
   _selves.insert(place.folder);
 }
 
 void Reconciler::retarget(ItemRow row, const FileState& state) {
-  row.state = state;
+  take(row, state);
   _journal.update(row, row.parent);
 }
 

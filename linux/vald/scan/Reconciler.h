@@ -19,6 +19,9 @@
 //  6. Two hard links are two documents. When the first goes while the second is young, the
 //     number goes with it: that was a rename.
 //  7. A file that comes back (its tombstone is still kept) takes its number up again.
+//  8. A marker is its document, not present: evicting and downloading are rule 2. A marker,
+//     or a file with a hint, that nothing is known of is the document that it names, unless
+//     that lives: then it is a copy, and new.
 //
 // Folders and aliases are their inodes: rules 1 and 7 hold for them, and nothing else.
 #pragma once
@@ -30,6 +33,7 @@
 #include <unordered_set>
 #include <vector>
 
+#include "linux/vald/scan/Details.h"
 #include "linux/vald/scan/Disk.h"
 #include "linux/vald/scan/Journal.h"
 
@@ -43,7 +47,7 @@ class Reconciler {
   using Clock = std::function<std::int64_t()>;  // milliseconds since 1970
 
   Reconciler(IndexWriter& index, Journal& journal, FolderTable& folders, Disk& disk,
-             std::chrono::milliseconds graceWindow, Clock clock);
+             Details& details, std::chrono::milliseconds graceWindow, Clock clock);
 
   // Gathers how a folder, read as a whole, differs from the index.
   void addFolder(FolderKey folder, const FolderSnapshot& snapshot);
@@ -82,7 +86,7 @@ class Reconciler {
   enum class Whereabouts : std::uint8_t { StillThere, Gone, Displaced, Unknown };
 
   void decideOnce(bool inRound);
-  void compare(const ItemRow& row, FileState state);
+  void compare(const ItemRow& row, const FileState& state);
   void appeared(const Difference& difference);
   void replaced(const Difference& difference);
   void vanished(const ItemRow& seen);
@@ -93,6 +97,8 @@ class Reconciler {
   void insertNew(const Place& place, const FileState& state);
   void move(ItemRow row, const Place& place, const FileState& state);
   void retarget(ItemRow row, const FileState& state);
+  // The row takes the file's state, which may be another file's.
+  void take(ItemRow& row, const FileState& state);
   void recordDeparture(const ItemRow& row, const Place& to);
 
   std::optional<ItemRow> rowAt(const Place& place);
@@ -106,6 +112,7 @@ class Reconciler {
   Journal& _journal;
   FolderTable& _folders;
   Disk& _disk;
+  Details& _details;
   const std::int64_t _grace;
   const Clock _clock;
 

@@ -1,0 +1,108 @@
+// The store as the operations on files see it.
+#include "linux/vald/DrivePath.h"
+#include "linux/vald/FolderStore.h"
+#include "linux/vald/scan/StoreNames.h"
+#include "vellum/VLErrors.h"
+
+namespace skein::vald {
+
+std::optional<StoreWriter::Place> FolderStore::placeOf(IndexReader& reader,
+                                                       const std::string& path) {
+  std::string rest;
+  std::optional<FolderRow> folder = rootAbove(reader, path, rest);
+  for (std::size_t start = 0; folder && folder->scanned && !rest.empty();) {
+    const std::size_t end = rest.find('/', start);
+    const std::string name = rest.substr(start, end - start);
+    if (end == std::string::npos) return StoreWriter::Place{folder->number, name};
+    const auto found = reader.itemNamed(folder->number, name);
+    if (!found || found->row.containerID) break;
+    folder = reader.folder(found->row.folder);
+    start = end + 1;
+  }
+  return std::nullopt;
+}
+
+void FolderStore::lookAtPaths(const std::vector<std::string>& paths) {
+  std::vector<StoreWriter::Place> places;
+  {
+    auto reader = _readers.lease();
+    if (!reader) return;
+    for (const std::string& path : paths) {
+      if (auto place = placeOf(*reader.get(), path)) places.push_back(std::move(*place));
+    }
+  }
+  _writer->perform([this, places = std::move(places)] { _writer->lookAtNames(places); });
+}
+
+NSErrorPtr FolderStore::changeDetails(VLFileObjectID id, std::function<void(ItemDetails&)> change) {
+  auto isChanged = std::make_shared<bool>(false);
+  const bool isDone = _writer->perform([this, id, change = std::move(change), isChanged] {
+    *isChanged = _writer->changeDetails(id, change);
+  });
+  if (!isDone) return vl_errorWithPOSIXCode(ETIMEDOUT, "The index could not be written in time.");
+  if (*isChanged) return nullptr;
+  const std::string failure = _writer->failure();
+  if (failure.empty()) return noSuchFile("There is no item " + id.asString() + ".");
+  return vl_errorWithPOSIXCode(EIO, "Nothing was changed, since " + failure + ".");
+}
+
+ItemDetails FolderStore::details(VLFileObjectID id) {
+  auto reader = _readers.lease();
+  const auto found = reader ? reader->itemWithID(id) : std::nullopt;
+  return found ? found->details : ItemDetails();
+}
+
+std::vector<std::pair<std::string, std::uint64_t>> FolderStore::tagsInUse() {
+  auto reader = _readers.lease();
+  return reader ? reader->tags() : std::vector<std::pair<std::string, std::uint64_t>>();
+}
+
+std::vector<FolderStore::Trashed> FolderStore::trashedItems(NSErrorOut error) {
+  std::vector<Trashed> trashed;
+  auto reader = _readers.lease();
+  if (storeFailure(reader, error)) return trashed;
+  for (const FolderRow& trash : reader->trashes()) {
+    const auto path = pathOfFolder(*reader.get(), trash.number);
+    if (!path) continue;
+    for (const FoundItem& found :
+         reader->page(trash.number, SortOrder::Name, std::nullopt, 0, trash.children + 1)) {
+      trashed.push_back({found.item(), *path + '/' + found.row.name, found.row.state.changed});
+    }
+  }
+  if (storeFailure(reader, error)) trashed.clear();
+  return trashed;
+}
+
+std::vector<FolderStore::Removal> FolderStore::removalsAt(const std::string& path,
+                                                          std::uint64_t limit) {
+  std::vector<Removal> removals;
+  auto reader = _readers.lease();
+  if (!reader) return removals;
+  const auto place = placeOf(*reader.get(), path);
+  if (!place) return removals;
+  for (const Tombstone& tombstone : reader->tombstonesAt(place->folder, place->name, limit)) {
+    removals.push_back({tombstone.id, NSDate(std::chrono::milliseconds(tombstone.died))});
+  }
+  return removals;
+}
+
+std::vector<FolderStore::Unsettled> FolderStore::unsettledAfter(std::uint64_t& rank,
+                                                                std::uint64_t limit) {
+  std::vector<Unsettled> documents;
+  auto reader = _readers.lease();
+  if (!reader) return documents;
+  for (const ItemRow& row : reader->unsettledAfter(rank, limit)) {
+    rank = row.rank;
+    // What is thrown away is not sent anywhere; put back, it is looked at again.
+    if (reader->isTrashed(row.parent)) continue;
+    const auto folder = pathOfFolder(*reader.get(), row.parent);
+    if (folder) documents.push_back({row.id, *folder + '/' + row.name, row.state.size});
+  }
+  return documents;
+}
+
+void FolderStore::noteUploads(std::vector<UploadedFile> files) {
+  _writer->perform([this, files = std::move(files)] { _writer->noteUploads(files); });
+}
+
+}  // namespace skein::vald
