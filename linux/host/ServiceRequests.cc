@@ -107,18 +107,18 @@ NSErrorPtr notOffered(const std::string& serviceName, const NSFileProviderServic
 void ServiceRequests::findSources(HostTarget target,
                                   Reply<std::string, Sources, NSErrorPtr> reply) {
   auto timed = TimedReply<std::string, Sources>::begin(_host->tools(), std::move(reply));
-  _items->item(std::move(target),
-               [self = shared_from_this(), timed](const HostItem& found, const NSErrorPtr& error) {
-                 if (error) {
-                   (*timed)("", {}, error);
-                   return;
-                 }
-                 const std::string identifier = found.item->itemIdentifier();
-                 NSErrorPtr problem;
-                 auto sources = self->_host->extension().supportedServiceSourcesForItemIdentifier(
-                     identifier, &problem);
-                 (*timed)(identifier, std::move(sources), problem);
-               });
+  _findItem(std::move(target),
+            [self = shared_from_this(), timed](const HostItem& found, const NSErrorPtr& error) {
+              if (error) {
+                (*timed)("", {}, error);
+                return;
+              }
+              const std::string identifier = found.item->itemIdentifier();
+              NSErrorPtr problem;
+              auto sources = self->_host->extension().supportedServiceSourcesForItemIdentifier(
+                  identifier, &problem);
+              (*timed)(identifier, std::move(sources), problem);
+            });
 }
 
 void ServiceRequests::serviceSources(HostTarget target,

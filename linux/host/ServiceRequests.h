@@ -1,9 +1,9 @@
 #pragma once
 
+#include <functional>
 #include <memory>
 
 #include "linux/host/FileProviderHost.h"
-#include "linux/protocol/HostService.h"
 #include "linux/protocol/ServiceEndpoints.h"
 
 namespace skein {
@@ -18,9 +18,11 @@ namespace skein {
 class ServiceRequests final : public HostServices,
                               public std::enable_shared_from_this<ServiceRequests> {
  public:
-  // `items` finds the items.
-  ServiceRequests(std::shared_ptr<FileProviderHost> host, std::shared_ptr<HostService> items)
-      : _host(std::move(host)), _items(std::move(items)) {}
+  // HostService's item().
+  using FindItem = std::function<void(HostTarget, Reply<HostItem, NSErrorPtr>)>;
+
+  ServiceRequests(std::shared_ptr<FileProviderHost> host, FindItem findItem)
+      : _host(std::move(host)), _findItem(std::move(findItem)) {}
 
   void serviceSources(HostTarget target,
                       Reply<std::vector<std::string>, NSErrorPtr> reply) override;
@@ -33,7 +35,7 @@ class ServiceRequests final : public HostServices,
   void findSources(HostTarget target, Reply<std::string, Sources, NSErrorPtr> reply);
 
   const std::shared_ptr<FileProviderHost> _host;
-  const std::shared_ptr<HostService> _items;
+  const FindItem _findItem;
 };
 
 }  // namespace skein

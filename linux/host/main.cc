@@ -220,7 +220,10 @@ int serve(const Arguments& arguments, const DrivePaths& paths, const FileDescrip
   host->setExtension(std::move(extension));
 
   const auto requests = std::make_shared<HostRequests>(host, daemon, framework.containers(), *log);
-  const auto services = std::make_shared<ServiceRequests>(host, requests);
+  const auto services = std::make_shared<ServiceRequests>(
+      host, [requests](HostTarget target, Reply<HostItem, NSErrorPtr> reply) {
+        requests->item(std::move(target), std::move(reply));
+      });
   auto server =
       HostServer::listen(loop, executor, requests, services, paths.hostSocket, *log, &error);
   if (!server) return fail(kExitFailure, error->localizedDescription());

@@ -264,6 +264,19 @@ class HostProxy final : public HostService {
 
 }  // namespace
 
+SocketClient::Options hostClientOptions(const DrivePaths& paths) {
+  SocketClient::Options options;
+  options.peer = "skein-host";
+  options.socketPath = paths.hostSocket;
+  ProgramToStart program;
+  program.program = "skein-host";
+  program.arguments = {"--store", paths.store};
+  program.socketPath = paths.hostSocket;
+  program.logPath = paths.hostLog;
+  options.program = std::move(program);
+  return options;
+}
+
 std::shared_ptr<HostService> makeHostClient(std::shared_ptr<RpcLoop> loop,
                                             std::shared_ptr<Executor> executor,
                                             SocketClient::Options options) {

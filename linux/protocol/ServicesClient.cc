@@ -140,7 +140,8 @@ class ConnectionProxy {
 };
 
 constexpr auto decodeShare = [](auto&& results) {
-  return std::tuple(results.hasShare() ? codec::decode(results.getShare()) : CKSharePtr());
+  return std::tuple(results.hasShare() ? codec::decodeFromClient(results.getShare())
+                                       : CKSharePtr());
 };
 
 template <class Results>
@@ -223,7 +224,7 @@ class SharingConnectionProxy final : public VLSharingServiceV1,
         completion,
         [share = std::move(share)](Client& client) {
           auto request = client.saveShareRequest();
-          if (share) codec::encode(request.initShare(), *share);
+          if (share) codec::encodeForClient(request.initShare(), *share);
           return request;
         },
         decodeShare);

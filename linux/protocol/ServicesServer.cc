@@ -51,12 +51,10 @@ void requireRoom(const ServicePeerPtr& peer) {
              "too many endpoints and connections are held");
 }
 
-constexpr auto encodeError = [](auto results, const NSErrorPtr& error) {
-  codec::setError(results, error);
-};
+using codec::encodeError;
 
 constexpr auto encodeShare = [](auto results, const CKSharePtr& share, const NSErrorPtr& error) {
-  if (share) codec::encode(results.initShare(), *share);
+  if (share) codec::encodeForClient(results.initShare(), *share);
   codec::setError(results, error);
 };
 
@@ -239,7 +237,8 @@ class SharingObject final : public ConnectionObject<wire::Sharing::Server, VLSha
 
   kj::Promise<void> saveShare(SaveShareContext context) override {
     CKSharePtr share;
-    if (context.getParams().hasShare()) share = codec::decode(context.getParams().getShare());
+    if (context.getParams().hasShare())
+      share = codec::decodeFromClient(context.getParams().getShare());
     return request<CKSharePtr>(
         context,
         [share = std::move(share)](auto& service, auto reply) {

@@ -26,9 +26,8 @@ void encode(wire::Share::Builder builder, const CKShare& share) {
     values[at].setKey(bytes(key));
     values[at++].setText(bytes(value));
   }
-  auto people = builder.initParticipants(static_cast<unsigned>(share.participants.size()));
-  at = 0;
-  for (const CKShareParticipant& one : share.participants) encodeParticipant(people[at++], one);
+  encode(builder.initParticipants(static_cast<unsigned>(share.participants.size())),
+         share.participants);
   builder.setPublicPermission(share.publicPermission);
   builder.setIsKnownToServer(share.isKnownToServer);
   if (share.url) builder.setAddress(bytes(share.url->absoluteString()));
@@ -40,13 +39,24 @@ CKShare decode(wire::Share::Reader reader) {
   for (const auto value : reader.getValues()) {
     share.values.insert_or_assign(text(value.getKey()), text(value.getText()));
   }
-  for (const auto one : reader.getParticipants()) {
-    share.participants.push_back(decodeParticipant(one));
-  }
+  share.participants = decode(reader.getParticipants());
   share.publicPermission = reader.getPublicPermission();
   share.isKnownToServer = reader.getIsKnownToServer();
   if (reader.hasAddress()) share.url = NSURL::URLWithString(text(reader.getAddress()));
   return share;
+}
+
+void encode(capnp::List<wire::Share::Participant>::Builder builder,
+            const std::vector<CKShareParticipant>& participants) {
+  unsigned at = 0;
+  for (const CKShareParticipant& one : participants) encodeParticipant(builder[at++], one);
+}
+
+std::vector<CKShareParticipant> decode(capnp::List<wire::Share::Participant>::Reader reader) {
+  std::vector<CKShareParticipant> participants;
+  participants.reserve(reader.size());
+  for (const auto one : reader) participants.push_back(decodeParticipant(one));
+  return participants;
 }
 
 void encode(wire::Zone::Builder builder, const CKRecordZoneID& zone) {

@@ -2,6 +2,7 @@
 #pragma once
 
 #include <optional>
+#include <vector>
 
 #include "linux/protocol/Codec.h"
 #include "linux/protocol/LocalShares.h"
@@ -11,6 +12,9 @@ namespace skein::codec {
 
 void encode(wire::Share::Builder builder, const CKShare& share);
 CKShare decode(wire::Share::Reader reader);
+void encode(capnp::List<wire::Share::Participant>::Builder builder,
+            const std::vector<CKShareParticipant>& participants);
+std::vector<CKShareParticipant> decode(capnp::List<wire::Share::Participant>::Reader reader);
 
 void encode(wire::Zone::Builder builder, const CKRecordZoneID& zone);
 CKRecordZoneID decode(wire::Zone::Reader reader);

@@ -6,27 +6,8 @@
 using Cxx = import "/capnp/c++.capnp";
 $Cxx.namespace("skein::wire");
 
+using Shares = import "shares.capnp";
 using Types = import "types.capnp";
-
-# A share, without what it is a share of: that is the connection's own item.
-struct Share {
-  values @0 :List(Value);
-  participants @1 :List(Participant);
-  publicPermission @2 :Int64;
-  isKnownToServer @3 :Bool;
-  url @4 :Data;
-
-  struct Value {
-    key @0 :Data;
-    value @1 :Data;
-  }
-}
-struct Participant {
-  name @0 :Data;
-  role @1 :UInt8;
-  acceptanceStatus @2 :UInt8;
-  permission @3 :Int64;
-}
 
 interface Services {
   serviceSources @0 (isIdentifier :Bool, target :Data)
@@ -57,17 +38,19 @@ interface Progress {
   cancel @0 ();
 }
 
+# A share crosses without its root record's name: it is that of the connection's own item,
+# and what a client writes there is not read.
 interface Sharing extends(ServiceConnection) {
   fetchSharingInfo @0 () -> (shared :Bool, item :Types.Item, error :Types.Error);
   preflightCheckIfCurrentlyShareable @1 (observer :ProgressObserver)
       -> (shareable :Bool, item :Types.Item, items :List(Types.Item),
           otherItems :List(Types.Item), error :Types.Error);
   fetchParticipantListAndPublicPermission @2 (observer :ProgressObserver)
-      -> (participants :List(Participant), publicPermission :Int64, error :Types.Error);
+      -> (participants :List(Shares.Share.Participant), publicPermission :Int64, error :Types.Error);
   startPreparingForShare @3 (forcing :Bool);
-  fetchShare @4 (observer :ProgressObserver) -> (share :Share, error :Types.Error);
+  fetchShare @4 (observer :ProgressObserver) -> (share :Shares.Share, error :Types.Error);
   fetchShareURL @5 (observer :ProgressObserver) -> (url :Data, error :Types.Error);
-  saveShare @6 (share :Share, observer :ProgressObserver) -> (share :Share, error :Types.Error);
+  saveShare @6 (share :Shares.Share, observer :ProgressObserver) -> (share :Shares.Share, error :Types.Error);
   unshare @7 (observer :ProgressObserver) -> (error :Types.Error);
 }
 
