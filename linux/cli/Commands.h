@@ -24,6 +24,8 @@ void addAccountCommand(CLI::App& app, Invocation& invocation);   // account
 void addStatusCommands(CLI::App& app, Invocation& invocation);   // status, doctor
 void addProcessCommands(CLI::App& app, Invocation& invocation);  // stop
 void addLogCommand(CLI::App& app, Invocation& invocation);       // log
+void addShareCommand(CLI::App& app, Invocation& invocation);     // share
+void addCollabCommand(CLI::App& app, Invocation& invocation);    // collab
 
 // Opens the drive's session and runs `command(host)`; complains when there is no drive.
 template <class Command>

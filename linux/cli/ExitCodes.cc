@@ -3,6 +3,7 @@
 #include <cstdint>
 #include <string_view>
 
+#include "platform/cloudkit/CKError.h"
 #include "platform/fileprovider/NSFileProviderError.h"
 #include "vellum/VLErrors.h"
 
@@ -38,6 +39,22 @@ constexpr Meaning kMeanings[] = {
      "see what is there with: skein ls /"},
     {NSCocoaErrorDomain, NSFileWriteFileExistsError, kCollision,
      "an item of this name is there already", "choose another name"},
+    // The number that the sharing service refuses a folder's share with.
+    {NSPOSIXErrorDomain, 45, kFailure, "a folder's share cannot be changed through this item",
+     "share a document in it, or remove the share from the folder itself"},
+    {NSCocoaErrorDomain, NSUserCancelledError, kInterrupted, "it was cancelled", "try again"},
+    {NSCocoaErrorDomain, NSXPCConnectionInvalid, kUnreachable,
+     "the connection to the item's service has ended", kTryAgain},
+    {CKErrorDomain, CKErrorServerRecordChanged, kCollision, "the share was changed meanwhile",
+     "see it with: skein share show ITEM"},
+    {CKErrorDomain, CKErrorUnknownItem, kFailure, "the share is no longer there",
+     "see it with: skein share show ITEM"},
+    {CKErrorDomain, CKErrorPermissionFailure, kFailure, "this may not be shared",
+     "see what is known with: skein share info ITEM"},
+    {CKErrorDomain, CKErrorPartialFailure, kFailure, "it was not done for everybody",
+     "see the share with: skein share show ITEM"},
+    {VLVellumErrorDomain, VLVellumErrorUnknownShare, kFailure, "this is not shared",
+     "share it with: skein share create ITEM"},
     {NSCocoaErrorDomain, NSFeatureUnsupportedError, kFailure, "this is not supported",
      "see what is with: skein --help"},
     {NSCocoaErrorDomain, NSUbiquitousFileNotUploadedDueToQuotaError, kQuota,

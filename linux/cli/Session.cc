@@ -37,15 +37,7 @@ std::unique_ptr<Session> Session::open(const DriveChoice& drive, NSErrorOut erro
 Session::Session(const DrivePaths& paths)
     : _loop(RpcLoop::start("skein-io")),
       _executor(std::make_shared<ThreadPool>(2, "skein")),
-      _host(makeHostClient(_loop, _executor,
-                           SocketClient::Options{"skein-host", paths.hostSocket,
-                                                 ProgramToStart{"skein-host",
-                                                                {"--store", paths.store},
-                                                                paths.hostSocket,
-                                                                paths.hostLog,
-                                                                {},
-                                                                std::chrono::milliseconds(4000)},
-                                                 std::chrono::milliseconds(4000)})) {}
+      _host(makeHostClient(_loop, _executor, hostClientOptions(paths))) {}
 
 bool isWorthAnotherTry(const NSErrorPtr& error, std::chrono::steady_clock::time_point begin) {
   using namespace std::chrono_literals;

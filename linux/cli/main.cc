@@ -42,6 +42,8 @@ int main(int argc, char** argv) {
   addChangeCommands(app, invocation);
   addAccountCommand(app, invocation);
   addStatusCommands(app, invocation);
+  addShareCommand(app, invocation);
+  addCollabCommand(app, invocation);
   addLogCommand(app, invocation);
   addProcessCommands(app, invocation);
   try {
