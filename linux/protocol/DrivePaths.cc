@@ -140,6 +140,7 @@ NSErrorPtr fill(DrivePaths& paths, const std::string& store) {
   paths.runtimeDirectory = runtimeTop + '/' + paths.driveID;
   paths.stateDirectory = stateBase + "/skein/" + paths.driveID;
   paths.containersDirectory = dataBase + "/skein/" + paths.driveID + "/containers";
+  paths.cloudDirectory = dataBase + "/skein/" + paths.driveID + "/cloud";
   paths.daemonSocket = paths.runtimeDirectory + "/vald.socket";
   paths.hostSocket = paths.runtimeDirectory + "/skein-host.socket";
   paths.database = paths.stateDirectory + "/index.sqlite";
@@ -151,8 +152,9 @@ NSErrorPtr fill(DrivePaths& paths, const std::string& store) {
                                      " bytes; set XDG_RUNTIME_DIR to a folder with a shorter path");
   }
 
-  for (const std::string& folder : {runtimeTop, paths.runtimeDirectory, stateBase + "/skein",
-                                    paths.stateDirectory, paths.containersDirectory}) {
+  for (const std::string& folder :
+       {runtimeTop, paths.runtimeDirectory, stateBase + "/skein", paths.stateDirectory,
+        paths.containersDirectory, paths.cloudDirectory}) {
     if (NSErrorPtr error = makePrivateFolder(folder)) return error;
   }
   paths.store = std::move(resolved);

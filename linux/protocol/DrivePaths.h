@@ -14,6 +14,7 @@ struct DrivePaths {
   std::string runtimeDirectory;     // $XDG_RUNTIME_DIR/skein/<driveID>, mode 0700
   std::string stateDirectory;       // $XDG_STATE_HOME/skein/<driveID>, mode 0700
   std::string containersDirectory;  // $XDG_DATA_HOME/skein/<driveID>/containers
+  std::string cloudDirectory;       // $XDG_DATA_HOME/skein/<driveID>/cloud
   std::string daemonSocket;
   std::string hostSocket;
   std::string database;

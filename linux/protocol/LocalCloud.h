@@ -34,6 +34,7 @@ struct LocalCloudStatus {
   std::uint64_t usedBytes = 0;    // in the cloud
   std::uint64_t waiting = 0;      // documents whose upload is to come, or runs
   std::uint64_t failed = 0;       // documents whose upload failed; tried again when they change
+  std::uint64_t leftOut = 0;      // documents that are not uploaded because of the limit
   std::string lastFailure;        // why the latest of them failed; empty when none did
 };
 

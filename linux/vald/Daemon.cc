@@ -285,6 +285,7 @@ void Daemon::refreshContainers() {
     if (!self->_parts.containers.refresh()) return;
     std::vector<StoreRoot> roots = self->_parts.containers.storeRoots();
     VL_INFO(self->_parts.log, "[INFO] the containers changed, %lu apps have one", roots.size());
+    if (self->_parts.containersWillChange) self->_parts.containersWillChange(roots);
     self->_parts.store.setContainers(std::move(roots));
     self->_parts.subscribers.containerListDidChange();
   });

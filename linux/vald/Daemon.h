@@ -32,6 +32,8 @@ struct DaemonParts {
   Log& log;
   std::string drive;           // the drive's folder, absolute
   std::function<void()> stop;  // asks the process to end; returns at once
+  // Before the store hears that the containers are these.
+  std::function<void(const std::vector<StoreRoot>&)> containersWillChange = nullptr;
 };
 
 // vald's core: every call is posted to the executor and answered from there, exactly

@@ -75,6 +75,8 @@ class FolderStore final : public Store {
   };
   // `rank` moves to where to go on from; it stays when there are no more.
   std::vector<Unsettled> unsettledAfter(std::uint64_t& rank, std::uint64_t limit);
+  // Whether the document is uploaded as it stands on disk.
+  bool isSettled(VLFileObjectID id);
   void noteUploads(std::vector<UploadedFile> files);
   bool isReadingAttributes() const { return _writer->isReadingAttributes(); }
 

@@ -101,6 +101,12 @@ std::vector<FolderStore::Unsettled> FolderStore::unsettledAfter(std::uint64_t& r
   return documents;
 }
 
+bool FolderStore::isSettled(VLFileObjectID id) {
+  auto reader = _readers.lease();
+  const auto found = reader ? reader->itemWithID(id) : std::nullopt;
+  return found && found->row.isSettled;
+}
+
 void FolderStore::noteUploads(std::vector<UploadedFile> files) {
   _writer->perform([this, files = std::move(files)] { _writer->noteUploads(files); });
 }

@@ -394,9 +394,9 @@ Look StoreWriter::lookAtName(FolderKey folder, const std::string& name) {
 
 Look StoreWriter::lookAtNames(const std::vector<Place>& places) {
   if (_isBulk) endBulkLoad();
-  checkTrashes(false);
   _disk.forget();
   begin();
+  checkTrashes(true);
   Look look = Look::Gone;
   for (const auto& [folder, name] : places) {
     FileState state;

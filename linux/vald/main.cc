@@ -26,13 +26,13 @@
 #include "linux/vald/CommandLine.h"
 #include "linux/vald/Containers.h"
 #include "linux/vald/Daemon.h"
+#include "linux/vald/Drive.h"
 #include "linux/vald/DriveListener.h"
 #include "linux/vald/EventSubscribers.h"
 #include "linux/vald/FaultInjector.h"
 #include "linux/vald/ItemUpdateSenders.h"
 #include "linux/vald/RunLock.h"
 #include "linux/vald/Store.h"
-#include "linux/vald/UnsupportedFiles.h"
 #include "linux/vald/shares/Shares.h"
 #include "linux/vald/shares/SharingStore.h"
 
@@ -95,13 +95,21 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
   options.databasePath = paths.database;
   options.drive.path = paths.store;
   options.containers = containers.storeRoots();
+  const bool mayFail = faultsAreAllowed();
+  Cloud::Options cloud;
+  cloud.folder = paths.cloudDirectory;
+  cloud.policy = UploadPolicy::fromEnvironment();
+  cloud.allowsConditions = mayFail;
+  FileLayer layer;
   SharedItems sharedItems;
   SharingListener sharingListener(sharedItems, listener);
   auto records = ShareRecords::open(paths.stateDirectory + "/shares.sqlite");
   if (!records) return fail(records.error());
-  std::unique_ptr<Store> folders = Store::open(std::move(options), sharingListener, log, &error);
-  if (!folders) return fail(error);
-  SharingStore store(std::move(folders), sharingListener, sharedItems);
+  const std::unique_ptr<Drive> drive =
+      Drive::open({std::move(options), paths.stateDirectory, std::move(cloud)}, sharingListener,
+                  layer, log, &error);
+  if (!drive) return fail(error);
+  SharingStore store(drive->store(), sharingListener, sharedItems);
 
   Accounts accounts(store, loginName(), log);
   const auto shares = std::make_shared<Shares>(
@@ -118,11 +126,11 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
     wasToldToStop.store(true);
     kill(getpid(), SIGTERM);
   };
-  UnsupportedFiles files(executor);
-  const auto faults = std::make_shared<FaultInjector>(faultsAreAllowed());
-  auto daemon = std::make_shared<Daemon>(DaemonParts{executor, slowExecutor, store, senders,
-                                                     accounts, containers, subscribers, files,
-                                                     *shares, *faults, log, paths.store, stop});
+  const auto faults = std::make_shared<FaultInjector>(mayFail);
+  auto daemon = std::make_shared<Daemon>(DaemonParts{
+      executor, slowExecutor, store, senders, accounts, containers, subscribers, drive->files(),
+      *shares, *faults, log, paths.store, stop,
+      [&drive](const std::vector<StoreRoot>& roots) { drive->containersWillChange(roots); }});
   listener.setAfterChange([weak = std::weak_ptr<Daemon>(daemon)] {
     if (const auto changed = weak.lock()) changed->refreshDriveFolders();
   });
@@ -133,6 +141,7 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
   if (!server) {
     executor->close();
     slowExecutor->close();
+    drive->close();
     return fail(error);
   }
   {
@@ -157,6 +166,7 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
   server.reset();
   executor->close();
   slowExecutor->close();
+  drive->close();
   return EXIT_SUCCESS;
 }
 

@@ -40,9 +40,9 @@ class SharesRig : public testing::Test {
     shared.emplace();
     sharing.emplace(*shared, listener);
     NSErrorPtr error;
-    auto folders = Store::open(options, *sharing, log, &error);
+    folders = Store::open(options, *sharing, log, &error);
     ASSERT_TRUE(folders) << error->localizedDescription();
-    store = std::make_unique<SharingStore>(std::move(folders), *sharing, *shared);
+    store = std::make_unique<SharingStore>(*folders, *sharing, *shared);
     accounts.emplace(*store, "me", log);
     auto opened = ShareRecords::open(state.path + "/shares.sqlite");
     ASSERT_TRUE(opened) << opened.error()->localizedDescription();
@@ -57,6 +57,7 @@ class SharesRig : public testing::Test {
   }
   void close() {
     store.reset();
+    folders.reset();
     shares.reset();
   }
   void reopen() {
@@ -171,6 +172,7 @@ class SharesRig : public testing::Test {
   std::optional<SharedItems> shared;
   std::optional<SharingListener> sharing;
   std::unique_ptr<ShareRecords> records;
+  std::unique_ptr<Store> folders;
   std::unique_ptr<SharingStore> store;
   std::optional<Accounts> accounts;
   std::shared_ptr<Shares> shares;

@@ -12,8 +12,8 @@
 #include <vector>
 
 #include "linux/vald/Daemon.h"
-#include "linux/vald/UnsupportedFiles.h"
 #include "linux/vald/shares/Shares.h"
+#include "tests/protocol/FakeFiles.h"
 #include "tests/support/ManualExecutor.h"
 #include "tests/vald/FakeStore.h"
 
@@ -106,7 +106,7 @@ class TestDaemon {
   FakeStore::Settings settings;
   ItemUpdateSenders senders;
   EventSubscribers subscribers{executor};
-  UnsupportedFiles files{executor};
+  FakeFiles files;
   FaultInjector faults{true};
   std::optional<FakeStore> store;
   std::optional<Accounts> accounts;

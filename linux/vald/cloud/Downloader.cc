@@ -16,9 +16,11 @@ struct Downloader::Core {
     Completion<NSErrorPtr> completion;
   };
   using WaiterPtr = std::shared_ptr<Waiter>;
+  // A marker that was copied names its original's document, at a place of its own.
+  using Key = std::pair<VLFileObjectID, std::string>;
 
   struct Download {
-    VLFileObjectID document = VLFileObjectID::documentWithRawID(0);
+    Key key{VLFileObjectID::documentWithRawID(0), {}};
     std::unique_ptr<DownloadTransfer> transfer;
     // Guarded by the core's mutex; whoever takes a waiter out answers it.
     std::vector<WaiterPtr> waiters;
@@ -57,7 +59,7 @@ struct Downloader::Core {
     std::vector<DownloadPtr> all;
     {
       MutexLock lock(mutex);
-      for (const auto& [document, download] : downloads) all.push_back(download);
+      for (const auto& [key, download] : downloads) all.push_back(download);
       downloads.clear();
     }
     for (const DownloadPtr& download : all) {
@@ -89,7 +91,7 @@ struct Downloader::Core {
   }
 
   void forget(const DownloadPtr& download) SKEIN_REQUIRES(mutex) {
-    const auto found = downloads.find(download->document);
+    const auto found = downloads.find(download->key);
     if (found != downloads.end() && found->second == download) downloads.erase(found);
   }
 
@@ -97,7 +99,7 @@ struct Downloader::Core {
   CloudConditions& conditions;
   CloudClock& clock;
   Mutex mutex;
-  std::map<VLFileObjectID, DownloadPtr> downloads SKEIN_GUARDED_BY(mutex);
+  std::map<Key, DownloadPtr> downloads SKEIN_GUARDED_BY(mutex);
 };
 
 class Downloader::WaiterTicket final : public Ticket {
@@ -126,7 +128,7 @@ std::shared_ptr<Downloader::Ticket> Downloader::download(Request request) {
   waiter->completion = std::move(request.completion);
 
   const auto fresh = std::make_shared<Core::Download>();
-  fresh->document = request.document;
+  fresh->key = {request.document, request.path};
   fresh->transfer = std::make_unique<DownloadTransfer>(
       _core->places, _core->conditions, _core->clock, request.document, std::move(request.path),
       // The transfer belongs to the download, and runs only while that lives.
@@ -136,7 +138,7 @@ std::shared_ptr<Downloader::Ticket> Downloader::download(Request request) {
   Core::DownloadPtr download = fresh;
   {
     MutexLock lock(_core->mutex);
-    download = _core->downloads.emplace(request.document, fresh).first->second;
+    download = _core->downloads.emplace(fresh->key, fresh).first->second;
     download->waiters.push_back(waiter);
   }
   if (download == fresh) {

@@ -237,6 +237,13 @@ Outcome<std::optional<UploadState>> Uploader::state(VLFileObjectID document) {
   return std::optional(UploadState{Phase::Uploaded, *stamp, nullptr});
 }
 
+std::size_t Uploader::pending() {
+  MutexLock lock(_core->mutex);
+  return static_cast<std::size_t>(
+      std::count_if(_core->entries.begin(), _core->entries.end(),
+                    [](const auto& entry) { return entry.second.state.phase != Phase::Failed; }));
+}
+
 std::vector<std::pair<VLFileObjectID, UploadState>> Uploader::failures() {
   std::vector<std::pair<VLFileObjectID, UploadState>> failed;
   MutexLock lock(_core->mutex);

@@ -63,6 +63,8 @@ class Uploader {
 
   // Nil for a document that nobody spoke of and that has no record.
   Outcome<std::optional<UploadState>> state(VLFileObjectID document);
+  // Documents whose upload is to come, or runs.
+  std::size_t pending();
   // What could not be uploaded, and why.
   std::vector<std::pair<VLFileObjectID, UploadState>> failures();
 

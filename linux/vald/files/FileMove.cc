@@ -1,4 +1,5 @@
 // Renaming and moving, and the rule that says which moves there are.
+#include <algorithm>
 #include <cerrno>
 
 #include "linux/vald/files/FileErrors.h"
@@ -123,12 +124,19 @@ FileResult FileOperations::moveTo(const StorePlace& from, const std::string& fol
     error = refusalOfMove(from, folder, numberedName(name, number, ' '), to, capability);
     if (error) return {{}, error};
     if (from.path() == to.path()) return {to.path(), nullptr};
-    bool taken = bounce && to.folder.exists(to.name);
+    bool taken = to.folder.exists(to.name) ? bounce : isTakenByAnother(from, to);
     if (!taken) error = moveOnce(from, to, kind, request, taken);
     if (!taken) break;
     error = fileError(EEXIST, "can't move it to", to.path());
   }
   return error ? FileResult{{}, error} : FileResult{to.path(), nullptr};
+}
+
+bool FileOperations::isTakenByAnother(const StorePlace& from, const StorePlace& to) const {
+  if (!isTaken(to)) return false;
+  const auto names = _options.otherNames(to.name);
+  return from.folderPath() != to.folderPath() ||
+         std::find(names.begin(), names.end(), from.name) == names.end();
 }
 
 int FileOperations::renameItem(const StorePlace& from, const StorePlace& to) {

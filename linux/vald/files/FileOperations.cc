@@ -1,8 +1,16 @@
 #include "linux/vald/files/FileOperations.h"
 
+#include <linux/fs.h>
+#include <sys/ioctl.h>
+#include <sys/xattr.h>
+
+#include <algorithm>
 #include <cerrno>
+#include <string_view>
+#include <system_error>
 #include <utility>
 
+#include "linux/vald/files/DocumentHint.h"
 #include "linux/vald/files/FileErrors.h"
 #include "linux/vald/files/FileNames.h"
 #include "linux/vald/files/TrashInfo.h"
@@ -34,10 +42,72 @@ std::chrono::steady_clock::time_point FileOperations::deadline() const {
   return std::chrono::steady_clock::now() + _options.lockDeadline;
 }
 
+NSErrorPtr FileOperations::claim(std::vector<std::string> paths,
+                                 std::chrono::steady_clock::time_point until,
+                                 FileCoordinator::Claim& claim) {
+  const std::size_t own = paths.size();
+  for (std::size_t at = 0; _options.otherNames && at < own; ++at) {
+    const std::string folder = parentOfPath(paths[at]);
+    for (const std::string& name : _options.otherNames(nameOfPath(paths[at]))) {
+      paths.push_back(joinPath(folder, name));
+    }
+  }
+  return _coordinator.claim(std::move(paths), until, claim);
+}
+
+bool FileOperations::isTaken(const StorePlace& place) const {
+  if (place.folder.exists(place.name)) return true;
+  if (!_options.otherNames) return false;
+  const auto names = _options.otherNames(place.name);
+  return std::any_of(names.begin(), names.end(),
+                     [&](const std::string& name) { return place.folder.exists(name); });
+}
+
+NSErrorPtr FileOperations::coordinate(const std::string& path, std::shared_ptr<void>& held) {
+  auto hold = std::make_shared<FileCoordinator::Claim>();
+  if (NSErrorPtr error = claim({path}, deadline(), *hold)) return error;
+  held = std::move(hold);
+  return nullptr;
+}
+
+NSErrorPtr FileOperations::waitFor(const std::string& path) {
+  Hold hold;
+  StorePlace place;
+  return take(path, {path}, place, hold);
+}
+
+void FileOperations::writeHint(const std::string& path, std::uint64_t document) {
+  FileCoordinator::Claim held;
+  StorePlace place;
+  FileDescriptor entry;
+  struct stat status {};
+  if (claim({path}, deadline(), held) || _roots.locate(path, place) || place.isRoot() ||
+      place.folder.status(place.name, status) != 0 || !S_ISREG(status.st_mode) ||
+      place.folder.openEntry(place.name, entry) != 0) {
+    return;
+  }
+  DocumentHint hint{document, status.st_ino, 0};
+  int generation = 0;
+  FileDescriptor file;
+  // Where the file system has one.
+  if (place.folder.openFile(place.name, file) == 0 &&
+      ::ioctl(file.get(), FS_IOC_GETVERSION, &generation) == 0) {
+    hint.generation = static_cast<std::uint32_t>(generation);
+  }
+  const std::string own = descriptorPath(entry.get());
+  const std::string text = hint.asText();
+  char known[128];
+  const ssize_t size = ::getxattr(own.c_str(), kHintAttribute, known, sizeof known);
+  if (size >= 0 && text == std::string_view(known, static_cast<std::size_t>(size))) return;
+  if (const int failure = _files.setAttribute(own, kHintAttribute, text)) {
+    VL_DEBUG(_log, "[DEBUG] %@ has no hint: %@", path, std::generic_category().message(failure));
+  }
+}
+
 NSErrorPtr FileOperations::take(const std::string& path, std::vector<std::string> paths,
                                 StorePlace& place, Hold& hold) {
   const auto until = deadline();
-  if (NSErrorPtr error = _coordinator.claim(std::move(paths), until, hold.claim)) return error;
+  if (NSErrorPtr error = claim(std::move(paths), until, hold.claim)) return error;
   if (NSErrorPtr error = _roots.locate(path, place)) return error;
   if (place.isRoot()) {
     return fileErrorWithWords(NSFileWriteNoPermissionError, EACCES,
@@ -63,9 +133,9 @@ NSErrorPtr FileOperations::takeNew(const std::string& folder, const std::string&
     return fileErrorWithWords(NSFileWriteNoPermissionError, EACCES,
                               "\"" + printable(folder) + "\" is in the trash", folder);
   }
-  if (NSErrorPtr error = _coordinator.claim({place.path()}, deadline(), hold.claim)) return error;
+  if (NSErrorPtr error = claim({place.path()}, deadline(), hold.claim)) return error;
   if (NSErrorPtr error = _roots.locate(folder, name, place)) return error;
-  return place.folder.exists(name) ? fileError(EEXIST, "can't make", place.path()) : nullptr;
+  return isTaken(place) ? fileError(EEXIST, "can't make", place.path()) : nullptr;
 }
 
 int FileOperations::syncFolders(const DirectoryHandle& folder, const DirectoryHandle* other) {
@@ -125,9 +195,9 @@ TagResult FileOperations::tags(const std::string& path) const {
 }
 
 TagResult FileOperations::setTags(const std::string& path, const std::vector<std::string>& names) {
-  FileCoordinator::Claim claim;
+  FileCoordinator::Claim held;
   StorePlace place;
-  NSErrorPtr error = _coordinator.claim({path}, deadline(), claim);
+  NSErrorPtr error = claim({path}, deadline(), held);
   if (!error) error = _roots.locate(path, place);
   if (error) return {TagStorage::Failed, {}, error};
   return writeTags(_files, place.folder, place.isRoot() ? "." : place.name, path, names);

@@ -2,6 +2,7 @@
 
 #include <chrono>
 #include <cstdint>
+#include <functional>
 #include <memory>
 #include <optional>
 #include <string>
@@ -14,6 +15,7 @@
 #include "linux/vald/files/Staging.h"
 #include "linux/vald/files/StoreRoots.h"
 #include "linux/vald/files/TagAttributes.h"
+#include "linux/vald/files/TrashInfo.h"
 #include "linux/vald/files/TreeCopy.h"
 #include "platform/log/Log.h"
 
@@ -25,6 +27,9 @@ struct FileOperationsOptions {
   // How long an operation waits for others, here and in other programs.
   std::chrono::milliseconds lockDeadline{2000};
   std::uint64_t provenanceRetention = 100'000;  // entries
+  // Under which other names, beside an item of this name, the same item may stand: an item
+  // there takes the name, too. None when empty.
+  std::function<std::vector<std::string>(const std::string& name)> otherNames;
 };
 
 // Whose request an operation is: what provenance tells.
@@ -66,6 +71,8 @@ class FileOperations {
   // The entries that open() ended, and how: their paths want a fresh look by the index.
   const std::vector<OperationEntry>& recovered() const { return _recovered; }
   OperationJournal& journal() { return *_journal; }
+  StoreRoots& roots() { return _roots; }
+  FileLayer& layer() { return _files; }
 
   // Copies a file or a tree from anywhere into a folder; a nil name keeps the source's.
   FileResult importDocument(const std::string& source, const std::string& folder,
@@ -91,9 +98,22 @@ class FileOperations {
 
   // Where a trashed item, or what lies in one, was before.
   FileResult putBackPath(const std::string& trashedPath) const;
+  // What the trash notes of an item that lies in it; nil when it notes nothing.
+  std::optional<TrashInfo> trashInfo(const std::string& trashedPath) const;
   // 0 with an error that says why for what move() would refuse, whatever the name.
   std::uint64_t capabilityToMove(const std::string& path, const std::string& to,
                                  NSErrorOut error) const;
+
+  // Takes a path for a change by somebody else, and waits for it: no operation runs at it,
+  // above it or below it until `held` goes, which must not outlive this.
+  NSErrorPtr coordinate(const std::string& path, std::shared_ptr<void>& held);
+  // Waits until no operation, here or in another program that locks the document, is under
+  // way at a path.
+  NSErrorPtr waitFor(const std::string& path);
+
+  // Notes on a document's file which document it is (see DocumentHint.h). Nothing depends on
+  // it while the index lives, so a file that cannot have it is none of an error's.
+  void writeHint(const std::string& path, std::uint64_t document);
 
   TagResult tags(const std::string& path) const;
   TagResult setTags(const std::string& path, const std::vector<std::string>& names);
@@ -108,6 +128,12 @@ class FileOperations {
   FileOperations(FileOperationsOptions options, FileLayer& files, Log& log);
 
   std::chrono::steady_clock::time_point deadline() const;
+  NSErrorPtr claim(std::vector<std::string> paths, std::chrono::steady_clock::time_point until,
+                   FileCoordinator::Claim& claim);
+  // Whether the place's item, under whichever name, is there.
+  bool isTaken(const StorePlace& place) const;
+  // The place's name is free, but one of its other names is not, and not by `from` itself.
+  bool isTakenByAnother(const StorePlace& from, const StorePlace& to) const;
   // Claims `paths`, finds the item and locks it: Cocoa 4 when it is gone. Refuses roots
   // and the trash's own folders.
   NSErrorPtr take(const std::string& path, std::vector<std::string> paths, StorePlace& place,
@@ -137,6 +163,9 @@ class FileOperations {
                            const std::string& name, StorePlace& to,
                            std::uint64_t& capability) const;
 
+  // 0 or an errno; nil info for a text that is none.
+  int readTrashInfo(const StorePlace& place, const TrashedPath& trashed,
+                    std::optional<TrashInfo>& info) const;
   NSErrorPtr openTrash(const OpenRoot& root, DirectoryHandle& files, DirectoryHandle& info);
   NSErrorPtr trashAs(const StorePlace& place, const std::string& trashedName,
                      const DirectoryHandle& trashed, const DirectoryHandle& info,

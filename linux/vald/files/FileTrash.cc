@@ -122,6 +122,25 @@ NSErrorPtr FileOperations::trashAs(const StorePlace& place, const std::string& n
   return fileError(failure, "can't trash", path);
 }
 
+int FileOperations::readTrashInfo(const StorePlace& place, const TrashedPath& trashed,
+                                  std::optional<TrashInfo>& info) const {
+  DirectoryHandle folder;
+  std::string text;
+  int failure = place.root->folder.openFolder(joinPath(trashed.trash, "info"), folder);
+  if (failure == 0) failure = readInfo(folder, trashed.name + kTrashInfoSuffix, text);
+  if (failure == 0) info = parseTrashInfo(text);
+  return failure;
+}
+
+std::optional<TrashInfo> FileOperations::trashInfo(const std::string& path) const {
+  StorePlace place;
+  std::optional<TrashInfo> info;
+  if (_roots.locate(path, place)) return info;
+  const auto trashed = trashedPath(place.relative);
+  if (trashed && !trashed->name.empty()) readTrashInfo(place, *trashed, info);
+  return info;
+}
+
 FileResult FileOperations::putBackPath(const std::string& path) const {
   StorePlace place;
   if (NSErrorPtr error = _roots.locate(path, place)) return {{}, error};
@@ -131,12 +150,10 @@ FileResult FileOperations::putBackPath(const std::string& path) const {
             fileErrorWithWords(NSFileNoSuchFileError, ENOENT,
                                "\"" + printable(path) + "\" is not in the trash", path)};
   }
-  DirectoryHandle info;
-  std::string text;
-  int failure = place.root->folder.openFolder(joinPath(trashed->trash, "info"), info);
-  if (failure == 0) failure = readInfo(info, trashed->name + kTrashInfoSuffix, text);
-  if (failure != 0) return {{}, fileError(failure, "the trash doesn't know the origin of", path)};
-  const auto known = parseTrashInfo(text);
+  std::optional<TrashInfo> known;
+  if (const int failure = readTrashInfo(place, *trashed, known)) {
+    return {{}, fileError(failure, "the trash doesn't know the origin of", path)};
+  }
   std::string before;
   if (known) {
     before = known->path.front() == '/' ? known->path : joinPath(place.root->path, known->path);

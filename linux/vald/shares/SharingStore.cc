@@ -45,38 +45,37 @@ void SharingListener::storeDidChange(const std::vector<StoreChange>& changes) {
 
 // ---- what the store is asked
 
-SharingStore::SharingStore(std::unique_ptr<Store> store, SharingListener& listener,
-                           SharedItems& shared)
-    : _listener(listener), _shared(shared), _store(std::move(store)) {
-  _listener.setStore(_store.get());
+SharingStore::SharingStore(Store& store, SharingListener& listener, SharedItems& shared)
+    : _listener(listener), _shared(shared), _store(store) {
+  _listener.setStore(&_store);
 }
 
 SharingStore::~SharingStore() { _listener.setStore(nullptr); }
 
 Page SharingStore::listFolder(std::optional<VLFileObjectID> folder, SortOrder order,
                               std::uint64_t offset, std::uint64_t limit, NSErrorOut error) {
-  Page page = _store->listFolder(folder, order, offset, limit, error);
+  Page page = _store.listFolder(folder, order, offset, limit, error);
   marks().mark(page.items);
   return page;
 }
 
 Page SharingStore::listAllFolders(SortOrder order, std::uint64_t offset, std::uint64_t limit,
                                   NSErrorOut error) {
-  Page page = _store->listAllFolders(order, offset, limit, error);
+  Page page = _store.listAllFolders(order, offset, limit, error);
   marks().mark(page.items);
   return page;
 }
 
 VLQueryItemPtr SharingStore::itemWithID(VLFileObjectID id, NSErrorOut error) {
-  return marks().marked(_store->itemWithID(id, error));
+  return marks().marked(_store.itemWithID(id, error));
 }
 
 VLQueryItemPtr SharingStore::itemAtPath(const std::string& path, bool scanFirst, NSErrorOut error) {
-  return marks().marked(_store->itemAtPath(path, scanFirst, error));
+  return marks().marked(_store.itemAtPath(path, scanFirst, error));
 }
 
 ChangePage SharingStore::changesSince(std::uint64_t rank, std::uint64_t limit, NSErrorOut error) {
-  ChangePage page = _store->changesSince(rank, limit, error);
+  ChangePage page = _store.changesSince(rank, limit, error);
   SharedMarks marks = this->marks();
   for (StoreChange& change : page.changes) change.item = marks.marked(change.item);
   return page;

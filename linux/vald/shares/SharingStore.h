@@ -42,8 +42,8 @@ class SharingListener final : public StoreListener {
 // A store whose items are marked as shared where they are; all else it hands on.
 class SharingStore final : public Store {
  public:
-  // `listener` is the store's; it and `shared` outlive this.
-  SharingStore(std::unique_ptr<Store> store, SharingListener& listener, SharedItems& shared);
+  // `listener` is the store's; all three outlive this.
+  SharingStore(Store& store, SharingListener& listener, SharedItems& shared);
   ~SharingStore() override;
 
   Page listFolder(std::optional<VLFileObjectID> folder, SortOrder order, std::uint64_t offset,
@@ -55,34 +55,34 @@ class SharingStore final : public Store {
   ChangePage changesSince(std::uint64_t rank, std::uint64_t limit, NSErrorOut error) override;
 
   std::optional<std::string> pathForID(VLFileObjectID id, NSErrorOut error) override {
-    return _store->pathForID(id, error);
+    return _store.pathForID(id, error);
   }
-  std::uint64_t currentRank() override { return _store->currentRank(); }
-  std::string journalID() override { return _store->journalID(); }
-  void retainFolderWatch(VLFileObjectID folder) override { _store->retainFolderWatch(folder); }
-  void releaseFolderWatch(VLFileObjectID folder) override { _store->releaseFolderWatch(folder); }
+  std::uint64_t currentRank() override { return _store.currentRank(); }
+  std::string journalID() override { return _store.journalID(); }
+  void retainFolderWatch(VLFileObjectID folder) override { _store.retainFolderWatch(folder); }
+  void releaseFolderWatch(VLFileObjectID folder) override { _store.releaseFolderWatch(folder); }
   void setContainers(std::vector<StoreRoot> containers) override {
-    _store->setContainers(std::move(containers));
+    _store.setContainers(std::move(containers));
   }
   void tellAnew(VLFileObjectID id, bool withContents) override {
-    _store->tellAnew(id, withContents);
+    _store.tellAnew(id, withContents);
   }
-  void status(LocalDaemonStatus& status) override { _store->status(status); }
-  std::vector<IndexDifference> check(std::uint64_t limit) override { return _store->check(limit); }
+  void status(LocalDaemonStatus& status) override { _store.status(status); }
+  std::vector<IndexDifference> check(std::uint64_t limit) override { return _store.check(limit); }
   std::optional<std::string> setting(const std::string& key) override {
-    return _store->setting(key);
+    return _store.setting(key);
   }
   void setSetting(const std::string& key, std::optional<std::string> value) override {
-    _store->setSetting(key, std::move(value));
+    _store.setSetting(key, std::move(value));
   }
-  bool settle(std::chrono::milliseconds deadline) override { return _store->settle(deadline); }
+  bool settle(std::chrono::milliseconds deadline) override { return _store.settle(deadline); }
 
  private:
-  SharedMarks marks() { return {*_store, _shared.now()}; }
+  SharedMarks marks() { return {_store, _shared.now()}; }
 
   SharingListener& _listener;
   SharedItems& _shared;
-  const std::unique_ptr<Store> _store;
+  Store& _store;
 };
 
 }  // namespace skein::vald

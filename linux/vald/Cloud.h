@@ -1,0 +1,77 @@
+#pragma once
+
+#include <memory>
+#include <string>
+
+#include "linux/protocol/LocalCloud.h"
+#include "linux/vald/ClosableExecutor.h"
+#include "linux/vald/UploadFeed.h"
+#include "linux/vald/cloud/CloudPlaces.h"
+#include "linux/vald/cloud/Downloader.h"
+#include "linux/vald/files/FileOperations.h"
+
+namespace skein::vald {
+
+// The drive's local cloud: what is in it, and what goes there and comes back. It is opened,
+// and what a crash left of its work is mended, before the store looks at the documents;
+// start() then begins to upload.
+class Cloud final : public LocalCloud {
+ public:
+  struct Options {
+    std::string folder;  // the cloud's own; made when missing
+    std::string drive;   // the drive's folder
+    UploadPolicy policy;
+    bool allowsConditions = false;
+    std::size_t downloads = 4;  // at a time
+    Uploader::Options uploads;
+  };
+  // Null with an error. `operations` and `log` outlive it.
+  static std::unique_ptr<Cloud> open(Options options, FileOperations& operations, Log& log,
+                                     NSErrorOut error);
+  ~Cloud() override;
+
+  CloudPlaces places();
+  CloudConditions& conditions() { return _conditions; }
+  CloudRecords& records() { return *_records; }
+  Downloader& downloader() { return *_downloader; }
+  Uploader& uploader() { return *_uploader; }
+
+  // Begins to upload what the store has. `store` outlives stop().
+  void start(FolderStore& store);
+  // Ends uploads and downloads, and waits for them. Before the store goes.
+  void stop();
+  // What the store told; from start() to stop().
+  void storeDidChange(const std::vector<StoreChange>& changes) SKEIN_EXCLUDES(_mutex);
+  void storeDidOverflow() SKEIN_EXCLUDES(_mutex);
+  std::string whyNotUploaded(VLFileObjectID document) SKEIN_EXCLUDES(_mutex);
+
+  // Answered on a thread of the cloud's.
+  void setConditions(LocalCloudConditions conditions, Reply<NSErrorPtr> reply) override;
+  void cloudStatus(Reply<LocalCloudStatus, NSErrorPtr> reply) override;
+
+ private:
+  Cloud(Options options, FileOperations& operations, Log& log);
+
+  std::shared_ptr<UploadFeed> feed() SKEIN_EXCLUDES(_mutex);
+  // Whether a copy of a document shares its blocks.
+  bool probeSharing();
+
+  Options _options;
+  FileOperations& _operations;
+  Log& _log;
+  bool _sharesBlocks = false;
+  CloudConditions _conditions;
+  SystemCloudClock _clock;
+  std::unique_ptr<CloudContents> _contents;
+  std::unique_ptr<CloudRecords> _records;
+  const std::shared_ptr<ClosableExecutor> _uploadThreads;
+  const std::shared_ptr<ClosableExecutor> _downloadThreads;
+  const std::shared_ptr<ClosableExecutor> _answers;
+  std::unique_ptr<Downloader> _downloader;
+  std::unique_ptr<Uploader> _uploader;
+
+  Mutex _mutex;
+  std::shared_ptr<UploadFeed> _feed SKEIN_GUARDED_BY(_mutex);
+};
+
+}  // namespace skein::vald

@@ -1,0 +1,222 @@
+// What changes where documents are.
+#include "linux/vald/Files.h"
+
+#include <cerrno>
+#include <utility>
+
+#include "linux/vald/files/FileErrors.h"
+#include "linux/vald/files/FileNames.h"
+
+namespace skein::vald {
+namespace {
+
+constexpr unsigned kMostBounces = 10'000;
+
+NSURLPtr urlOf(const std::string& path) {
+  return path.empty() ? nullptr : NSURL::fileURLWithPath(path);
+}
+
+}  // namespace
+
+Files::Subject Files::subjectAt(const std::string& path) {
+  Subject subject{findDocument(_parts.operations.roots(), path), nullptr};
+  subject.item = _parts.store.itemAtPath(subject.place.path, false, nullptr);
+  return subject;
+}
+
+FileRequest Files::request(const Subject& subject, RequestOrigin origin) const {
+  FileRequest request;
+  request.origin = std::move(origin);
+  if (subject.item) request.document = subject.item->fileObjectID().asString();
+  return request;
+}
+
+void Files::answerResult(URLReply& reply, const FileResult& result,
+                         std::vector<std::string> touched) {
+  std::string path;
+  if (!result.error) {
+    path = documentPath(&_parts.operations.roots(), result.path);
+    touched.push_back(path);
+    _parts.store.lookAtPaths(touched);
+  }
+  reply(urlOf(path), result.error);
+}
+
+// ---- something new
+
+std::shared_ptr<NSProgress> Files::importDocument(NSURLPtr source, NSURLPtr folder,
+                                                  std::optional<std::string> name,
+                                                  RequestOrigin origin, URLReply reply) {
+  auto progress = NSProgress::progressWithTotalUnitCount(0);
+  NSErrorPtr error;
+  if (!source) error = vlc_errorInvalidParameter("source", "(null)");
+  if (!folder) error = vlc_errorInvalidParameter("folder", "(null)");
+  postAnswer(*_parts.importExecutor, std::move(reply), [=, this](URLReply& answered) {
+    if (error) return answerError(answered, error);
+    FileRequest request;
+    request.origin = origin;
+    request.progress = [progress](const FileProgress& state) {
+      progress->setTotalUnitCount(static_cast<std::int64_t>(state.totalBytes));
+      progress->setCompletedUnitCount(static_cast<std::int64_t>(state.doneBytes));
+      return !progress->isCancelled();
+    };
+    answerResult(answered,
+                 _parts.operations.importDocument(source->path(), folder->path(), name, request),
+                 {});
+  });
+  return progress;
+}
+
+void Files::createFolder(NSURLPtr folder, std::string name, RequestOrigin origin, URLReply reply) {
+  answer("folder", folder, std::move(reply), [=, this](URLReply& answered) {
+    answerResult(answered, _parts.operations.createFolder(folder->path(), name, {origin, {}, {}}),
+                 {});
+  });
+}
+
+void Files::makeAlias(NSURLPtr folder, std::string name, std::string target, RequestOrigin origin,
+                      URLReply reply) {
+  answer("folder", folder, std::move(reply), [=, this](URLReply& answered) {
+    answerResult(answered,
+                 _parts.operations.makeAlias(folder->path(), name, target, {origin, {}, {}}), {});
+  });
+}
+
+// ---- another place
+
+NSErrorPtr Files::refusalOfMarkerName(const Subject& subject, const std::string& name) const {
+  if (NSErrorPtr refusal = refusalOfName(name, false)) return refusal;
+  if (!MarkerNames(name).shortened || name == nameOfPath(subject.place.path)) return nullptr;
+  return fileErrorWithWords(NSFileWriteInvalidFileNameError, ENAMETOOLONG,
+                            "a document that is not present can't have a name this long; "
+                            "download it first",
+                            subject.place.path);
+}
+
+FileResult Files::renameEvicted(const Subject& subject, const std::string& newName,
+                                const FileRequest& request) {
+  if (NSErrorPtr refusal = refusalOfMarkerName(subject, newName)) return {{}, refusal};
+  const std::string newPath = joinPath(parentOfPath(subject.place.path), newName);
+  FileResult result =
+      _parts.operations.rename(subject.place.physical, MarkerNames(newName).marker, request);
+  if (result.error && result.error->code() == NSFileWriteFileExistsError) {
+    result.error = fileError(EEXIST, "can't rename", newPath);
+  }
+  return result;
+}
+
+FileResult Files::moveEvicted(const Subject& subject, const std::string& folder,
+                              const std::optional<std::string>& newName, bool bounce,
+                              const FileRequest& request) {
+  std::string name = newName.value_or(nameOfPath(subject.place.path));
+  // In the trash it may have had to be called otherwise.
+  const FileResult before = _parts.operations.putBackPath(subject.place.physical);
+  if (!newName && !before.error) name = nameOfPath(documentPath(nullptr, before.path));
+  if (NSErrorPtr refusal = refusalOfMarkerName(subject, name)) return {{}, refusal};
+  FileResult result;
+  for (unsigned number = 1; number <= (bounce ? kMostBounces : 1); ++number) {
+    const std::string candidate = numberedName(name, number, ' ');
+    result = _parts.operations.move(subject.place.physical, folder, MarkerNames(candidate).marker,
+                                    false, request);
+    if (!result.error || result.error->code() != NSFileWriteFileExistsError) return result;
+    result.error = fileError(EEXIST, "can't move it to", joinPath(folder, candidate));
+  }
+  return result;
+}
+
+void Files::rename(NSURLPtr url, std::string newName, RequestOrigin origin, URLReply reply) {
+  answer("url", url, std::move(reply), [=, this](URLReply& answered) {
+    const Subject subject = subjectAt(url->path());
+    const FileRequest asked = request(subject, origin);
+    answerResult(answered,
+                 subject.place.isEvicted()
+                     ? renameEvicted(subject, newName, asked)
+                     : _parts.operations.rename(subject.place.path, newName, asked),
+                 {subject.place.path});
+  });
+}
+
+void Files::move(NSURLPtr url, NSURLPtr folder, std::optional<std::string> newName, bool bounce,
+                 RequestOrigin origin, URLReply reply) {
+  answer("url", folder ? url : nullptr, std::move(reply), [=, this](URLReply& answered) {
+    const Subject subject = subjectAt(url->path());
+    const FileRequest asked = request(subject, origin);
+    answerResult(
+        answered,
+        subject.place.isEvicted()
+            ? moveEvicted(subject, folder->path(), newName, bounce, asked)
+            : _parts.operations.move(subject.place.path, folder->path(), newName, bounce, asked),
+        {subject.place.path});
+  });
+}
+
+void Files::remove(NSURLPtr url, RequestOrigin origin, Reply<NSErrorPtr> reply) {
+  answer("url", url, std::move(reply), [=, this](Reply<NSErrorPtr>& answered) {
+    const Subject subject = subjectAt(url->path());
+    const FileResult result =
+        _parts.operations.remove(subject.place.physical, request(subject, origin));
+    if (!result.error) _parts.store.lookAtPaths({subject.place.path});
+    answered(result.error);
+  });
+}
+
+void Files::trash(NSURLPtr url, RequestOrigin origin, URLReply reply) {
+  answer("url", url, std::move(reply), [=, this](URLReply& answered) {
+    const Subject subject = subjectAt(url->path());
+    answerResult(answered,
+                 _parts.operations.trash(subject.place.physical, request(subject, origin)),
+                 {subject.place.path});
+  });
+}
+
+// ---- questions about places
+
+void Files::putBackURL(NSURLPtr url, URLReply reply) {
+  answer("url", url, std::move(reply), [=, this](URLReply& answered) {
+    const DocumentPlace place = findDocument(_parts.operations.roots(), url->path());
+    FileResult result = _parts.operations.putBackPath(place.physical);
+    if (place.isEvicted()) result.path = documentPath(nullptr, result.path);
+    answered(urlOf(result.path), result.error);
+  });
+}
+
+void Files::capabilityToMove(NSURLPtr url, NSURLPtr toURL, Reply<std::uint64_t, NSErrorPtr> reply) {
+  answer("url", toURL ? url : nullptr, std::move(reply), [=, this](auto& answered) {
+    const DocumentPlace place = findDocument(_parts.operations.roots(), url->path());
+    NSErrorPtr error;
+    const std::uint64_t capability =
+        _parts.operations.capabilityToMove(place.physical, toURL->path(), &error);
+    answered(capability, error);
+  });
+}
+
+void Files::coordinateDeletion(NSURLPtr url, URLReply reply) {
+  answer("url", url, std::move(reply), [=, this](URLReply& answered) {
+    const Subject subject = subjectAt(url->path());
+    NSErrorPtr error = _parts.operations.waitFor(subject.place.physical);
+    std::string path = subject.place.path;
+    // What it waited for may have moved the item.
+    if (error && error->code() == NSFileNoSuchFileError && subject.item) {
+      const auto now = _parts.store.pathForID(subject.item->fileObjectID(), nullptr);
+      if (now && *now != path) {
+        path = *now;
+        error = nullptr;
+      }
+    }
+    answered(error ? nullptr : urlOf(path), error);
+  });
+}
+
+void Files::physicalURL(NSURLPtr url, Reply<NSURLPtr, bool, NSErrorPtr> reply) {
+  answer("url", url, std::move(reply), [=, this](auto& answered) {
+    const DocumentPlace place = findDocument(_parts.operations.roots(), url->path());
+    StorePlace there;
+    NSErrorPtr error = _parts.operations.roots().locate(place.physical, there);
+    if (!error && !there.isRoot() && !there.folder.exists(there.name)) {
+      error = fileError(ENOENT, "can't find", place.path);
+    }
+    answered(error ? nullptr : urlOf(place.physical), place.namedByMarker, error);
+  });
+}
+
+}  // namespace skein::vald

@@ -1,0 +1,126 @@
+#pragma once
+
+#include <functional>
+#include <memory>
+#include <optional>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "base/Executor.h"
+#include "linux/protocol/LocalFiles.h"
+#include "linux/vald/DocumentPlaces.h"
+#include "linux/vald/FolderStore.h"
+#include "linux/vald/Replies.h"
+#include "linux/vald/cloud/Downloader.h"
+#include "linux/vald/cloud/Eviction.h"
+#include "linux/vald/files/FileOperations.h"
+#include "vellum/VLErrors.h"
+
+namespace skein::vald {
+
+// What Files works with; each outlives it and what it posted.
+struct FilesParts {
+  FolderStore& store;
+  FileOperations& operations;
+  CloudPlaces places;
+  Downloader& downloader;
+  std::shared_ptr<Executor> executor;        // for what takes milliseconds
+  std::shared_ptr<Executor> importExecutor;  // for what may take minutes
+  // Why a document may not be uploaded although nothing failed; empty when it will be.
+  std::function<std::string(VLFileObjectID)> whyNotUploaded;
+};
+
+// Posts `work(reply)` to an executor.
+template <class R, class Work>
+void postAnswer(Executor& executor, R reply, Work work) {
+  executor.post([reply = std::move(reply), work = std::move(work)]() mutable { work(reply); });
+}
+
+// What vald does to documents. Everything is posted to executors of its own, so that no
+// listing waits for it, and answered from there once the store has seen what was done. A
+// document that is not present is named by the path it would have; what is done to it is
+// done to its marker. The executors are closed before this goes.
+class Files final : public LocalFiles {
+ public:
+  explicit Files(FilesParts parts) : _parts(std::move(parts)), _eviction(_parts.places) {}
+
+  std::shared_ptr<NSProgress> importDocument(NSURLPtr source, NSURLPtr folder,
+                                             std::optional<std::string> name, RequestOrigin origin,
+                                             URLReply reply) override;
+  void createFolder(NSURLPtr folder, std::string name, RequestOrigin origin,
+                    URLReply reply) override;
+  void makeAlias(NSURLPtr folder, std::string name, std::string target, RequestOrigin origin,
+                 URLReply reply) override;
+  void rename(NSURLPtr url, std::string newName, RequestOrigin origin, URLReply reply) override;
+  void move(NSURLPtr url, NSURLPtr folder, std::optional<std::string> newName, bool bounce,
+            RequestOrigin origin, URLReply reply) override;
+  void remove(NSURLPtr url, RequestOrigin origin, Reply<NSErrorPtr> reply) override;
+  void trash(NSURLPtr url, RequestOrigin origin, URLReply reply) override;
+
+  void putBackURL(NSURLPtr url, URLReply reply) override;
+  void capabilityToMove(NSURLPtr url, NSURLPtr toURL,
+                        Reply<std::uint64_t, NSErrorPtr> reply) override;
+  void coordinateDeletion(NSURLPtr url, URLReply reply) override;
+  void physicalURL(NSURLPtr url, Reply<NSURLPtr, bool, NSErrorPtr> reply) override;
+
+  void setTagNames(NSURLPtr url, std::vector<std::string> names, Reply<NSErrorPtr> reply) override;
+  void setLastOpenDate(NSURLPtr url, std::optional<NSDate> date, Reply<NSErrorPtr> reply) override;
+  void setFavoriteRank(NSURLPtr url, std::optional<std::int64_t> rank,
+                       Reply<NSErrorPtr> reply) override;
+  void tagsInUse(Reply<std::vector<TagUse>, NSErrorPtr> reply) override;
+
+  std::shared_ptr<NSProgress> download(NSURLPtr url, bool currentVersion,
+                                       Reply<NSErrorPtr> reply) override;
+  void evict(NSURLPtr url, Reply<NSErrorPtr> reply) override;
+  void setPinned(NSURLPtr url, bool pinned, Reply<NSErrorPtr> reply) override;
+
+  void trashedItems(std::uint64_t offset, std::uint64_t limit,
+                    Reply<std::vector<TrashedItem>, std::uint64_t, NSErrorPtr> reply) override;
+  void history(std::string path, std::string identifier, std::uint64_t limit,
+               Reply<std::vector<FileHistoryEntry>, NSErrorPtr> reply) override;
+
+ private:
+  // A request about one item: where it is, and who it is.
+  struct Subject {
+    DocumentPlace place;
+    VLQueryItemPtr item;  // null when the store does not know it
+  };
+
+  // Posts `work(reply)`, or the answer that a URL is missing.
+  template <class R, class Work>
+  void answer(const char* parameter, const NSURLPtr& url, R reply, Work work) {
+    NSErrorPtr error = url ? nullptr : vlc_errorInvalidParameter(parameter, "(null)");
+    postAnswer(*_parts.executor, std::move(reply),
+               [error = std::move(error), work = std::move(work)](R& answered) mutable {
+                 error ? answerError(answered, error) : work(answered);
+               });
+  }
+  Subject subjectAt(const std::string& path);
+  FileRequest request(const Subject& subject, RequestOrigin origin) const;
+  // Lets the store look, and answers with the path that people know.
+  void answerResult(URLReply& reply, const FileResult& result, std::vector<std::string> touched);
+
+  FileResult renameEvicted(const Subject& subject, const std::string& newName,
+                           const FileRequest& request);
+  FileResult moveEvicted(const Subject& subject, const std::string& folder,
+                         const std::optional<std::string>& newName, bool bounce,
+                         const FileRequest& request);
+  // Null, or why no marker can stand for a document of this name.
+  NSErrorPtr refusalOfMarkerName(const Subject& subject, const std::string& name) const;
+
+  // Changes what the index alone keeps, and notes on the file which document it is.
+  NSErrorPtr changeDetails(const std::string& path, std::function<void(ItemDetails&)> change);
+  void startDownload(const std::string& path, const std::shared_ptr<NSProgress>& progress,
+                     Reply<NSErrorPtr> reply);
+  std::optional<NSDate> dateOfTrashing(const std::string& path) const;
+  std::vector<FileHistoryEntry> historyOf(const std::string& path, const std::string& identifier,
+                                          std::size_t limit, NSErrorOut error);
+  void addRemovalsByOthers(const std::string& path, std::size_t limit,
+                           std::vector<FileHistoryEntry>& entries);
+
+  const FilesParts _parts;
+  Eviction _eviction;
+};
+
+}  // namespace skein::vald

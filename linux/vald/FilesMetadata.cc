@@ -1,0 +1,189 @@
+// Tags, dates and ranks; what is in the trash; what was done.
+#include <algorithm>
+#include <cerrno>
+#include <ctime>
+#include <utility>
+
+#include "linux/vald/Files.h"
+#include "linux/vald/files/FileErrors.h"
+#include "linux/vald/files/FileNames.h"
+#include "linux/vald/files/TrashInfo.h"
+
+namespace skein::vald {
+namespace {
+
+constexpr std::uint64_t kMostTrashed = 1000;
+constexpr std::uint64_t kMostHistory = 1000;
+constexpr auto kSameRemoval = std::chrono::minutes(1);
+constexpr char kByAnother[] = "another program";
+
+std::optional<std::int64_t> nanoseconds(const std::optional<NSDate>& date) {
+  if (!date) return std::nullopt;
+  return date->time_since_epoch().count();
+}
+
+}  // namespace
+
+NSErrorPtr Files::changeDetails(const std::string& path, std::function<void(ItemDetails&)> change) {
+  const Subject subject = subjectAt(path);
+  if (!subject.item) return fileError(ENOENT, "can't find", path);
+  const VLFileObjectID id = subject.item->fileObjectID();
+  if (NSErrorPtr error = _parts.store.changeDetails(id, std::move(change))) return error;
+  if (id.isFolderOrAliasID()) return nullptr;
+  _parts.operations.writeHint(subject.place.physical, id.rawID());
+  _parts.store.lookAtPaths({subject.place.path});
+  return nullptr;
+}
+
+void Files::setTagNames(NSURLPtr url, std::vector<std::string> names, Reply<NSErrorPtr> reply) {
+  answer("url", url, std::move(reply), [=, this](Reply<NSErrorPtr>& answered) {
+    const DocumentPlace place = findDocument(_parts.operations.roots(), url->path());
+    const TagResult result = _parts.operations.setTags(place.physical, names);
+    if (result.storage == TagStorage::Failed) return answered(result.error);
+    if (result.storage == TagStorage::Kept) _parts.store.lookAtPaths({place.path});
+    // Also where the file has them: an index that was told is not behind.
+    const bool isOnFile = result.storage == TagStorage::Kept;
+    const std::string tags = joinTags(names);
+    answered(changeDetails(place.path, [tags, isOnFile](ItemDetails& details) {
+      details.tags = tags;
+      details.tagsAreOnFile = isOnFile && !tags.empty();
+    }));
+  });
+}
+
+void Files::setLastOpenDate(NSURLPtr url, std::optional<NSDate> date, Reply<NSErrorPtr> reply) {
+  answer("url", url, std::move(reply), [=, this](Reply<NSErrorPtr>& answered) {
+    answered(changeDetails(
+        url->path(), [used = nanoseconds(date)](ItemDetails& details) { details.used = used; }));
+  });
+}
+
+void Files::setFavoriteRank(NSURLPtr url, std::optional<std::int64_t> rank,
+                            Reply<NSErrorPtr> reply) {
+  answer("url", url, std::move(reply), [=, this](Reply<NSErrorPtr>& answered) {
+    answered(changeDetails(url->path(), [rank](ItemDetails& details) { details.favorite = rank; }));
+  });
+}
+
+void Files::tagsInUse(Reply<std::vector<TagUse>, NSErrorPtr> reply) {
+  postAnswer(*_parts.executor, std::move(reply), [this](auto& answered) {
+    std::vector<TagUse> tags;
+    for (auto& [name, items] : _parts.store.tagsInUse()) tags.push_back({std::move(name), items});
+    answered(std::move(tags), nullptr);
+  });
+}
+
+// ---- the trash
+
+std::optional<NSDate> Files::dateOfTrashing(const std::string& path) const {
+  const auto info = _parts.operations.trashInfo(path);
+  std::tm time{};
+  if (!info || strptime(info->deletionDate.c_str(), "%Y-%m-%dT%H:%M:%S", &time) == nullptr) {
+    return std::nullopt;
+  }
+  time.tm_isdst = -1;
+  const std::time_t seconds = std::mktime(&time);
+  if (seconds == -1) return std::nullopt;
+  return NSDate(std::chrono::seconds(seconds));
+}
+
+void Files::trashedItems(std::uint64_t offset, std::uint64_t limit,
+                         Reply<std::vector<TrashedItem>, std::uint64_t, NSErrorPtr> reply) {
+  postAnswer(*_parts.executor, std::move(reply), [=, this](auto& answered) {
+    NSErrorPtr error;
+    std::vector<FolderStore::Trashed> found = _parts.store.trashedItems(&error);
+    if (error) return answerError(answered, error);
+    // The time of change is the moment of the renaming, unless something was done since:
+    // close enough for an order that costs no look at a file.
+    std::sort(found.begin(), found.end(), [](const auto& a, const auto& b) {
+      return a.changed != b.changed ? a.changed > b.changed : a.path < b.path;
+    });
+    const std::size_t begin = std::min<std::size_t>(offset, found.size());
+    const std::size_t end =
+        std::min<std::size_t>(found.size() - begin, std::min(limit, kMostTrashed)) + begin;
+    std::vector<TrashedItem> page;
+    for (std::size_t at = begin; at < end; ++at) {
+      const FolderStore::Trashed& one = found[at];
+      TrashedItem trashed{one.item, NSURL::fileURLWithPath(one.path), nullptr, std::nullopt};
+      const DocumentPlace place = findDocument(_parts.operations.roots(), one.path);
+      const FileResult origin = _parts.operations.putBackPath(place.physical);
+      if (!origin.error) {
+        trashed.putBackURL = NSURL::fileURLWithPath(
+            place.isEvicted() ? documentPath(nullptr, origin.path) : origin.path);
+      }
+      trashed.trashed = dateOfTrashing(place.physical);
+      page.push_back(std::move(trashed));
+    }
+    answered(std::move(page), end < found.size() ? end : 0, nullptr);
+  });
+}
+
+// ---- provenance
+
+std::vector<FileHistoryEntry> Files::historyOf(const std::string& path,
+                                               const std::string& identifier, std::size_t limit,
+                                               NSErrorOut error) {
+  OperationJournal& journal = _parts.operations.journal();
+  std::vector<OperationEntry> entries;
+  const auto add = [&](std::vector<OperationEntry> more) {
+    entries.insert(entries.end(), std::make_move_iterator(more.begin()),
+                   std::make_move_iterator(more.end()));
+  };
+  if (!path.empty()) {
+    add(journal.historyOfPath(path, limit, error));
+    const std::string marker = MarkerNames(nameOfPath(path)).marker;
+    add(journal.historyOfPath(joinPath(parentOfPath(path), marker), limit, error));
+  }
+  add(journal.historyOfDocument(identifier, limit, error));
+  std::sort(entries.begin(), entries.end(),
+            [](const auto& a, const auto& b) { return a.id > b.id; });
+  entries.erase(std::unique(entries.begin(), entries.end(),
+                            [](const auto& a, const auto& b) { return a.id == b.id; }),
+                entries.end());
+  std::vector<FileHistoryEntry> history;
+  for (const OperationEntry& entry : entries) {
+    history.push_back({entry.when, operationName(entry.kind), entry.origin, entry.document,
+                       documentPath(nullptr, entry.path), documentPath(nullptr, entry.destination),
+                       entry.state == OperationState::Undone});
+  }
+  return history;
+}
+
+// What the store saw go although nobody asked vald to remove or to move it.
+void Files::addRemovalsByOthers(const std::string& path, std::size_t limit,
+                                std::vector<FileHistoryEntry>& entries) {
+  const auto isAsked = [&](const FolderStore::Removal& removal) {
+    return std::any_of(entries.begin(), entries.end(), [&](const FileHistoryEntry& entry) {
+      const auto apart = removal.when - entry.when;
+      return !entry.undone && entry.origin != kByAnother && entry.path == path &&
+             apart < kSameRemoval && apart > -kSameRemoval;
+    });
+  };
+  for (const FolderStore::Removal& removal : _parts.store.removalsAt(path, limit)) {
+    if (isAsked(removal)) continue;
+    entries.push_back({removal.when,
+                       operationName(OperationKind::Remove),
+                       kByAnother,
+                       removal.id.asString(),
+                       path,
+                       {},
+                       false});
+  }
+  std::stable_sort(entries.begin(), entries.end(),
+                   [](const auto& a, const auto& b) { return a.when > b.when; });
+}
+
+void Files::history(std::string path, std::string identifier, std::uint64_t limit,
+                    Reply<std::vector<FileHistoryEntry>, NSErrorPtr> reply) {
+  postAnswer(*_parts.executor, std::move(reply), [=, this](auto& answered) {
+    const std::size_t most = std::min(limit, kMostHistory);
+    NSErrorPtr error;
+    std::vector<FileHistoryEntry> entries = historyOf(path, identifier, most, &error);
+    if (error) return answerError(answered, error);
+    if (!path.empty()) addRemovalsByOthers(path, most, entries);
+    if (entries.size() > most) entries.resize(most);
+    answered(std::move(entries), nullptr);
+  });
+}
+
+}  // namespace skein::vald

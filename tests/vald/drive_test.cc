@@ -1,0 +1,358 @@
+// What is done to documents, through a whole drive: nothing that a person gave a document is
+// lost on any way, and every answer is what the store says from then on.
+#include <fcntl.h>
+#include <sys/xattr.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <functional>
+
+#include "tests/vald/DriveFixture.h"
+
+namespace skein::vald {
+namespace {
+
+class DriveTest : public DriveFixture {
+ protected:
+  // A document that has all that must survive. Its portrait.
+  std::string makePrecious(const std::string& path) {
+    write(path);
+    settle();
+    EXPECT_EQ(tagged(path, {"Red", "Tax 2024"}), "");
+    EXPECT_EQ(ranked(path, 7), "");
+    EXPECT_EQ(used(path, NSDate(std::chrono::seconds(1'700'000'000))), "");
+    const std::string all = portrait(path);
+    EXPECT_NE(all.find("Red,Tax 2024 7 1700000000"), std::string::npos) << all;
+    return all;
+  }
+};
+
+TEST_F(DriveTest, EverySafeSaveKeepsIdentityTagsRankAndDate) {
+  using Step = std::function<void()>;
+  const auto old = [&] { return at("doc.txt"); };
+  const std::vector<std::vector<Step>> saves = {
+      // In place.
+      {[&] { write("doc.txt", "newer"); }},
+      // Through a temporary file.
+      {[&] { write("doc.txt.tmp", "newer"); }, [&] { rename("doc.txt.tmp", "doc.txt"); }},
+      // With a backup.
+      {[&] { rename("doc.txt", "doc.txt~"); }, [&] { write("doc.txt", "newer"); },
+       [&] { ::unlink((old() + "~").c_str()); }},
+      // By exchange.
+      {[&] { write("new.tmp", "newer"); },
+       [&] {
+         ASSERT_EQ(
+             renameat2(AT_FDCWD, at("new.tmp").c_str(), AT_FDCWD, old().c_str(), RENAME_EXCHANGE),
+             0);
+       },
+       [&] { ::unlink(at("new.tmp").c_str()); }},
+      // Deleted and made again.
+      {[&] { ::unlink(old().c_str()); }, [&] { write("doc.txt", "newer"); }},
+      // Through a hard link.
+      {[&] { write("t.tmp", "newer"); }, [&] { ::unlink(old().c_str()); },
+       [&] { ASSERT_EQ(::link(at("t.tmp").c_str(), old().c_str()), 0); },
+       [&] { ::unlink(at("t.tmp").c_str()); }},
+  };
+  open();
+  for (std::size_t number = 0; number < saves.size(); ++number) {
+    for (const bool isSeenStepByStep : {true, false}) {
+      const std::string before = makePrecious("doc.txt");
+      for (const Step& step : saves[number]) {
+        step();
+        if (isSeenStepByStep) settle();
+      }
+      settle();
+      EXPECT_EQ(portrait("doc.txt"), before) << "save " << number;
+      EXPECT_EQ(read("doc.txt"), "newer");
+      EXPECT_EQ(listed(), std::vector<std::string>{"doc.txt"}) << "save " << number;
+      reopen();
+      EXPECT_EQ(portrait("doc.txt"), before) << "save " << number << ", after a restart";
+      EXPECT_EQ(removed("doc.txt"), "");
+    }
+  }
+  EXPECT_TRUE(differences().empty());
+}
+
+TEST_F(DriveTest, TagsFollowTheFileWhoeverSetsThem) {
+  write("folder/doc.txt");
+  open();
+  ASSERT_EQ(setxattr(at("folder/doc.txt").c_str(), kTagsAttribute, "Blue,Two", 8, 0), 0);
+  settle();
+  EXPECT_EQ(tags("folder/doc.txt"), (std::vector<std::string>{"Blue", "Two"}));
+  EXPECT_EQ(tagged("folder", {"Two"}), "");
+  EXPECT_EQ(tags("folder"), std::vector<std::string>{"Two"});
+  const auto use = std::get<0>(ask<std::vector<TagUse>, NSErrorPtr>(
+      [](LocalFiles& files, auto reply) { files.tagsInUse(std::move(reply)); }));
+  ASSERT_EQ(use.size(), 2U);
+  EXPECT_EQ(use[1].name, "Two");
+  EXPECT_EQ(use[1].items, 2U);
+  // Taken away by another program, and while vald is down.
+  ASSERT_EQ(removexattr(at("folder/doc.txt").c_str(), kTagsAttribute), 0);
+  settle();
+  EXPECT_TRUE(tags("folder/doc.txt").empty());
+  close();
+  ASSERT_EQ(setxattr(at("folder/doc.txt").c_str(), kTagsAttribute, "Away", 4, 0), 0);
+  open();
+  EXPECT_EQ(tags("folder/doc.txt"), std::vector<std::string>{"Away"});
+  // A link has no attributes: the index keeps its tags.
+  EXPECT_EQ(path([&](LocalFiles& files, auto reply) {
+              files.makeAlias(url(""), "alias", at("folder"), "test", std::move(reply));
+            }),
+            "alias");
+  EXPECT_EQ(tagged("alias", {"Link"}), "");
+  EXPECT_EQ(renamed("alias", "alias 2"), "alias 2");
+  reopen();
+  EXPECT_EQ(tags("alias 2"), std::vector<std::string>{"Link"});
+  EXPECT_EQ(tagged("folder/doc.txt", {"a,b"}), "!514");
+  EXPECT_EQ(tagged("nothing", {"a"}), "!4");
+}
+
+TEST_F(DriveTest, AFirstScanFindsTagsAndNumbersLater) {
+  open();
+  const std::string before = makePrecious("doc.txt");
+  const std::string copied = id("doc.txt");
+  close();
+  // The index is lost; the file has kept its tags and its number.
+  for (const char* part : {"", "-wal", "-shm"}) {
+    std::filesystem::remove(options.store.databasePath + part);
+  }
+  open();
+  EXPECT_TRUE(eventually([&] { return id("doc.txt") == copied && !tags("doc.txt").empty(); }));
+  // A copy is another document.
+  std::filesystem::copy_file(at("doc.txt"), at("copy.txt"));
+  char hint[128];
+  const ssize_t size = getxattr(at("doc.txt").c_str(), "user.skein.document", hint, sizeof hint);
+  ASSERT_GT(size, 0);
+  ASSERT_EQ(setxattr(at("copy.txt").c_str(), "user.skein.document", hint,
+                     static_cast<std::size_t>(size), 0),
+            0);
+  settle();
+  EXPECT_NE(id("copy.txt"), copied);
+  EXPECT_EQ(id("doc.txt"), copied);
+}
+
+TEST_F(DriveTest, AnEvictedDocumentIsTheSameOneOnAllItsWays) {
+  write("other/kept.txt");
+  open();
+  const std::string before = makePrecious("doc.txt");
+  ASSERT_TRUE(uploaded("doc.txt"));
+  const VLQueryItemPtr present = item("doc.txt");
+  ASSERT_EQ(evicted("doc.txt"), "");
+  EXPECT_FALSE(exists("doc.txt"));
+  EXPECT_TRUE(exists(".doc.txt.skein"));
+
+  const VLQueryItemPtr away = item("doc.txt");
+  ASSERT_NE(away, nullptr);
+  EXPECT_FALSE(away->isDownloaded());
+  EXPECT_TRUE(away->isUploaded());
+  VLQueryItem::Properties expected = present->properties();
+  expected.isDownloaded = false;
+  EXPECT_EQ(away->properties(), expected);
+  EXPECT_EQ(listed(), (std::vector<std::string>{"doc.txt", "other"}));
+
+  // Its name is taken.
+  EXPECT_EQ(path([&](LocalFiles& files, auto reply) {
+              files.createFolder(url(""), "doc.txt", "test", std::move(reply));
+            }),
+            "!516");
+  EXPECT_EQ(moved("other/kept.txt", ""), "kept.txt");
+  EXPECT_EQ(renamed("kept.txt", "doc.txt"), "!516");
+  EXPECT_EQ(renamed("doc.txt", "kept.txt"), "!516");
+
+  EXPECT_EQ(renamed("doc.txt", "renamed.txt"), "renamed.txt");
+  EXPECT_EQ(portrait("renamed.txt"), before);
+  EXPECT_EQ(moved("renamed.txt", "other"), "other/renamed.txt");
+  EXPECT_EQ(portrait("other/renamed.txt"), before);
+  // By another program, live and while vald is down.
+  rename("other/.renamed.txt.skein", "other/.again.txt.skein");
+  settle();
+  EXPECT_EQ(portrait("other/again.txt"), before);
+  close();
+  rename("other/.again.txt.skein", ".doc.txt.skein");
+  open();
+  EXPECT_EQ(portrait("doc.txt"), before);
+
+  EXPECT_EQ(trashed("doc.txt"), ".Trash-" + std::to_string(geteuid()) + "/files/doc.txt");
+  EXPECT_EQ(item("doc.txt"), nullptr);
+  const std::string inTrash = ".Trash-" + std::to_string(geteuid()) + "/files/doc.txt";
+  EXPECT_EQ(portrait(inTrash), before);
+  EXPECT_TRUE(item(inTrash)->isTrashed());
+  EXPECT_EQ(path([&](LocalFiles& files, auto reply) {
+              files.putBackURL(url(inTrash), std::move(reply));
+            }),
+            "doc.txt");
+  EXPECT_EQ(moved(inTrash, ""), "doc.txt");
+  EXPECT_EQ(portrait("doc.txt"), before);
+  EXPECT_EQ(tagged("doc.txt", {"Green"}), "");
+  EXPECT_EQ(tags("doc.txt"), std::vector<std::string>{"Green"});
+  EXPECT_TRUE(differences().empty());
+
+  EXPECT_EQ(downloaded("doc.txt"), "");
+  EXPECT_EQ(read("doc.txt"), "contents");
+  EXPECT_EQ(item("doc.txt")->itemIdentifier(), present->itemIdentifier());
+  EXPECT_EQ(item("doc.txt")->contentModificationDate(), present->contentModificationDate());
+  EXPECT_EQ(item("doc.txt")->creationDate(), present->creationDate());
+  EXPECT_TRUE(item("doc.txt")->isDownloaded());
+  EXPECT_TRUE(item("doc.txt")->isUploaded());
+  EXPECT_EQ(tags("doc.txt"), std::vector<std::string>{"Green"});
+  EXPECT_EQ(evicted("other"),
+            "!" + std::to_string(static_cast<int>(EvictionRefusal::NotADocument)));
+  ASSERT_TRUE(uploaded("doc.txt"));
+  ASSERT_EQ(evicted("doc.txt"), "");
+  EXPECT_EQ(removed("doc.txt"), "");
+  EXPECT_FALSE(exists(".doc.txt.skein"));
+  EXPECT_EQ(item("doc.txt"), nullptr);
+  EXPECT_TRUE(differences().empty());
+}
+
+TEST_F(DriveTest, WhatIsTrashedKeepsItsIdentifierWhoeverTrashesIt) {
+  const std::string trash = ".Trash-" + std::to_string(geteuid());
+  open();
+  const std::string before = makePrecious("folder/doc.txt");
+  const VLFileObjectID folder = item("folder")->fileObjectID();
+  const std::string inFolder = id("folder/doc.txt");
+  // As another tool does it, which makes the trash for it.
+  std::filesystem::create_directories(at(trash + "/files"));
+  std::filesystem::create_directories(at(trash + "/info"));
+  write(trash + "/info/doc.txt.trashinfo",
+        "[Trash Info]\nPath=folder/doc.txt\nDeletionDate=2024-03-01T10:00:00\n");
+  rename("folder/doc.txt", trash + "/files/doc.txt");
+  settle();
+  EXPECT_EQ(portrait(trash + "/files/doc.txt"), before);
+  const VLQueryItemPtr known =
+      drive->store().itemWithID(item(trash + "/files/doc.txt")->fileObjectID(), nullptr);
+  ASSERT_NE(known, nullptr);
+  EXPECT_TRUE(known->isTrashed());
+  EXPECT_NE(drive->store().itemWithID(
+                *VLFileObjectID::fileObjectIDWithString(known->parentItemIdentifier()), nullptr),
+            nullptr);
+  EXPECT_TRUE(listed("folder").empty());
+  EXPECT_EQ(listed(), std::vector<std::string>{"folder"});
+
+  EXPECT_EQ(trashed("folder"), trash + "/files/folder");
+  EXPECT_EQ(drive->store().pathForID(folder, nullptr), at(trash + "/files/folder"));
+  EXPECT_TRUE(drive->store().listAllFolders(SortOrder::Name, 0, 10, nullptr).items.empty());
+  const auto [items, next, error] = ask<std::vector<TrashedItem>, std::uint64_t, NSErrorPtr>(
+      [](LocalFiles& files, auto reply) { files.trashedItems(0, 1, std::move(reply)); });
+  ASSERT_EQ(items.size(), 1U);
+  EXPECT_EQ(items[0].url->path(), at(trash + "/files/folder"));
+  EXPECT_EQ(items[0].putBackURL->path(), at("folder"));
+  EXPECT_TRUE(items[0].trashed);
+  EXPECT_EQ(next, 1U);
+
+  // Put back by either.
+  EXPECT_EQ(moved(trash + "/files/folder", ""), "folder");
+  rename(trash + "/files/doc.txt", "folder/doc.txt");
+  settle();
+  EXPECT_EQ(portrait("folder/doc.txt"), before);
+  EXPECT_FALSE(item("folder/doc.txt")->isTrashed());
+  // Emptying is a deletion.
+  EXPECT_EQ(trashed("folder"), trash + "/files/folder");
+  std::filesystem::remove_all(at(trash));
+  EXPECT_TRUE(eventually([&] { return !drive->store().itemWithID(folder, nullptr); }));
+  EXPECT_TRUE(differences().empty());
+  const auto history = std::get<0>(ask<std::vector<FileHistoryEntry>, NSErrorPtr>(
+      [&](LocalFiles& files, auto r) { files.history(at("folder"), {}, 10, std::move(r)); }));
+  ASSERT_FALSE(history.empty());
+  EXPECT_EQ(history[0].operation, "trash");
+  EXPECT_EQ(history[0].origin, "test");
+  EXPECT_EQ(history[0].identifier, folder.asString());
+}
+
+TEST_F(DriveTest, HistoryTellsRequestsFromRemovalsByOthers) {
+  write("mine.txt");
+  write("theirs.txt");
+  open();
+  const std::string theirs = id("theirs.txt");
+  EXPECT_EQ(removed("mine.txt"), "");
+  ::unlink(at("theirs.txt").c_str());
+  settle();
+  const auto historyOf = [&](const std::string& name) {
+    return std::get<0>(ask<std::vector<FileHistoryEntry>, NSErrorPtr>(
+        [&](LocalFiles& files, auto reply) { files.history(at(name), {}, 10, std::move(reply)); }));
+  };
+  const auto mine = historyOf("mine.txt");
+  ASSERT_EQ(mine.size(), 1U);
+  EXPECT_EQ(mine[0].operation, "remove");
+  EXPECT_EQ(mine[0].origin, "test");
+  const auto other = historyOf("theirs.txt");
+  ASSERT_EQ(other.size(), 1U);
+  EXPECT_EQ(other[0].origin, "another program");
+  EXPECT_EQ(other[0].identifier, theirs);
+}
+
+TEST_F(DriveTest, WhatIsNotSafelyUploadedIsNotEvicted) {
+  const auto code = [](EvictionRefusal why) {
+    return "!" + std::to_string(static_cast<std::int64_t>(why));
+  };
+  options.cloud.policy = {LocalCloudStatus::Uploads::Bounded, 100};
+  write("big.bin", std::string(200, 'x'));
+  write("small.txt");
+  open();
+  ASSERT_TRUE(uploaded("small.txt"));
+  // Only where copies take room is there a bound.
+  const auto status = [&] {
+    auto answer = std::make_shared<std::promise<LocalCloudStatus>>();
+    auto future = answer->get_future();
+    drive->cloud().cloudStatus(
+        [answer](LocalCloudStatus now, NSErrorPtr) { answer->set_value(std::move(now)); });
+    return future.get();
+  };
+  if (!status().sharesBlocks) {
+    EXPECT_TRUE(eventually([&] { return status().leftOut == 1; }));
+    const auto error = std::get<0>(ask<NSErrorPtr>(
+        [&](LocalFiles& files, auto reply) { files.evict(url("big.bin"), std::move(reply)); }));
+    ASSERT_NE(error, nullptr);
+    EXPECT_EQ(error->code(), static_cast<std::int64_t>(EvictionRefusal::NotUploaded));
+    EXPECT_NE(error->localizedDescription().find("SKEIN_UPLOADS"), std::string::npos);
+  }
+  EXPECT_EQ(outcome([&](LocalFiles& files, auto reply) {
+              files.setPinned(url("small.txt"), true, std::move(reply));
+            }),
+            "");
+  EXPECT_EQ(evicted("small.txt"), code(EvictionRefusal::Pinned));
+  EXPECT_EQ(outcome([&](LocalFiles& files, auto reply) {
+              files.setPinned(url("small.txt"), false, std::move(reply));
+            }),
+            "");
+  EXPECT_EQ(evicted("small.txt"), "");
+  EXPECT_EQ(evicted("small.txt"), code(EvictionRefusal::AlreadyEvicted));
+
+  // The cloud is away; a cancelled download leaves nothing.
+  drive->cloud().setConditions({.offline = true}, [](NSErrorPtr error) { EXPECT_FALSE(error); });
+  EXPECT_TRUE(eventually([&] { return drive->cloud().conditions().settings().offline; }));
+  EXPECT_NE(downloaded("small.txt"), "");
+  drive->cloud().setConditions({.delayMilliseconds = 60'000}, [](NSErrorPtr) {});
+  EXPECT_TRUE(eventually([&] { return !drive->cloud().conditions().settings().offline; }));
+  std::shared_ptr<NSProgress> progress;
+  const auto error = std::get<0>(ask<NSErrorPtr>([&](LocalFiles& files, auto reply) {
+    progress = files.download(url("small.txt"), false, std::move(reply));
+    progress->cancel();
+  }));
+  ASSERT_NE(error, nullptr);
+  EXPECT_EQ(error->code(), NSUserCancelledError);
+  EXPECT_EQ(listed(), (std::vector<std::string>{"big.bin", "small.txt"}));
+  EXPECT_FALSE(exists(".small.txt.skein-part"));
+  EXPECT_FALSE(item("small.txt")->isDownloaded());
+  EXPECT_TRUE(differences().empty());
+}
+
+TEST_F(DriveTest, AnImportThatIsCancelledLeavesNothingAndOneThatIsNotIsThereAtOnce) {
+  open();
+  std::filesystem::create_directories(base + "/from/inner");
+  std::ofstream(base + "/from/inner/a.txt") << "a";
+  const auto import = [&](bool isCancelled) {
+    return path([&](LocalFiles& files, auto reply) {
+      const auto progress = files.importDocument(NSURL::fileURLWithPath(base + "/from"), url(""),
+                                                 std::nullopt, "test", std::move(reply));
+      if (isCancelled) progress->cancel();
+    });
+  };
+  EXPECT_EQ(import(false), "from");
+  EXPECT_NE(item("from/inner/a.txt"), nullptr);
+  EXPECT_EQ(import(false), "!516");
+  EXPECT_TRUE(differences().empty());
+}
+
+}  // namespace
+}  // namespace skein::vald
