@@ -50,8 +50,28 @@ int readFolder(const std::string& path, DiskEntries& entries) {
   return 0;
 }
 
-// A folder of what was thrown away is none of documents; vald leaves it out too.
-bool isTrash(const std::string& name) { return name.starts_with(".Trash-"); }
+// What is no document, and vald leaves out too: what was thrown away, and what is on its way
+// in or out.
+bool isNoDocument(const std::string& name) {
+  const bool isHidden = name.starts_with('.');
+  return name.starts_with(".Trash-") || name.starts_with(".skein-import-") ||
+         name.starts_with(".skein-removed-") ||
+         (isHidden && (name.ends_with(".skein-part") || name.ends_with(".skein-new") ||
+                       name.ends_with(".skein-old")));
+}
+
+// The marker that stands on disk for a document that is not present. A long name's is
+// shortened: then its first bytes tell it.
+DiskEntries::iterator markerOf(DiskEntries& onDisk, const std::string& name) {
+  const auto whole = onDisk.find('.' + name + ".skein");
+  constexpr std::size_t kNeverCut = 190;
+  if (whole != onDisk.end() || name.size() <= kNeverCut) return whole;
+  const std::string beginning = '.' + name.substr(0, kNeverCut);
+  const auto first = onDisk.lower_bound(beginning);
+  const bool isMarker = first != onDisk.end() && first->first.starts_with(beginning) &&
+                        first->first.ends_with(".skein");
+  return isMarker ? first : onDisk.end();
+}
 
 std::string joined(const std::string& folder, const std::string& name) {
   return folder == "/" ? folder + name : folder + '/' + name;
@@ -234,7 +254,7 @@ class StoreCheck::Work final : public std::enable_shared_from_this<Work> {
                               elsewhere ? std::string() : joined(folder.diskPath, name), path});
       }
       if (elsewhere || problem == EACCES) continue;
-      const auto entry = onDisk.find(name);
+      const auto entry = item->isDownloaded() ? onDisk.find(name) : markerOf(onDisk, name);
       if (entry == onDisk.end()) {
         differences.push_back({HostDifference::Kind::OnlyInListing, path,
                                "listed, but not on disk (or listed twice)"});
@@ -253,7 +273,7 @@ class StoreCheck::Work final : public std::enable_shared_from_this<Work> {
       onDisk.erase(entry);
     }
     for (const auto& [name, entry] : onDisk) {
-      if (isTrash(name)) continue;
+      if (isNoDocument(name)) continue;
       differences.push_back({HostDifference::Kind::MissingInListing, joined(folder.drivePath, name),
                              "on disk, but not listed"});
     }
