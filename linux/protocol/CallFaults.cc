@@ -8,6 +8,7 @@
 
 #include "linux/protocol/DaemonCodec.h"
 #include "linux/protocol/WithFaults.h"
+#include "platform/cloudkit/CKError.h"
 
 namespace skein {
 namespace {
@@ -48,6 +49,17 @@ const Methods& allMethods() {
   return methods;
 }
 
+NSErrorPtr injectedError(const FaultInjection& fault) {
+  NSErrorUserInfo userInfo{
+      {NSLocalizedDescriptionKey, "A fault that was asked for: " + fault.method + "."}};
+  // A failure of parts has a part: an item that the cloud does not know.
+  if (fault.errorDomain == CKErrorDomain && fault.errorCode == CKErrorPartialFailure) {
+    userInfo.emplace(CKPartialErrorsByItemIDKeyPrefix + fault.method,
+                     NSError::errorWithDomain(CKErrorDomain, CKErrorUnknownItem));
+  }
+  return NSError::errorWithDomain(fault.errorDomain, fault.errorCode, std::move(userInfo));
+}
+
 }  // namespace
 
 std::vector<FaultableMethod> faultableMethods() {
@@ -85,9 +97,7 @@ kj::Promise<void> answerWithFault(DaemonService& service, const FaultInjection& 
   KJ_REQUIRE(method.answersErrors(), "no error can be answered", method.name);
   auto results = context.getResults().initAs<capnp::DynamicStruct>(method.results);
   codec::encode(results.init("error").as<capnp::DynamicStruct>().as<wire::Error>(),
-                *NSError::errorWithDomain(fault.errorDomain, fault.errorCode,
-                                          {{NSLocalizedDescriptionKey,
-                                            "A fault that was asked for: " + fault.method + "."}}));
+                *injectedError(fault));
   return kj::READY_NOW;
 }
 

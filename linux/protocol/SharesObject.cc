@@ -14,21 +14,31 @@ constexpr auto encodeShare = [](auto results, const CKSharePtr& share, const NSE
   codec::setError(results, error);
 };
 
+// Cancels a call that ends before it was answered.
+struct GivingUp {
+  std::shared_ptr<NSProgress> progress;  // null: it was answered
+
+  ~GivingUp() {
+    if (progress) progress->cancel();
+  }
+};
+
 }  // namespace
 
 template <class Context, class Start, class Encode>
 kj::Promise<void> SharesObject::answerUnlessGivenUp(Context context, Start start, Encode encode) {
   context.allowCancellation();
   // What was given up before it came here ends before it is started.
-  return kj::evalLater(
-      [this, context, start = std::move(start), encode = std::move(encode)]() mutable {
-        std::shared_ptr<NSProgress> progress;
-        auto answered = answer(
-            _service, context,
-            [&](auto reply) { progress = start(shares(), context.getParams(), std::move(reply)); },
-            std::move(encode));
-        return answered.attach(kj::defer([progress = std::move(progress)] { progress->cancel(); }));
-      });
+  return kj::evalLater([this, context, start = std::move(start),
+                        encode = std::move(encode)]() mutable {
+    auto givingUp = kj::heap<GivingUp>();
+    GivingUp& call = *givingUp;
+    auto answered = answer(
+        _service, context,
+        [&](auto reply) { call.progress = start(shares(), context.getParams(), std::move(reply)); },
+        std::move(encode));
+    return answered.then([&call] { call.progress = nullptr; }).attach(kj::mv(givingUp));
+  });
 }
 
 kj::Promise<void> SharesObject::copyShare(CopyShareContext context) {

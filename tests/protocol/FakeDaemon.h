@@ -13,6 +13,7 @@
 #include "linux/protocol/LinkBreaking.h"
 #include "linux/protocol/LocalDaemon.h"
 #include "tests/protocol/FakeFiles.h"
+#include "tests/protocol/FakeShares.h"
 
 namespace skein {
 
@@ -55,7 +56,9 @@ class FakeSender final : public VLItemNotificationSender, public LinkBreaking {
 class FakeDaemon final : public LocalDaemon {
  public:
   FakeFiles fakeFiles;
+  FakeShares fakeShares;
   LocalFiles& files() override { return fakeFiles; }
+  LocalShares& shares() override { return fakeShares; }
 
   // What is answered; set it before asking.
   VLQueryItems items;
