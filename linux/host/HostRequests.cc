@@ -23,46 +23,15 @@ class ListingStream final : public HostListing {
   const std::shared_ptr<Listing> _listing;
 };
 
-// For calls that go straight to vald: its answer, or the connection's error.
-template <class... Values>
-std::function<void(NSErrorPtr)> failing(const std::shared_ptr<TimedReply<Values...>>& timed) {
-  return [timed](NSErrorPtr error) { (*timed)(Values()..., std::move(error)); };
-}
-
 }  // namespace
 
-HostRequests::HostRequests(std::shared_ptr<FileProviderHost> host, DaemonProxies daemon,
-                           VLContainers& containers, Log& log)
-    : _host(std::move(host)),
-      _daemon(std::move(daemon)),
-      _paths(_host->extension(), containers),
+HostRequests::HostRequests(std::shared_ptr<DriveRequests> drive, std::unique_ptr<HostFiles> files,
+                           Log& log)
+    : _drive(std::move(drive)),
+      _files(std::move(files)),
+      _host(_drive->sharedHost()),
+      _daemon(_drive->daemon()),
       _log(log) {}
-
-template <class... Values, class Work>
-void HostRequests::withDrive(std::type_identity_t<Reply<Values..., NSErrorPtr>> reply, Work work) {
-  auto timed = TimedReply<Values...>::begin(_host->tools(), std::move(reply));
-  if (_driveIsKnown) {
-    _host->tools().executor->post(
-        [timed, work = std::move(work)]() mutable { work(std::move(timed)); });
-    return;
-  }
-  _daemon(failing(timed))
-      ->containers([self = shared_from_this(), timed, work = std::move(work)](
-                       const std::vector<VLContainer::Properties>&, NSErrorPtr error) mutable {
-        if (error) {
-          (*timed)(Values()..., std::move(error));
-          return;
-        }
-        self->_driveIsKnown = true;
-        work(std::move(timed));
-      });
-}
-
-std::optional<NSFileProviderItemIdentifier> HostRequests::resolve(const HostTarget& target,
-                                                                  NSErrorOut error) {
-  if (target.kind == HostTarget::Kind::Identifier) return target.text;
-  return _paths.identifierForPath(target.text, error);
-}
 
 void HostRequests::list(HostTarget container, HostOrder order,
                         Reply<std::shared_ptr<HostListing>, NSErrorPtr> reply) {
@@ -70,7 +39,7 @@ void HostRequests::list(HostTarget container, HostOrder order,
       std::move(reply), [self = shared_from_this(), container = std::move(container),
                          order](Timed<std::shared_ptr<HostListing>> timed) {
         NSErrorPtr error;
-        const auto identifier = self->resolve(container, &error);
+        const auto identifier = self->_drive->resolve(container, &error);
         if (!identifier) {
           (*timed)(nullptr, error);
           return;
@@ -91,7 +60,7 @@ void HostRequests::item(HostTarget target, Reply<HostItem, NSErrorPtr> reply) {
                                          target = std::move(target)](Timed<HostItem> timed) {
     NSErrorPtr error;
     HostItem answer;
-    if (const auto identifier = self->resolve(target, &error)) {
+    if (const auto identifier = self->_drive->resolve(target, &error)) {
       NSFileProviderExtension& extension = self->_host->extension();
       answer.item = extension.itemForIdentifier(*identifier, &error);
       if (!answer.item && !error) {
@@ -103,7 +72,7 @@ void HostRequests::item(HostTarget target, Reply<HostItem, NSErrorPtr> reply) {
         if (url) answer.url = url->absoluteString();
         answer.path = target.kind == HostTarget::Kind::Path
                           ? ItemPaths::normalised(target.text, nullptr).value_or("")
-                          : self->_paths.pathForURL(url).value_or("");
+                          : self->_drive->paths().pathForURL(url).value_or("");
       }
     }
     (*timed)(std::move(answer), std::move(error));
@@ -114,7 +83,7 @@ void HostRequests::identifierForPath(std::string path, Reply<std::string, NSErro
   withDrive<std::string>(std::move(reply), [self = shared_from_this(),
                                             path = std::move(path)](Timed<std::string> timed) {
     NSErrorPtr error;
-    auto identifier = self->_paths.identifierForPath(path, &error);
+    auto identifier = self->_drive->paths().identifierForPath(path, &error);
     (*timed)(std::move(identifier).value_or(""), std::move(error));
   });
 }
@@ -124,7 +93,7 @@ void HostRequests::pathForIdentifier(std::string identifier, Reply<std::string, 
       std::move(reply),
       [self = shared_from_this(), identifier = std::move(identifier)](Timed<std::string> timed) {
         NSErrorPtr error;
-        auto path = self->_paths.pathForIdentifier(identifier, &error);
+        auto path = self->_drive->paths().pathForIdentifier(identifier, &error);
         (*timed)(std::move(path).value_or(""), std::move(error));
       });
 }
@@ -144,7 +113,7 @@ void HostRequests::watch(HostTarget container,
       },
       [self = shared_from_this(), container = std::move(container)](Timed<std::string> timed) {
         NSErrorPtr error;
-        auto identifier = self->resolve(container, &error);
+        auto identifier = self->_drive->resolve(container, &error);
         (*timed)(std::move(identifier).value_or(""), std::move(error));
       });
 }

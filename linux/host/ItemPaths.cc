@@ -66,6 +66,20 @@ std::optional<NSFileProviderItemIdentifier> ItemPaths::identifierForPath(const s
   return std::nullopt;
 }
 
+NSURLPtr ItemPaths::urlForPath(const std::string& path, NSErrorOut error) const {
+  const auto wanted = normalised(path, error);
+  if (!wanted) return nullptr;
+  if (const auto elsewhere = pathInContainer(*wanted)) return NSURL::fileURLWithPath(*elsewhere);
+  const NSURLPtr root =
+      _extension.URLForItemWithPersistentIdentifier(NSFileProviderRootContainerItemIdentifier);
+  if (!root) {
+    error.store(errorForMissing(*wanted));
+    return nullptr;
+  }
+  if (*wanted == "/") return root;
+  return NSURL::fileURLWithPath((root->path() == "/" ? "" : root->path()) + *wanted);
+}
+
 std::optional<std::string> ItemPaths::pathInContainer(const std::string& path) const {
   for (const auto& [containerID, container] : _containers.allContainersByContainerID()) {
     if (isOwnContainer(containerID) || !container->documentsURL()) continue;

@@ -25,6 +25,8 @@ class ItemPaths {
   // Nil with an error that says why: no such item, nobody logged in, vald unreachable.
   std::optional<NSFileProviderItemIdentifier> identifierForPath(const std::string& path,
                                                                 NSErrorOut error) const;
+  // Where the path lies, whether or not something is there; null with an error as above.
+  NSURLPtr urlForPath(const std::string& path, NSErrorOut error) const;
   // Nil for a URL outside the drive, and for null.
   std::optional<std::string> pathForURL(const NSURLPtr& url) const;
   // Nil with an error as above.

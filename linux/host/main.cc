@@ -18,6 +18,7 @@
 #include "base/ThreadPool.h"
 #include "extension/VLFileProviderExtension.h"
 #include "linux/framework/LocalFramework.h"
+#include "linux/host/HostFileRequests.h"
 #include "linux/host/HostRequests.h"
 #include "linux/host/LocalListeners.h"
 #include "linux/host/NSExtensionMain.h"
@@ -219,7 +220,9 @@ int serve(const Arguments& arguments, const DrivePaths& paths, const FileDescrip
   }
   host->setExtension(std::move(extension));
 
-  const auto requests = std::make_shared<HostRequests>(host, daemon, framework.containers(), *log);
+  const auto drive = std::make_shared<DriveRequests>(host, daemon, framework.containers());
+  const auto requests =
+      std::make_shared<HostRequests>(drive, std::make_unique<HostFileRequests>(drive), *log);
   const auto services = std::make_shared<ServiceRequests>(
       host, [requests](HostTarget target, Reply<HostItem, NSErrorPtr> reply) {
         requests->item(std::move(target), std::move(reply));

@@ -20,8 +20,8 @@ struct HostTransferStep {
   bool finished = false;
   HostItem item;
 };
-// A step when there is something new, at most every 100 ms. Letting go cancels the transfer
-// and waits for nothing; nothing of it is left.
+// A step when there is something new, at most every 100 ms, and the last one at once. Letting
+// go cancels the transfer and waits for nothing; nothing of it is left.
 using HostTransfer = HostStream<HostTransferStep>;
 using HostTrash = HostStream<std::vector<HostTrashedItem>, bool>;  // a page; whether it is the last
 
@@ -47,8 +47,8 @@ class HostFiles {
                               Reply<std::shared_ptr<HostTransfer>, NSErrorPtr> reply) = 0;
   virtual void createDirectory(std::string name, HostTarget parent, RequestOrigin origin,
                                ItemReply reply) = 0;
-  // A reference to a path of the drive, or to an absolute one outside it.
-  virtual void makeAlias(std::string target, std::string name, HostTarget parent,
+  // A reference to an item of the drive; `outside`: to an absolute path of this machine.
+  virtual void makeAlias(HostTarget target, bool outside, std::string name, HostTarget parent,
                          RequestOrigin origin, ItemReply reply) = 0;
   virtual void rename(HostTarget target, std::string newName, RequestOrigin origin,
                       ItemReply reply) = 0;
@@ -67,10 +67,11 @@ class HostFiles {
                                ItemReply reply) = 0;
   virtual void setLastUsedDate(HostTarget target, std::optional<NSDate> date, ItemReply reply) = 0;
 
-  // The folder where an app's documents go; nil: the drive's Documents.
+  // The folder where an app's documents go; nil: the drive's Documents, made if need be.
   virtual void defaultContainer(std::optional<std::string> bundleIdentifier, ItemReply reply) = 0;
 
   // What was done at a path of the drive, or to an identifier, newest first; at most `limit`.
+  // Paths that lie in the drive begin at its root, but for the one an import came from.
   virtual void history(HostTarget target, std::uint64_t limit,
                        Reply<std::vector<FileHistoryEntry>, NSErrorPtr> reply) = 0;
 };

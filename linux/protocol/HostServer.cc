@@ -1,81 +1,15 @@
 #include "linux/protocol/HostServer.h"
 
-#include <kj/debug.h>
-
-#include <tuple>
 #include <utility>
 
-#include "base/SerialQueue.h"
-#include "linux/protocol/Answer.h"
 #include "linux/protocol/HostCodec.h"
+#include "linux/protocol/HostFilesObject.h"
+#include "linux/protocol/HostPeer.h"
 #include "linux/protocol/ServicesServer.h"
 #include "linux/protocol/SocketServer.h"
 
 namespace skein {
 namespace {
-
-// What the objects of one connection share.
-struct HostPeer {
-  // A terminal's listing has three pages under way.
-  static constexpr std::size_t kMostUnanswered = 256;
-
-  std::shared_ptr<RpcLoop> loop;
-  std::shared_ptr<Executor> executor;
-  std::shared_ptr<HostService> service;
-  std::shared_ptr<HostServices> services;
-  std::size_t unanswered = 0;  // on the loop's thread
-};
-using HostPeerPtr = std::shared_ptr<HostPeer>;
-
-// Answers the promise of a call whose start(reply) `run` takes off the loop's thread.
-template <class Context, class Run, class Start, class Encode>
-kj::Promise<void> answerThrough(Run run, const HostPeerPtr& peer, Context context, Start start,
-                                Encode encode) {
-  return answer(
-      peer, context,
-      [&run, &start](auto reply) {
-        run([start = std::move(start), reply = std::move(reply)]() mutable {
-          start(std::move(reply));
-        });
-      },
-      std::move(encode));
-}
-
-template <class Context, class Start, class Encode>
-kj::Promise<void> answerOnExecutor(const HostPeerPtr& peer, Context context, Start start,
-                                   Encode encode) {
-  return answerThrough([&](Task task) { peer->executor->post(std::move(task)); }, peer, context,
-                       std::move(start), std::move(encode));
-}
-
-// One stream of a client. Its calls reach the service one after the other, as they came, or
-// pages would change places. It is released on the executor, since its end asks the
-// extension to let go.
-template <class Stream>
-class StreamOwner {
- public:
-  StreamOwner(HostPeerPtr peer, std::shared_ptr<Stream> stream)
-      : _peer(std::move(peer)),
-        _stream(std::move(stream)),
-        _queue("host-stream", _peer->executor) {}
-  ~StreamOwner() {
-    _peer->executor->post([stream = std::move(_stream)]() mutable { stream = nullptr; });
-  }
-  StreamOwner(const StreamOwner&) = delete;
-  StreamOwner& operator=(const StreamOwner&) = delete;
-
-  template <class Context, class Encode>
-  kj::Promise<void> next(Context context, Encode encode) {
-    return answerThrough([&](Task task) { _queue.async(std::move(task)); }, _peer, context,
-                         [stream = _stream](auto reply) { stream->next(std::move(reply)); },
-                         std::move(encode));
-  }
-
- private:
-  const HostPeerPtr _peer;
-  std::shared_ptr<Stream> _stream;
-  SerialQueue _queue;
-};
 
 class ListingObject final : public wire::Listing::Server {
  public:
@@ -138,15 +72,12 @@ class CheckObject final : public wire::Check::Server {
   StreamOwner<HostCheck> _stream;
 };
 
-constexpr auto encodeError = [](auto results, const NSErrorPtr& error) {
-  codec::setError(results, error);
-};
-
 // The host, as one connection sees it. Lives on the loop's thread.
-class HostObject final : public wire::Host::Server {
+class HostObject final : public virtual wire::Host::Server, public HostFilesObject {
  public:
   explicit HostObject(HostPeerPtr peer)
-      : _peer(std::move(peer)),
+      : HostFilesObject(peer),
+        _peer(std::move(peer)),
         _services(makeServicesObject(_peer->loop, _peer->executor, _peer->services)) {}
 
   kj::Promise<void> list(ListContext context) override {

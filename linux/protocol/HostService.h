@@ -8,6 +8,7 @@
 #include <string>
 #include <vector>
 
+#include "linux/protocol/HostFiles.h"
 #include "linux/protocol/HostTypes.h"
 #include "linux/protocol/LocalDaemon.h"
 
@@ -89,6 +90,9 @@ class HostService {
   virtual void status(Reply<HostStatus, NSErrorPtr> reply) = 0;
   virtual void check(Reply<std::shared_ptr<HostCheck>, NSErrorPtr> reply) = 0;
   virtual void setDebugLog(bool enabled, Reply<NSErrorPtr> reply) = 0;
+
+  // What changes documents. Lives as long as this.
+  virtual HostFiles& files() = 0;
 };
 
 }  // namespace skein

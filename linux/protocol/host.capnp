@@ -6,18 +6,12 @@ using Cxx = import "/capnp/c++.capnp";
 $Cxx.namespace("skein::wire");
 
 using Daemon = import "daemon.capnp";
+using HostFiles = import "hostfiles.capnp";
+using HostTypes = import "hosttypes.capnp";
 using Types = import "types.capnp";
 
-struct Target {
-  isIdentifier @0 :Bool;
-  text @1 :Data;
-}
-
-struct HostItem {
-  item @0 :Types.Item;
-  path @1 :Data;
-  url @2 :Data;
-}
+using HostItem = HostTypes.HostItem;
+using Target = HostTypes.Target;
 
 struct Change {
   kind @0 :UInt8;
@@ -40,7 +34,7 @@ struct HostDifference {
   detail @2 :Data;
 }
 
-interface Host {
+interface Host extends(HostFiles.HostFiles) {
   list @0 (container :Target, order :UInt8) -> (listing :Listing, error :Types.Error);
   item @1 (target :Target) -> (item :HostItem, error :Types.Error);
   identifierForPath @2 (path :Data) -> (identifier :Data, error :Types.Error);

@@ -1,0 +1,95 @@
+#pragma once
+
+#include <atomic>
+#include <chrono>
+#include <functional>
+#include <memory>
+#include <optional>
+#include <type_traits>
+#include <utility>
+
+#include "linux/host/Deadline.h"
+#include "linux/host/FileProviderHost.h"
+#include "linux/host/ItemPaths.h"
+#include "linux/host/WorkingSetWatch.h"
+#include "linux/protocol/HostTypes.h"
+
+namespace skein {
+
+// What the requests of the command line share: the drive is known before the extension is
+// asked, targets become identifiers, and items get their places. Any thread.
+class DriveRequests final : public std::enable_shared_from_this<DriveRequests> {
+ public:
+  template <class... Values>
+  using Timed = std::shared_ptr<TimedReply<Values...>>;
+
+  // `containers` outlives it.
+  DriveRequests(std::shared_ptr<FileProviderHost> host, DaemonProxies daemon,
+                VLContainers& containers)
+      : _host(std::move(host)),
+        _daemon(std::move(daemon)),
+        _paths(_host->extension(), containers) {}
+
+  FileProviderHost& host() const { return *_host; }
+  const std::shared_ptr<FileProviderHost>& sharedHost() const { return _host; }
+  NSFileProviderExtension& extension() const { return _host->extension(); }
+  const HostTools& tools() const { return _host->tools(); }
+  const DaemonProxies& daemon() const { return _daemon; }
+  const ItemPaths& paths() const { return _paths; }
+
+  // Runs `work(timed)` on the executor. The first time it waits until vald has told where
+  // the drive is: the extension asks that once and keeps the answer, so asking it while
+  // vald cannot be reached would leave the process without a drive.
+  template <class... Values, class Work>
+  void withDrive(std::type_identity_t<Reply<Values..., NSErrorPtr>> reply, Work work) {
+    withDrive<Values...>(std::move(reply), std::move(work), tools().deadline);
+  }
+  // The same with another deadline than the usual one.
+  template <class... Values, class Work>
+  void withDrive(std::type_identity_t<Reply<Values..., NSErrorPtr>> reply, Work work,
+                 std::chrono::milliseconds deadline);
+
+  // The rest is synchronous and may ask vald.
+
+  // Nil with an error that says why.
+  std::optional<NSFileProviderItemIdentifier> resolve(const HostTarget& target,
+                                                      NSErrorOut error) const;
+  // The item with its URL and its path, each empty where that is not known.
+  HostItem place(NSFileProviderItemPtr item) const;
+
+ private:
+  const std::shared_ptr<FileProviderHost> _host;
+  const DaemonProxies _daemon;
+  const ItemPaths _paths;
+  std::atomic<bool> _driveIsKnown{false};
+};
+
+// For calls that go straight to vald: its answer, or the connection's error.
+template <class... Values>
+std::function<void(NSErrorPtr)> failing(const std::shared_ptr<TimedReply<Values...>>& timed) {
+  return [timed](NSErrorPtr error) { (*timed)(Values()..., std::move(error)); };
+}
+
+template <class... Values, class Work>
+void DriveRequests::withDrive(std::type_identity_t<Reply<Values..., NSErrorPtr>> reply, Work work,
+                              std::chrono::milliseconds deadline) {
+  HostTools timing = tools();
+  timing.deadline = deadline;
+  auto timed = TimedReply<Values...>::begin(timing, std::move(reply));
+  if (_driveIsKnown) {
+    tools().executor->post([timed, work = std::move(work)]() mutable { work(std::move(timed)); });
+    return;
+  }
+  _daemon(failing(timed))
+      ->containers([self = shared_from_this(), timed, work = std::move(work)](
+                       const std::vector<VLContainer::Properties>&, NSErrorPtr error) mutable {
+        if (error) {
+          (*timed)(Values()..., std::move(error));
+          return;
+        }
+        self->_driveIsKnown = true;
+        work(std::move(timed));
+      });
+}
+
+}  // namespace skein
