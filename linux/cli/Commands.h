@@ -6,6 +6,8 @@
 
 #include <functional>
 #include <memory>
+#include <string>
+#include <utility>
 
 #include "linux/cli/Output.h"
 #include "linux/cli/Session.h"
@@ -19,6 +21,13 @@ struct Invocation {
 
 void addListCommand(CLI::App& app, Invocation& invocation);      // ls
 void addItemCommands(CLI::App& app, Invocation& invocation);     // stat, id, path
+void addContentCommands(CLI::App& app, Invocation& invocation);  // get, cat, evict
+void addImportCommand(CLI::App& app, Invocation& invocation);    // import
+void addPlaceCommands(CLI::App& app, Invocation& invocation);    // mkdir, mv, alias, ...
+void addTrashCommands(CLI::App& app, Invocation& invocation);    // trash, restore, rm
+void addTagCommand(CLI::App& app, Invocation& invocation);       // tag
+void addMarkCommands(CLI::App& app, Invocation& invocation);     // favorite, touch-used
+void addWhyCommand(CLI::App& app, Invocation& invocation);       // why
 void addChangeCommands(CLI::App& app, Invocation& invocation);   // watch, changes
 void addAccountCommand(CLI::App& app, Invocation& invocation);   // account
 void addStatusCommands(CLI::App& app, Invocation& invocation);   // status, doctor
@@ -34,6 +43,18 @@ int withSession(const Invocation& invocation, Command command) {
   const auto session = Session::open(invocation.drive, &error);
   if (!session) return complainAbout(error);
   return command(session->host());
+}
+
+// Has the command run `run(host, options)`. The footer is shown below its options.
+template <class Options>
+void runs(CLI::App* command, Invocation& invocation, const std::string& footer,
+          std::shared_ptr<Options> options, int (*run)(HostService&, const Options&)) {
+  command->footer(footer);
+  command->callback([&invocation, options = std::move(options), run] {
+    invocation.run = [&invocation, options, run] {
+      return withSession(invocation, [&](HostService& host) { return run(host, *options); });
+    };
+  });
 }
 
 }  // namespace skein::cli

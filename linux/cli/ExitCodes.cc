@@ -1,6 +1,8 @@
 #include "linux/cli/ExitCodes.h"
 
+#include <cerrno>
 #include <cstdint>
+#include <limits>
 #include <string_view>
 
 #include "platform/cloudkit/CKError.h"
@@ -18,7 +20,11 @@ struct Meaning {
   std::string_view nextStep;
 };
 
+constexpr std::int64_t kAnyCode = std::numeric_limits<std::int64_t>::min();
+
 constexpr std::string_view kLogIn = "log in with: skein account login";
+constexpr std::string_view kPermissions = "look at the owner and the mode of it and of its folder";
+constexpr std::string_view kMoreRoom = "delete something, or get more room";
 constexpr std::string_view kTryAgain = "try again, or end the drive's processes with: skein stop";
 
 constexpr Meaning kMeanings[] = {
@@ -30,7 +36,7 @@ constexpr Meaning kMeanings[] = {
      "the token is too old, its changes are no longer kept",
      "start again with: skein changes --since initial"},
     {NSFileProviderErrorDomain, NSFileProviderErrorInsufficientQuota, kQuota,
-     "there is no room left in the account", "delete something, or get more room"},
+     "there is no room left in the account", kMoreRoom},
     {NSFileProviderErrorDomain, NSFileProviderErrorServerUnreachable, kUnreachable,
      "the server cannot be reached", "try again later"},
     {NSFileProviderErrorDomain, NSFileProviderErrorNoSuchItem, kNoSuchItem, "there is no such item",
@@ -55,10 +61,15 @@ constexpr Meaning kMeanings[] = {
      "see the share with: skein share show ITEM"},
     {VLVellumErrorDomain, VLVellumErrorUnknownShare, kFailure, "this is not shared",
      "share it with: skein share create ITEM"},
+    {NSCocoaErrorDomain, 257, kRefused, "it may not be read", kPermissions},
+    {NSCocoaErrorDomain, 513, kRefused, "it may not be changed", kPermissions},
+    {NSCocoaErrorDomain, 514, kUsage, "a file cannot have that name", "choose another name"},
+    {NSCocoaErrorDomain, 640, kQuota, "the disk is full", "free some space and try again"},
+    {NSCocoaErrorDomain, 642, kRefused, "the volume is read-only", "choose another folder"},
     {NSCocoaErrorDomain, NSFeatureUnsupportedError, kFailure, "this is not supported",
      "see what is with: skein --help"},
     {NSCocoaErrorDomain, NSUbiquitousFileNotUploadedDueToQuotaError, kQuota,
-     "there is no room left in the account", "delete something, or get more room"},
+     "there is no room left in the account", kMoreRoom},
     {NSCocoaErrorDomain, NSUbiquitousFileUbiquityServerNotAvailable, kUnreachable,
      "the server cannot be reached", "try again later"},
     {VLVellumErrorDomain, VLVellumErrorNotAuthenticated, kNotAuthenticated, "nobody is logged in",
@@ -67,11 +78,15 @@ constexpr Meaning kMeanings[] = {
      "paths begin at the drive's root, such as /Documents, and have no \".\" or \"..\""},
     {VLVellumErrorDomain, VLVellumErrorDaemonUnreachable, kUnreachable,
      "the drive's processes cannot be reached", kTryAgain},
+    {NSPOSIXErrorDomain, EACCES, kRefused, "permission denied", kPermissions},
+    {"SkeinEvictionErrorDomain", kAnyCode, kRefused, "it was not evicted",
+     "see its state with: skein stat"},
 };
 
 const Meaning* meaningOf(const NSErrorPtr& error) {
   for (const Meaning& meaning : kMeanings) {
-    if (error->domain() == meaning.domain && error->code() == meaning.code) return &meaning;
+    if (error->domain() != meaning.domain) continue;
+    if (meaning.code == error->code() || meaning.code == kAnyCode) return &meaning;
   }
   return nullptr;
 }
@@ -104,6 +119,10 @@ std::string textFor(const NSErrorPtr& error) {
   while (!cause.empty() && (cause.back() == '.' || cause.back() == ' ')) cause.pop_back();
   if (cause.empty() && meaning != nullptr) cause = meaning->cause;
   if (cause.empty()) cause = error->domain() + " " + std::to_string(error->code());
+  // What goes wrong with a file is told with the next step already.
+  const bool isComplete = cause.find("; ") != std::string::npos &&
+                          (meaning == nullptr || meaning->exitCode != kUnreachable);
+  if (isComplete) return cause;
   return cause + "; " +
          std::string(meaning != nullptr ? meaning->nextStep
                                         : "the log may say more: skein log -n 20");

@@ -16,6 +16,7 @@ enum ExitCode : int {
   kUnreachable = 5,
   kCollision = 6,
   kQuota = 7,
+  kRefused = 8,
   kInterrupted = 130,
 };
 

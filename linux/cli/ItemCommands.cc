@@ -5,19 +5,10 @@
 #include "linux/cli/Commands.h"
 #include "linux/cli/ExitCodes.h"
 #include "linux/cli/ItemText.h"
+#include "linux/cli/Items.h"
 
 namespace skein::cli {
 namespace {
-
-struct ItemOptions {
-  std::vector<std::string> targets;
-  bool json = false;
-};
-
-// What is no path is an identifier.
-HostTarget targetOf(const std::string& text) {
-  return text.starts_with('/') ? HostTarget::path(text) : HostTarget::identifier(text);
-}
 
 void writeField(Output& output, std::string_view name, std::string_view value) {
   std::string label(name);
@@ -52,13 +43,17 @@ void writeItem(Output& output, const HostItem& found) {
   writeField(output, "created", localDate(item.creationDate()));
   if (item.lastUsedDate()) writeField(output, "last used", localDate(item.lastUsedDate()));
   writeField(output, "state", stateOf(item));
+  if (const std::string tags = tagText(item); !tags.empty()) writeField(output, "tags", tags);
+  if (const auto rank = item.favoriteRank()) {
+    writeField(output, "favorite", "rank " + std::to_string(*rank));
+  }
 }
 
 int runStat(HostService& host, const ItemOptions& options) {
   Output output;
   int code = kSuccess;
   bool first = true;
-  for (const std::string& target : options.targets) {
+  for (const std::string& target : options.items) {
     const auto [found, error] =
         await<HostItem>([&](auto reply) { host.item(targetOf(target), std::move(reply)); });
     output.flush();
@@ -82,7 +77,7 @@ template <class Ask>
 int runLookups(const ItemOptions& options, Ask ask) {
   Output output;
   int code = kSuccess;
-  for (const std::string& target : options.targets) {
+  for (const std::string& target : options.items) {
     const auto [answer, error] =
         await<std::string>([&](auto reply) { ask(target, std::move(reply)); });
     if (error) {
@@ -101,7 +96,7 @@ int runLookups(const ItemOptions& options, Ask ask) {
 void addItemCommands(CLI::App& app, Invocation& invocation) {
   auto options = std::make_shared<ItemOptions>();
   auto* stat = app.add_subcommand("stat", "Show one item: identifier, URL, type, dates, state");
-  stat->add_option("ITEM", options->targets, "Paths from the drive's root, or item identifiers")
+  stat->add_option("ITEM", options->items, "Paths from the drive's root, or item identifiers")
       ->required();
   stat->add_flag("--json", options->json, "One JSON object per line");
   stat->footer("Example: skein stat /Documents/letter.txt");
@@ -112,7 +107,7 @@ void addItemCommands(CLI::App& app, Invocation& invocation) {
   });
 
   auto* id = app.add_subcommand("id", "Print the identifiers of paths");
-  id->add_option("PATH", options->targets, "Paths from the drive's root")->required();
+  id->add_option("PATH", options->items, "Paths from the drive's root")->required();
   id->footer("Example: skein id /Documents/letter.txt");
   id->callback([&invocation, options] {
     invocation.run = [&invocation, options] {
@@ -125,7 +120,7 @@ void addItemCommands(CLI::App& app, Invocation& invocation) {
   });
 
   auto* path = app.add_subcommand("path", "Print the paths of identifiers");
-  path->add_option("ID", options->targets, "Item identifiers, as skein id prints them")->required();
+  path->add_option("ID", options->items, "Item identifiers, as skein id prints them")->required();
   path->footer("Example: skein path d00000000000000ff");
   path->callback([&invocation, options] {
     invocation.run = [&invocation, options] {

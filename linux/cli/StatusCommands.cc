@@ -1,11 +1,9 @@
 // skein status, skein doctor
-#include <unistd.h>
-
-#include <chrono>
 #include <utility>
 
 #include "linux/cli/Commands.h"
 #include "linux/cli/ExitCodes.h"
+#include "linux/cli/Progress.h"
 
 namespace skein::cli {
 namespace {
@@ -123,30 +121,6 @@ int runStatus(HostService& host, bool json) {
   }
   return kSuccess;
 }
-
-// How far a long command is, for a person who waits: on a terminal, after a second.
-class Progress {
- public:
-  ~Progress() { clear(); }
-  void show(const std::string& text) {
-    using namespace std::chrono_literals;
-    if (!_terminal || std::chrono::steady_clock::now() - _begin < 1s) return;
-    write("\r\x1b[K" + text);
-    _shown = true;
-  }
-  void clear() {
-    if (std::exchange(_shown, false)) write("\r\x1b[K");
-  }
-
- private:
-  static void write(const std::string& text) {
-    [[maybe_unused]] const ssize_t written = ::write(STDERR_FILENO, text.data(), text.size());
-  }
-
-  const bool _terminal = isatty(STDERR_FILENO) == 1;
-  const std::chrono::steady_clock::time_point _begin = std::chrono::steady_clock::now();
-  bool _shown = false;
-};
 
 int runDoctor(HostService& host, bool json) {
   const auto [check, error] =

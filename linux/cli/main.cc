@@ -1,17 +1,13 @@
 // skein: the drive's command line. Reads the arguments and runs one command.
-#include <unistd.h>
-
 #include <csignal>
 #include <cstdlib>
 #include <cstring>
 
 #include "linux/cli/Commands.h"
 #include "linux/cli/ExitCodes.h"
+#include "linux/cli/Interruption.h"
 
 namespace {
-
-// Nothing is left behind: what a command began in skein-host ends with its connection.
-void interrupted(int) { _exit(skein::cli::kInterrupted); }
 
 constexpr char kFooter[] =
     R"(Paths begin at the drive's root: / is the drive's folder. Each command has its own --help.
@@ -19,13 +15,14 @@ constexpr char kFooter[] =
 Example: skein --store ~/Documents ls -l /
 
 Exit codes: 0 success, 1 failure, 2 usage, 3 no such item, 4 not authenticated,
-5 unreachable, 6 collision, 7 quota, 130 interrupted.)";
+5 unreachable, 6 collision, 7 quota or full disk, 8 refused, 130 interrupted. Of several
+items that failed, the first one's.)";
 
 }  // namespace
 
 int main(int argc, char** argv) {
   using namespace skein::cli;
-  std::signal(SIGINT, interrupted);
+  installInterruption();
   std::signal(SIGPIPE, SIG_IGN);
 
   CLI::App app("The command line of a Skein drive.", "skein");
@@ -39,6 +36,13 @@ int main(int argc, char** argv) {
   app.footer(kFooter);
   addListCommand(app, invocation);
   addItemCommands(app, invocation);
+  addContentCommands(app, invocation);
+  addImportCommand(app, invocation);
+  addPlaceCommands(app, invocation);
+  addTrashCommands(app, invocation);
+  addTagCommand(app, invocation);
+  addMarkCommands(app, invocation);
+  addWhyCommand(app, invocation);
   addChangeCommands(app, invocation);
   addAccountCommand(app, invocation);
   addStatusCommands(app, invocation);
