@@ -128,17 +128,20 @@ Drive::Drive() {
   if (mkdtemp(name.data()) == nullptr) throw std::runtime_error("mkdtemp");
   _folder = name;
   _store = _folder + "/store";
+  _home = _folder + "/home";
   for (const char* part : {"store", "run", "state", "data", "home"}) {
     std::filesystem::create_directory(_folder + '/' + part);
   }
   chmod((_folder + "/run").c_str(), 0700);
-  _environment = {"HOME=" + _folder + "/home",
+  _environment = {"HOME=" + _home,
                   "XDG_RUNTIME_DIR=" + _folder + "/run",
                   "XDG_STATE_HOME=" + _folder + "/state",
                   "XDG_DATA_HOME=" + _folder + "/data",
                   "XDG_DATA_DIRS=" + _folder + "/none",
                   "SKEIN_STORE=" + _store,
-                  "PATH=/usr/bin:/bin",
+                  "PATH=" + std::string(SKEIN_BIN_DIR) + ":/usr/bin:/bin",
+                  "TMPDIR=" + _home,
+                  "SKEIN_ALLOW_FAULTS=1",
                   "LANG=C.UTF-8"};
 }
 
@@ -160,28 +163,40 @@ std::unique_ptr<Process> Drive::start(const Arguments& arguments) const {
   return std::make_unique<Process>(std::string(SKEIN_BIN_DIR) + "/skein", arguments, _environment);
 }
 
-Result Drive::run(const Arguments& arguments) const {
+Result Drive::finish(Process& process) {
   const auto begin = Clock::now();
-  const auto process = start(arguments);
   Result result;
-  result.code = process->finish(std::chrono::seconds(60));
-  result.output = process->output;
-  result.errors = process->errors;
+  result.code = process.finish(std::chrono::seconds(60));
+  result.output = process.output;
+  result.errors = process.errors;
   result.time = std::chrono::duration_cast<std::chrono::milliseconds>(Clock::now() - begin);
   return result;
 }
 
+Result Drive::run(const Arguments& arguments) const { return finish(*start(arguments)); }
+
+Result Drive::shell(const std::string& line) const {
+  Process process("/bin/sh", {"-c", "cd \"$HOME\" && " + line}, _environment);
+  return finish(process);
+}
+
+std::string Drive::socketOf(const std::string& program) const {
+  for (const auto& entry : std::filesystem::recursive_directory_iterator(_folder + "/run")) {
+    if (entry.is_socket() && entry.path().filename() == program + ".socket") return entry.path();
+  }
+  return {};
+}
+
 // The process that listens on the socket of that name; 0 when there is none.
 pid_t Drive::processOf(const std::string& program) const {
-  for (const auto& entry : std::filesystem::recursive_directory_iterator(_folder + "/run")) {
-    if (!entry.is_socket() || entry.path().filename() != program + ".socket") continue;
-    int code = 0;
-    const FileDescriptor socket = connectToUnixSocket(entry.path(), code);
-    ucred peer{};
-    socklen_t length = sizeof peer;
-    if (socket && getsockopt(socket.get(), SOL_SOCKET, SO_PEERCRED, &peer, &length) == 0) {
-      return peer.pid;
-    }
+  const std::string path = socketOf(program);
+  if (path.empty()) return 0;
+  int code = 0;
+  const FileDescriptor socket = connectToUnixSocket(path, code);
+  ucred peer{};
+  socklen_t length = sizeof peer;
+  if (socket && getsockopt(socket.get(), SOL_SOCKET, SO_PEERCRED, &peer, &length) == 0) {
+    return peer.pid;
   }
   return 0;
 }

@@ -64,15 +64,23 @@ class Drive {
   Result run(const Arguments& arguments) const;
   std::vector<std::string> list(const std::string& path) const { return run({"ls", path}).lines(); }
   std::unique_ptr<Process> start(const Arguments& arguments) const;
+  // Runs a line of sh(1), where `skein` is this drive's, from the folder for such things.
+  Result shell(const std::string& line) const;
+  // A folder outside the store, for what a test brings in.
+  const std::string& home() const { return _home; }
   // The drive's processes; 0 when they do not run.
   pid_t daemon() const { return processOf("vald"); }
   pid_t host() const { return processOf("skein-host"); }
+  // Where vald or skein-host listens; empty when it never did.
+  std::string socketOf(const std::string& program) const;
 
  private:
+  static Result finish(Process& process);
   pid_t processOf(const std::string& program) const;
 
   std::string _folder;
   std::string _store;
+  std::string _home;
   Arguments _environment;
 };
 

@@ -1,0 +1,264 @@
+// What a person does to documents, with the real programs.
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <csignal>
+#include <filesystem>
+#include <fstream>
+#include <functional>
+#include <nlohmann/json.hpp>
+
+#include "tests/integration/Drive.h"
+
+namespace skein {
+namespace {
+
+using namespace std::chrono_literals;
+namespace fs = std::filesystem;
+using Json = nlohmann::json;
+using Lines = std::vector<std::string>;
+
+class Files : public testing::Test {
+ protected:
+  // The command's output; its failure is the test's.
+  Lines skein(const Arguments& arguments) {
+    const Result result = drive.run(arguments);
+    EXPECT_EQ(result.code, 0) << arguments.front() << ": " << result.errors;
+    return result.lines();
+  }
+  // Its exit code, and that it says why.
+  int fails(const Arguments& arguments, const std::string& reason = "skein: ") {
+    const Result result = drive.run(arguments);
+    EXPECT_NE(result.errors.find(reason), std::string::npos)
+        << arguments.front() << ": " << result.errors;
+    return result.code;
+  }
+  Json stat(const std::string& path) {
+    const Result result = drive.run({"stat", "--json", path});
+    return result.code == 0 ? Json::parse(result.output) : Json();
+  }
+  std::string id(const std::string& path) { return stat(path).value("id", ""); }
+  // For what vald does by itself some time later. Each look is a program of its own.
+  static bool comesTrue(const std::function<bool()>& condition) {
+    const auto deadline = std::chrono::steady_clock::now() + 30s;
+    while (!condition()) {
+      if (std::chrono::steady_clock::now() > deadline) return false;
+    }
+    return true;
+  }
+  bool isUploaded(const std::string& path) {
+    return comesTrue([&] { return stat(path).value("uploaded", false); });
+  }
+  // Nothing of an unfinished transfer is anywhere in the store.
+  bool hasNoParts() const {
+    for (const auto& entry : fs::recursive_directory_iterator(drive.store())) {
+      if (entry.path().string().find("skein") != std::string::npos) return false;
+    }
+    return true;
+  }
+  void writeHome(const std::string& name, const std::string& text) const {
+    std::ofstream(drive.home() + '/' + name, std::ios::binary) << text;
+  }
+  static std::string contents(const std::string& path) {
+    std::ifstream file(path, std::ios::binary);
+    return {std::istreambuf_iterator<char>(file), {}};
+  }
+
+  Drive drive;
+};
+
+TEST_F(Files, ImportBringsInFilesTreesAndStandardInput) {
+  fs::create_directories(drive.home() + "/tree/inner");
+  writeHome("tree/inner/deep.txt", "deep");
+  writeHome("one.txt", "one");
+  EXPECT_EQ(drive.shell("skein import one.txt tree/ ./tree/inner/deep.txt /").code, 0);
+  EXPECT_EQ(drive.list("/"), (Lines{"deep.txt", "one.txt", "tree"}));
+  EXPECT_EQ(contents(drive.store() + "/tree/inner/deep.txt"), "deep");
+  EXPECT_EQ(contents(drive.home() + "/one.txt"), "one");
+
+  // What fails is told, and the rest is done.
+  writeHome("two.txt", "two");
+  const Result partly = drive.shell("skein import --json one.txt nothing two.txt /");
+  EXPECT_EQ(partly.code, 6) << partly.errors;
+  ASSERT_EQ(partly.lines().size(), 3U);
+  EXPECT_EQ(Json::parse(partly.lines()[0])["exitCode"], 6);
+  EXPECT_EQ(Json::parse(partly.lines()[1])["exitCode"], 3);
+  EXPECT_EQ(Json::parse(partly.lines()[2])["path"], "/two.txt");
+  EXPECT_EQ(drive.shell("skein import one.txt /nowhere").code, 3);
+  EXPECT_EQ(drive.shell("skein import one.txt /two.txt").code, 3);
+
+  EXPECT_EQ(drive.shell("printf typed | skein import - --name typed.txt /tree").code, 0);
+  EXPECT_EQ(drive.shell("skein cat /tree/typed.txt /two.txt").output, "typedtwo");
+  EXPECT_EQ(drive.shell("skein import - / </dev/null").code, 2);
+  EXPECT_EQ(drive.shell("skein import - --name ../x / </dev/null").code, 2);
+  for (const auto& entry : fs::directory_iterator(drive.home())) {
+    EXPECT_EQ(entry.path().string().find("skein-input"), std::string::npos) << entry.path();
+  }
+}
+
+TEST_F(Files, AnInterruptedImportLeavesNothing) {
+  skein({"ls", "/"});
+  fs::create_directory(drive.home() + "/big");
+  for (int i = 0; i < 2000; ++i) writeHome("big/" + std::to_string(i), std::string(4096, 'x'));
+  const auto import = drive.start({"import", drive.home() + "/big", "/"});
+  ASSERT_TRUE(comesTrue([&] { return !hasNoParts(); }));
+  sendSignal(import->pid(), SIGINT);
+  EXPECT_EQ(import->finish(5s), 130);
+  EXPECT_TRUE(comesTrue([&] { return hasNoParts(); }));
+  EXPECT_EQ(drive.list("/"), Lines());
+  EXPECT_EQ(drive.run({"doctor"}).code, 0);
+}
+
+TEST_F(Files, EvictGivesUpWhatTheCloudHasAndGetBringsItBack) {
+  drive.write("/letter.txt", "dear");
+  const std::string identifier = id("/letter.txt");
+  const Json before = stat("/letter.txt");
+  if (!before.value("uploaded", false)) EXPECT_EQ(fails({"evict", "/letter.txt"}), 8);
+  ASSERT_TRUE(isUploaded("/letter.txt"));
+  skein({"evict", "/letter.txt"});
+  EXPECT_FALSE(fs::exists(drive.store() + "/letter.txt"));
+  const Json evicted = stat("/letter.txt");
+  EXPECT_EQ(evicted["id"], identifier);
+  EXPECT_EQ(evicted["size"], 4);
+  EXPECT_EQ(evicted["downloaded"], false);
+  EXPECT_NE(drive.run({"ls", "-l", "/"}).output.find("cloud"), std::string::npos);
+
+  EXPECT_EQ(skein({"get", "--pin", "/letter.txt"}), (Lines{drive.store() + "/letter.txt"}));
+  EXPECT_EQ(contents(drive.store() + "/letter.txt"), "dear");
+  EXPECT_EQ(id("/letter.txt"), identifier);
+  EXPECT_EQ(fails({"evict", "/letter.txt"}, "pinned"), 8);
+  skein({"evict", "--unpin", "/letter.txt"});
+  EXPECT_EQ(skein({"cat", "/letter.txt"}), (Lines{"dear"}));
+
+  const Result partly = drive.run({"get", "/nothing", "/letter.txt"});
+  EXPECT_EQ(partly.code, 3);
+  EXPECT_EQ(partly.lines(), (Lines{drive.store() + "/letter.txt"}));
+}
+
+TEST_F(Files, FoldersMovesAndAliasesGoWherePeopleExpect) {
+  drive.write("/a.txt", "a");
+  drive.write("/b.txt", "b");
+  EXPECT_EQ(fails({"mkdir", "/x/y"}), 3);
+  skein({"mkdir", "-p", "/x/y/z", "/x/y"});
+  EXPECT_EQ(fails({"mkdir", "/x"}), 6);
+  EXPECT_EQ(fails({"mkdir", "x"}), 2);
+  EXPECT_EQ(fails({"mkdir", "-p", "/a.txt/below"}), 3);
+  const std::string identifier = id("/a.txt");
+
+  skein({"mv", "/a.txt", "/c.txt"});
+  skein({"mv", "/c.txt", "/x/d.txt"});
+  skein({"mv", "/x/d.txt", "/x/y"});
+  EXPECT_EQ(id("/x/y/d.txt"), identifier);
+  skein({"mv", identifier, "/b.txt", "/x"});
+  EXPECT_EQ(drive.list("/x"), (Lines{"b.txt", "d.txt", "y"}));
+  drive.write("/b.txt", "another");
+  EXPECT_EQ(fails({"mv", "/b.txt", "/x"}), 6);
+  EXPECT_EQ(fails({"mv", "/b.txt", "/x/d.txt"}), 6);
+  EXPECT_EQ(fails({"mv", "/x/d.txt", "/b.txt", "/new"}), 3);
+  EXPECT_EQ(fails({"mv", "/gone", "/new"}), 3);
+  EXPECT_EQ(contents(drive.store() + "/x/d.txt"), "a");
+  EXPECT_NE(fails({"mv", "/x", "/x/y"}), 0);
+  EXPECT_EQ(fails({"mv", "/b.txt", "/" + std::string(256, 'n')}), 2);
+
+  skein({"alias", "/x/d.txt", "/link"});
+  skein({"alias", "--outside", "/etc", "/x"});
+  EXPECT_EQ(skein({"cat", "/link"}), (Lines{"a"}));
+  EXPECT_EQ(fs::read_symlink(drive.store() + "/x/etc"), "/etc");
+  skein({"mv", "/link", "/renamed"});
+  EXPECT_EQ(drive.list("/"), (Lines{"b.txt", "renamed", "x"}));
+  EXPECT_EQ(drive.list("/x"), (Lines{"b.txt", "d.txt", "etc", "y"}));
+  skein({"rm", "/renamed"});
+  EXPECT_EQ(contents(drive.store() + "/x/d.txt"), "a");
+  EXPECT_EQ(skein({"default-location"}), skein({"default-location"}));
+  EXPECT_EQ(drive.run({"doctor"}).code, 0);
+}
+
+TEST_F(Files, TheTrashGivesBackWhatIsNamedClearly) {
+  fs::create_directories(drive.store() + "/one");
+  fs::create_directories(drive.store() + "/two");
+  drive.write("/one/note.txt", "1");
+  drive.write("/two/note.txt", "2");
+  const std::string identifier = id("/one/note.txt");
+  skein({"trash", "/one/note.txt", "/two/note.txt"});
+  EXPECT_EQ(drive.list("/one"), Lines());
+  EXPECT_EQ(skein({"trash", "list"}).size(), 2U);
+  const Json listed = Json::parse(skein({"trash", "list", "--json"}).back());
+  EXPECT_EQ(listed["putBackPath"], "/one/note.txt");
+
+  EXPECT_EQ(fails({"restore", "note.txt"}, "/two/note.txt"), 1);
+  EXPECT_EQ(skein({"restore", "/one/note.txt"}), (Lines{"/one/note.txt"}));
+  EXPECT_EQ(id("/one/note.txt"), identifier);
+  EXPECT_EQ(fails({"restore", "/one/note.txt"}), 3);
+  EXPECT_EQ(fails({"restore", "note.txt", "--to", "/gone"}), 3);
+  // Where the name is taken by now, it comes back under another.
+  const std::string bounced = skein({"restore", "note.txt", "--to", "/one"}).at(0);
+  EXPECT_NE(bounced, "/one/note.txt");
+  EXPECT_EQ(skein({"cat", bounced}), (Lines{"2"}));
+
+  EXPECT_EQ(fails({"rm", "/one"}, "rm -r"), 1);
+  skein({"rm", "-r", "/one"});
+  EXPECT_EQ(drive.list("/"), (Lines{"two"}));
+  EXPECT_EQ(fails({"rm", "/one"}), 3);
+  EXPECT_EQ(fails({"trash", "/one", "/two"}), 3);
+  EXPECT_EQ(drive.list("/"), Lines());
+  EXPECT_EQ(drive.run({"trash"}).code, 2);
+}
+
+TEST_F(Files, MarksStayWithTheirItem) {
+  drive.write("/a.txt", "a");
+  drive.write("/b.txt", "b");
+  skein({"tag", "/a.txt", "--add", "work", "--add", "bridge"});
+  skein({"tag", "/a.txt", "/b.txt", "--add", "work", "--remove", "bridge"});
+  skein({"mv", "/a.txt", "/c.txt"});
+  EXPECT_EQ(skein({"tag", "/c.txt"}), (Lines{"work"}));
+  EXPECT_EQ(skein({"tag", "--list"}), (Lines{"     2  work"}));
+  skein({"tag", "/b.txt", "--set", "two words"});
+  EXPECT_EQ(skein({"tag", "/b.txt", "/c.txt"}), (Lines{"/b.txt: two words", "/c.txt: work"}));
+  skein({"favorite", "/c.txt", "--rank", "7"});
+  skein({"touch-used", "/c.txt", "--date", "2001-09-09T01:46:40Z"});
+  const Json marked = stat("/c.txt");
+  EXPECT_EQ(marked["tags"], Json::parse("[\"work\"]"));
+  EXPECT_EQ(marked["favoriteRank"], 7);
+  EXPECT_EQ(marked["lastUsed"], "2001-09-09T01:46:40.000000000Z");
+  EXPECT_NE(drive.run({"ls", "-l", "/"}).output.find("c.txt  *  [work]"), std::string::npos);
+
+  skein({"tag", "/b.txt", "--clear"});
+  skein({"favorite", "/c.txt", "--remove"});
+  EXPECT_FALSE(stat("/c.txt").contains("favoriteRank"));
+  EXPECT_EQ(skein({"tag", "/b.txt"}), Lines());
+  EXPECT_EQ(fails({"tag", "/gone", "--add", "x"}), 3);
+  EXPECT_EQ(fails({"touch-used", "/c.txt", "--date", "soon"}), 2);
+  EXPECT_EQ(drive.run({"tag"}).code, 2);
+}
+
+TEST_F(Files, WhyTellsWhoseRequestItWas) {
+  drive.write("/a.txt", "a");
+  skein({"mv", "/a.txt", "/b.txt"});
+  const auto trash = drive.start({"trash", "/b.txt"});
+  const std::string process = "skein trash (process " + std::to_string(trash->pid()) + ')';
+  ASSERT_EQ(trash->finish(20s), 0);
+  const Lines why = skein({"why", "/b.txt"});
+  ASSERT_GE(why.size(), 2U);
+  EXPECT_NE(why[0].find("trash"), std::string::npos) << why[0];
+  EXPECT_NE(why[0].find(process), std::string::npos) << why[0];
+  EXPECT_NE(why[1].find("/a.txt -> /b.txt"), std::string::npos) << why[1];
+  EXPECT_EQ(Json::parse(skein({"why", "--json", "/b.txt"}).at(0))["origin"], process);
+
+  drive.write("/c.txt", "c");
+  EXPECT_EQ(skein({"why", "/c.txt"}), (Lines{"no request of the drive changed it"}));
+  EXPECT_EQ(fails({"why", "/never"}), 3);
+}
+
+TEST_F(Files, EveryVerbHasAnExample) {
+  for (const char* verb :
+       {"get", "cat", "evict", "import", "mkdir", "mv", "alias", "trash", "restore", "rm", "tag",
+        "favorite", "touch-used", "default-location", "why"}) {
+    const Result help = drive.run({verb, "--help"});
+    EXPECT_EQ(help.code, 0) << verb;
+    EXPECT_NE(help.output.find("Example: skein "), std::string::npos) << verb;
+  }
+}
+
+}  // namespace
+}  // namespace skein
