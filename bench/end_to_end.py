@@ -1,13 +1,17 @@
 #!/usr/bin/env python3
 """Measures the programs end to end, each figure beside a baseline of the same run.
 
-Usage: bench/end_to_end.py [--bin DIR] [--files N] [--work DIR] [STEP...]
+Usage: bench/end_to_end.py [--bin DIR] [--files N] [--gib N] [--work DIR] [STEP...]
 
 Steps: listing   a folder of N files (100,000) by name and by date, beside find | sort; the
                  same with N/10 files; what the host's memory grows by
        latency   a change on disk until "skein watch" prints it
        unpack    20,000 files unpacked into a watched folder: each told of, none twice
        kill      vald killed during a listing, vald stopped during a command
+       import    10,000 files of 4 KiB, then one of 4 GiB (--gib), beside cp -r and a sync; what
+                 memory vald and the host took at most
+       download  an evicted document of 1 GiB beside cp and sha256sum; how fast a cancelled
+                 download ends, and what it leaves
 Without a step: all of them.
 """
 import argparse
@@ -197,7 +201,105 @@ def kill(drive: Drive, options):
         os.kill(vald, signal.SIGCONT)
 
 
-STEPS = {"listing": listing, "latency": latency, "unpack": unpack, "kill": kill}
+def peak(pid):
+    for line in open(f"/proc/{pid}/status"):
+        if line.startswith("VmHWM:"):
+            return int(line.split()[1]) / 1024
+    raise RuntimeError(f"process {pid} tells no peak memory")
+
+
+def fill(path: pathlib.Path, size: int):
+    block = os.urandom(1 << 20)
+    with open(path, "wb") as file:
+        while size > 0:
+            size -= file.write(block[:min(size, len(block))])
+
+
+def import_files(drive: Drive, options):
+    top = drive.store.parent
+    small = top / "small"
+    for number in range(10_000):
+        path = small / f"folder {number // 100}" / f"document {number}"
+        path.parent.mkdir(parents=True, exist_ok=True)
+        fill(path, 4096)
+    large = top / "large"
+    fill(large, options.gib << 30)
+    subprocess.run(["sync"], check=True)
+    status = drive.wait_until_scanned()
+    processes = {"vald": status["processID"], "skein-host": status["hostProcessID"]}
+    for source, what, rounds in ((small, "10,000 files of 4 KiB", 3),
+                                 (large, f"one file of {options.gib} GiB", 3)):
+        before = {name: peak(pid) for name, pid in processes.items()}
+        copy, took = [], []
+        for number in range(rounds):
+            target = top / f"copy {number}"
+            copy.append(seconds(lambda: subprocess.run(
+                ["sh", "-c", 'cp -r "$0" "$1" && sync -f "$1"', str(source), str(target)],
+                check=True)))
+            subprocess.run(["rm", "-r", str(target)], check=True)
+            drive.command("mkdir", f"/{source.name} {number}")
+            took.append(seconds(lambda: drive.command("import", str(source),
+                                                      f"/{source.name} {number}")))
+            drive.command("rm", "-rf", f"/{source.name} {number}")
+        grown = ", ".join(f"{name} {peak(pid):.0f} MB (+{peak(pid) - before[name]:.0f})"
+                          for name, pid in processes.items())
+        print(f"import of {what}: {min(took):.2f} s; cp -r and sync: {min(copy):.2f} s; "
+              f"ratio {min(took) / min(copy):.2f}; peak memory {grown}")
+
+
+def document(drive: Drive, path: str):
+    answer = drive.command("stat", "--json", path, stdout=subprocess.PIPE)
+    return json.loads(answer.stdout)
+
+
+def parts(folder: pathlib.Path):
+    return [path for path in folder.rglob("*") if path.name.endswith(".skein-part")]
+
+
+def download(drive: Drive, _options):
+    top = drive.store.parent
+    source = top / "movie"
+    fill(source, 1 << 30)
+    drive.command("import", str(source), "/")
+    while not document(drive, "/movie")["uploaded"]:
+        time.sleep(0.2)
+    subprocess.run(["sync"], check=True)
+    copied, synced, took = [], [], []
+    for _ in range(3):
+        copy = top / "copy"
+        for times, command in ((copied, 'cp "$0" "$1" && sha256sum "$1"'),
+                               (synced, 'cp "$0" "$1" && sync "$1" && sha256sum "$1"')):
+            times.append(seconds(lambda: subprocess.run(
+                ["sh", "-c", command, str(source), str(copy)], check=True,
+                stdout=subprocess.DEVNULL)))
+            copy.unlink()
+        drive.command("evict", "/movie")
+        took.append(seconds(lambda: drive.command("get", "/movie", stdout=subprocess.DEVNULL)))
+    print(f"download of 1 GiB: {min(took):.2f} s; cp and sha256sum: {min(copied):.2f} s, ratio "
+          f"{min(took) / min(copied):.2f}; with sync: {min(synced):.2f} s, ratio "
+          f"{min(took) / min(synced):.2f}")
+    ended, gone = [], []
+    for _ in range(5):
+        drive.command("evict", "/movie")
+        process = subprocess.Popen([drive.skein, "get", "/movie"], env=drive.environment,
+                                   stdout=subprocess.DEVNULL)
+        while not any(path.stat().st_size > 0 for path in parts(drive.store)):
+            time.sleep(0.001)
+        start = time.perf_counter()
+        process.send_signal(signal.SIGINT)
+        assert process.wait() == 130, "skein get was not interrupted"
+        ended.append(time.perf_counter() - start)
+        while parts(drive.store):
+            pass
+        gone.append(time.perf_counter() - start)
+        assert not document(drive, "/movie")["downloaded"], "the download went on"
+        drive.command("get", "/movie", stdout=subprocess.DEVNULL)
+    print(f"a cancelled download: the command ended within {max(ended) * 1000:.0f} ms, its part "
+          f"was gone within {max(gone) * 1000:.0f} ms")
+
+
+STEPS = {"listing": listing, "latency": latency, "unpack": unpack, "kill": kill,
+         "import": import_files, "download": download}
 
 
 def main():
@@ -206,6 +308,7 @@ def main():
                                      formatter_class=argparse.RawDescriptionHelpFormatter)
     parser.add_argument("--bin", type=pathlib.Path, default=top / "build/release/bin")
     parser.add_argument("--files", type=int, default=100_000)
+    parser.add_argument("--gib", type=int, default=4, help="of the large file that is imported")
     parser.add_argument("--work", help="where the drives are made")
     parser.add_argument("steps", nargs="*", choices=[*STEPS, []])
     options = parser.parse_args()
