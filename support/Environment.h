@@ -3,11 +3,13 @@
 #include <memory>
 
 #include "base/Executor.h"
+#include "platform/cloudkit/CloudKit.h"
 #include "platform/fileprovider/NSFileProviderManager.h"
 #include "platform/foundation/NSNotificationCenter.h"
 #include "platform/launchservices/LSBundleProxy.h"
 #include "platform/log/Log.h"
 #include "platform/xpc/NSXPCListener.h"
+#include "platform/quicklook/QLThumbnails.h"
 #include "support/RootURL.h"
 #include "support/VLLogSection.h"
 #include "vellum/VLAccount.h"
@@ -17,6 +19,7 @@
 #include "vellum/VLFileOperations.h"
 #include "vellum/VLResourceValues.h"
 #include "vellum/VLSharingOperations.h"
+#include "vellum/VLThumbnailTransfer.h"
 
 namespace skein {
 
@@ -39,6 +42,10 @@ struct Environment {
   VLFileOperations& fileOperations;
   VLFileManager& fileManager;
   VLOperations& operations;
+  CKContainers& cloud;
+  QLThumbnails& systemThumbnails;
+  VLRemoteUserDefaults& remoteDefaults;
+  VLDownloads& downloads;
   LSBundles& bundles;
   VLSharingOperations& sharingOperations;
   VLResourceValues& resourceValues;

@@ -5,6 +5,8 @@
 #include <optional>
 #include <string>
 
+#include "platform/foundation/NSData.h"
+#include "platform/foundation/NSSize.h"
 #include "platform/foundation/NSURL.h"
 
 namespace skein {
@@ -32,14 +34,27 @@ class VLContainer {
     std::string displayName;
     // The icon's name in the icon theme, or an absolute path.
     std::optional<std::string> icon;
+    // The icon is to be shown as the app's own, without a folder around it.
+    bool isIconUndecorated = false;
   };
 
   explicit VLContainer(Properties properties) : _properties(std::move(properties)) {}
+  virtual ~VLContainer() = default;
 
   const std::string& containerID() const { return _properties.containerID; }
   const NSURLPtr& documentsURL() const { return _properties.documentsURL; }
   const std::string& displayName() const { return _properties.displayName; }
   const std::optional<std::string>& icon() const { return _properties.icon; }
+  bool isIconUndecorated() const { return _properties.isIconUndecorated; }
+
+  // bestFittingImageDataForSize:shouldTransformToAppIcon:
+  // The icon's image that fits a size in points best, as a picture file's bytes; nil when
+  // there is none. The flag is set to whether it must be shown as an app icon. Reads files.
+  // A container as the daemon describes it has no images; the framework's own do.
+  virtual std::optional<NSData> bestFittingImageDataForSize(
+      NSSize /*size*/, bool& /*shouldTransformToAppIcon*/) const {
+    return std::nullopt;
+  }
 
  private:
   const Properties _properties;

@@ -34,4 +34,10 @@ void VLDaemon::getShareOptionsOfItemIdentifier(
   reply(0, 0, 0, std::nullopt, notOffered("sharing"));
 }
 
+void VLDaemon::resolveFileObjectIDsToContentRecordIDs(
+    const std::vector<VLFileObjectID>& /*fileObjectIDs*/,
+    Reply<std::optional<VLContentRecordIDs>, NSErrorPtr> reply) {
+  reply(std::nullopt, notOffered("lookup of the cloud's records"));
+}
+
 }  // namespace skein

@@ -12,6 +12,7 @@
 #include "platform/foundation/NSData.h"
 #include "platform/foundation/NSError.h"
 #include "platform/foundation/NSURL.h"
+#include "vellum/VLContentRecords.h"
 #include "vellum/VLFileObjectID.h"
 #include "vellum/VLQueryItem.h"
 
@@ -108,7 +109,7 @@ class VLDaemon {
       const std::string& containerID, bool recreateDocumentsIfNeeded,
       Reply<NSURLPtr, std::optional<std::string>, bool, NSErrorPtr> reply);
 
-  // The three below, as the one above, answer NSFeatureUnsupportedError here.
+  // The four below, as the one above, answer NSFeatureUnsupportedError here.
 
   // checkIfItemIsShareableWithInode:reply: whether a folder or alias may be shared; `inode`
   // is its identifier's number.
@@ -128,6 +129,13 @@ class VLDaemon {
       const NSFileProviderItemIdentifier& identifier,
       Reply<std::int64_t, std::int64_t, std::int64_t, std::optional<std::string>, NSErrorPtr>
           reply);
+
+  // resolveFileObjectIDsToContentRecordIDs:reply:
+  // The cloud's record of each document's contents. What has none is left out; nil with an
+  // error.
+  virtual void resolveFileObjectIDsToContentRecordIDs(
+      const std::vector<VLFileObjectID>& fileObjectIDs,
+      Reply<std::optional<VLContentRecordIDs>, NSErrorPtr> reply);
 };
 
 // The process's connection to vald; it is made anew when it was lost. Any thread.

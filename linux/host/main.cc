@@ -19,6 +19,7 @@
 #include "extension/VLFileProviderExtension.h"
 #include "linux/framework/LocalFramework.h"
 #include "linux/host/HostFileRequests.h"
+#include "linux/framework/UnsupportedThumbnails.h"
 #include "linux/host/HostRequests.h"
 #include "linux/host/LocalListeners.h"
 #include "linux/host/NSExtensionMain.h"
@@ -188,6 +189,8 @@ int serve(const Arguments& arguments, const DrivePaths& paths, const FileDescrip
   VLLogSections logSections(executor);
   RootURL rootURL;
   LocalListeners xpcListeners(executor);
+  UnsupportedCloud cloud;
+  UnsupportedThumbnailTransfer thumbnailTransfer;
   Environment environment{*log,
                           executor,
                           notificationCenter,
@@ -202,6 +205,10 @@ int serve(const Arguments& arguments, const DrivePaths& paths, const FileDescrip
                           framework.fileOperations(),
                           framework.fileManager(),
                           framework.operations(),
+                          cloud,
+                          thumbnailTransfer,
+                          thumbnailTransfer,
+                          thumbnailTransfer,
                           framework.bundles(),
                           framework.sharingOperations(),
                           framework.resourceValues(),

@@ -30,6 +30,9 @@ struct CKRecordID {
   friend auto operator<=>(const CKRecordID&, const CKRecordID&) = default;
 };
 
+std::string description(const CKRecordZoneID& zoneID);
+std::string description(const CKRecordID& recordID);
+
 // A record's file; `fileURL` is null when it was not fetched.
 struct CKAsset {
   NSURLPtr fileURL;
@@ -65,13 +68,21 @@ class CKOperationGroup {
   const std::string _name;
 };
 
+// How soon work is wanted; a database may do what is more urgent first.
+inline constexpr int NSQualityOfServiceUtility = 17;
+
+// Whether a transfer may wait for a better moment.
+inline constexpr int CKDiscretionaryNetworkBehaviorNonDiscretionary = 0;
+inline constexpr int CKDiscretionaryNetworkBehaviorDefault = 1;
+
 // A request for records. Filled by the caller, then given to a database, which calls the
-// blocks on threads of its own: the first once per record (it may block), the second
-// exactly once and last, also after cancel().
+// blocks on threads of its own: the first once per record that was asked for (it may block,
+// so one of them must not keep others waiting that it may need), the second exactly once and
+// last, also after cancel(). The database then lets go of both.
 class CKFetchRecordsOperation {
  public:
   struct Configuration {
-    int discretionaryNetworkBehavior = 1;
+    int discretionaryNetworkBehavior = CKDiscretionaryNetworkBehaviorDefault;
     bool automaticallyRetryNetworkFailures = true;
   };
 
@@ -82,6 +93,7 @@ class CKFetchRecordsOperation {
   int qualityOfService = 0;
   Configuration configuration;
   std::shared_ptr<CKOperationGroup> group;
+  // The record is null with an error.
   std::function<void(std::shared_ptr<const CKRecord>, const CKRecordID&, NSErrorPtr)>
       perRecordCompletionBlock;
   std::function<void(NSErrorPtr)> fetchRecordsCompletionBlock;
@@ -89,6 +101,9 @@ class CKFetchRecordsOperation {
   // Any thread, any state.
   virtual void cancel() = 0;
 };
+
+// How the log shows it: "<CKFetchRecordsOperation: 3 records>".
+std::string description(const CKFetchRecordsOperation& operation);
 
 class CKDatabase {
  public:
@@ -104,6 +119,14 @@ class CKContainer {
   virtual ~CKContainer() = default;
   virtual CKDatabase& privateCloudDatabase() = 0;
   virtual CKDatabase& sharedCloudDatabase() = 0;
+};
+
+// The container class's own method. Any thread.
+class CKContainers {
+ public:
+  virtual ~CKContainers() = default;
+  // containerWithIdentifier: never null.
+  virtual std::shared_ptr<CKContainer> containerWithIdentifier(const std::string& identifier) = 0;
 };
 
 }  // namespace skein

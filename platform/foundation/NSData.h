@@ -5,9 +5,13 @@
 #include <cstddef>
 #include <cstdint>
 #include <cstring>
+#include <optional>
 #include <span>
 #include <string_view>
+#include <utility>
 #include <vector>
+
+#include "platform/foundation/NSURL.h"
 
 namespace skein {
 
@@ -16,6 +20,10 @@ class NSData {
   NSData() = default;
   explicit NSData(std::span<const std::uint8_t> bytes) : _bytes(bytes.begin(), bytes.end()) {}
   explicit NSData(std::string_view text) : _bytes(text.begin(), text.end()) {}
+
+  // dataWithContentsOfURL: the whole file, in one piece; nil when it cannot be read, and
+  // for a null URL. Blocks.
+  static std::optional<NSData> dataWithContentsOfURL(const NSURLPtr& url);
 
   std::size_t length() const { return _bytes.size(); }
   const std::uint8_t* bytes() const { return _bytes.data(); }

@@ -117,6 +117,12 @@ class ScriptedDaemon::Proxy final : public VLDaemon {
     say("share options of " + identifier);
     _daemon.shareOptions.hold(std::move(reply), _errorHandler);
   }
+  void resolveFileObjectIDsToContentRecordIDs(
+      const std::vector<VLFileObjectID>& fileObjectIDs,
+      Reply<std::optional<VLContentRecordIDs>, NSErrorPtr> reply) override {
+    say("content records of " + description(fileObjectIDs));
+    _daemon.contentRecords.hold(std::move(reply), _errorHandler);
+  }
 
  private:
   void say(const std::string& call) { _daemon._transcript.add("daemon: " + call); }

@@ -62,6 +62,7 @@ class ScriptedDaemon final : public VLDaemonConnection {
         shareableChecks(ledger),
         sharingRefreshes(ledger),
         shareOptions(ledger),
+        contentRecords(ledger),
         _transcript(transcript),
         _ledger(ledger) {}
 
@@ -86,6 +87,7 @@ class ScriptedDaemon final : public VLDaemonConnection {
   HeldCalls<NSErrorPtr> sharingRefreshes;
   HeldCalls<std::int64_t, std::int64_t, std::int64_t, std::optional<std::string>, NSErrorPtr>
       shareOptions;
+  HeldCalls<std::optional<VLContentRecordIDs>, NSErrorPtr> contentRecords;
 
  private:
   class Proxy;

@@ -9,6 +9,7 @@
 
 #include "platform/fileprovider/NSFileProviderManager.h"
 #include "tests/support/HeldCalls.h"
+#include "tests/support/ScriptedCloud.h"
 #include "tests/support/ScriptedDaemon.h"
 #include "tests/support/ScriptedFiles.h"
 #include "tests/support/ScriptedSharing.h"
@@ -130,6 +131,8 @@ struct ScriptedFramework {
         fileOperations(transcript, ledger),
         fileManager(transcript),
         operations(transcript),
+        cloud(transcript),
+        transfer(transcript, ledger),
         bundles(transcript),
         sharing(transcript),
         resourceValues(transcript),
@@ -152,6 +155,8 @@ struct ScriptedFramework {
   ScriptedFileOperations fileOperations;
   ScriptedFileManager fileManager;
   ScriptedOperations operations;
+  ScriptedCloud cloud;
+  ScriptedThumbnailTransfer transfer;
   ScriptedBundles bundles;
   ScriptedSharing sharing;
   ScriptedResourceValues resourceValues;
