@@ -175,6 +175,25 @@ void VLFileProviderExtension::_defaultApplicationContainerForBundleIdentifier(
                                                          std::move(completionHandler));
 }
 
+// Thumbnails.
+
+std::shared_ptr<NSProgress> VLFileProviderExtension::fetchThumbnailsForItemIdentifiers(
+    const std::vector<NSFileProviderItemIdentifier>& identifiers, NSSize requestedSize,
+    ThumbnailHandler perThumbnailCompletionHandler, ErrorCompletion completionHandler) {
+  return skein::fetchThumbnailsForItemIdentifiers(thumbnailRequest(), identifiers, requestedSize,
+                                                  std::move(perThumbnailCompletionHandler),
+                                                  std::move(completionHandler));
+}
+
+std::shared_ptr<NSProgress> VLFileProviderExtension::fetchThumbnailsForItemIdentifiersWithType(
+    const std::vector<NSFileProviderItemIdentifier>& identifiers, NSSize requestedSize,
+    ThumbnailWithTypeHandler perThumbnailCompletionHandlerWithType,
+    ErrorCompletion completionHandler) {
+  return skein::fetchThumbnailsForItemIdentifiersWithType(
+      thumbnailRequest(), identifiers, requestedSize,
+      std::move(perThumbnailCompletionHandlerWithType), std::move(completionHandler));
+}
+
 // Services.
 
 NSFileProviderServiceSources VLFileProviderExtension::supportedServiceSourcesForItemIdentifier(

@@ -11,6 +11,7 @@
 #include "platform/fileprovider/NSFileProviderExtension.h"
 #include "platform/foundation/NSOperation.h"
 #include "support/Environment.h"
+#include "thumbnails/ThumbnailBatch.h"
 
 namespace skein {
 
@@ -79,6 +80,14 @@ class VLFileProviderExtension final : public NSFileProviderExtension,
   NSFileProviderServiceSources supportedServiceSourcesForItemIdentifier(
       const NSFileProviderItemIdentifier& identifier, NSErrorOut error) override;
 
+  std::shared_ptr<NSProgress> fetchThumbnailsForItemIdentifiers(
+      const std::vector<NSFileProviderItemIdentifier>& identifiers, NSSize requestedSize,
+      ThumbnailHandler perThumbnailCompletionHandler, ErrorCompletion completionHandler) override;
+  std::shared_ptr<NSProgress> fetchThumbnailsForItemIdentifiersWithType(
+      const std::vector<NSFileProviderItemIdentifier>& identifiers, NSSize requestedSize,
+      ThumbnailWithTypeHandler perThumbnailCompletionHandlerWithType,
+      ErrorCompletion completionHandler) override;
+
  private:
   explicit VLFileProviderExtension(Environment& environment);
 
@@ -89,6 +98,9 @@ class VLFileProviderExtension final : public NSFileProviderExtension,
   // The lookups and the contents, held together with this object: what an asynchronous
   // operation keeps until it has answered.
   ItemRequest request() { return {{shared_from_this(), &_identity}, _environment}; }
+  ThumbnailRequest thumbnailRequest() {
+    return {{shared_from_this(), &_identity}, _environment, _queue};
+  }
   std::shared_ptr<Contents> contents() { return {shared_from_this(), &_contents}; }
 
   Environment& _environment;

@@ -47,7 +47,7 @@ TEST_F(Lifecycle, AnAccountChangeSignalsTheRootUntilTheEnd) {
                              "NSCocoaErrorDomain 14"});
 }
 
-TEST_F(Lifecycle, ServesLookupsAndEnumeratorsAndRefusesTheRestPlainly) {
+TEST_F(Lifecycle, ServesLookupsAndEnumerators) {
   const auto extension = VLFileProviderExtension::init(attributes, env.environment);
   NSFileProviderExtension& host = *extension;
   env.framework.documents.urls[VLFileObjectID::documentWithRawID(1)] = storeURL("/a");
@@ -61,11 +61,6 @@ TEST_F(Lifecycle, ServesLookupsAndEnumeratorsAndRefusesTheRestPlainly) {
   const NSErrorPtr exists =
       NSError::errorWithDomain(NSCocoaErrorDomain, 516, {{NSURLErrorKey, storeURL("/a")}});
   EXPECT_EQ(brief(host.fileProviderErrorFromFSError(exists)), "NSFileProviderErrorDomain -1001");
-
-  NSErrorPtr refused;
-  host.fetchThumbnailsForItemIdentifiers({one}, NSSize{}, nullptr,
-                                         [&](NSErrorPtr error) { refused = std::move(error); });
-  EXPECT_EQ(brief(refused), "NSCocoaErrorDomain 3328");
 }
 
 }  // namespace
