@@ -22,6 +22,7 @@ namespace fs = std::filesystem;
 
 constexpr char kGroup[] = G_KEY_FILE_DESKTOP_GROUP;
 constexpr char kSuffix[] = ".desktop";
+constexpr char kUndecoratedKey[] = "X-Skein-Undecorated";
 // The entry's keys, and the entitlements that they stand for.
 constexpr std::array<std::pair<const char*, const char*>, 4> kEntitlementKeys = {{
     {"X-Skein-Application-Identifier", VLApplicationIdentifierEntitlement},
@@ -59,6 +60,8 @@ std::optional<InstalledApp> readEntry(const std::string& identifier, const fs::p
   app.identifier = identifier;
   app.name = localText(file.get(), G_KEY_FILE_DESKTOP_KEY_NAME).value_or("");
   app.icon = localText(file.get(), G_KEY_FILE_DESKTOP_KEY_ICON);
+  app.isIconUndecorated =
+      g_key_file_get_boolean(file.get(), kGroup, kUndecoratedKey, nullptr) != FALSE;
   app.entitlements[VLApplicationIdentifierEntitlement] = {identifier};
   for (const auto& [key, entitlement] : kEntitlementKeys) {
     const Texts values(g_key_file_get_string_list(file.get(), kGroup, key, nullptr, nullptr),
@@ -133,7 +136,8 @@ std::vector<AppContainer> appContainersInFolders(const std::vector<std::string>&
       if (!app) continue;
       for (const std::string& id : VLEntitledContainerIdentifiers(app->entitlements)) {
         if (isAppContainerID(id) && byID.size() < kMostContainers) {
-          byID.try_emplace(id, AppContainer{id, asFileName(app->name, id), app->icon});
+          byID.try_emplace(
+              id, AppContainer{id, asFileName(app->name, id), app->icon, app->isIconUndecorated});
         }
       }
     }

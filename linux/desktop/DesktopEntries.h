@@ -15,6 +15,7 @@ struct InstalledApp {
   std::string identifier;
   std::string name;                 // in the user's language
   std::optional<std::string> icon;  // a name in the icon theme, or an absolute path
+  bool isIconUndecorated = false;   // X-Skein-Undecorated=: shown without a folder around it
   // What the entry claims of the drive, by the entitlement's key:
   //   X-Skein-Application-Identifier=ID   or else the app's identifier
   //   X-Skein-Services=SkeinDocuments;...
@@ -27,7 +28,8 @@ struct InstalledApp {
 struct AppContainer {
   std::string containerID;
   std::string displayName;
-  std::optional<std::string> icon;  // as an app's
+  std::optional<std::string> icon;  // both as an app's
+  bool isIconUndecorated = false;
 
   friend bool operator==(const AppContainer&, const AppContainer&) = default;
 };

@@ -44,6 +44,7 @@ const Methods& allMethods() {
     addMethods(all, capnp::Schema::from<wire::Daemon>());
     addMethods(all, capnp::Schema::from<wire::Sender>());
     addMethods(all, capnp::Schema::from<wire::Transfer>());
+    addMethods(all, capnp::Schema::from<wire::RecordFetch>());
     return all;
   }();
   return methods;

@@ -7,6 +7,7 @@
 #include "linux/protocol/DaemonCalls.h"
 #include "linux/protocol/DaemonCodec.h"
 #include "linux/protocol/FilesProxy.h"
+#include "linux/protocol/RecordsProxy.h"
 #include "linux/protocol/SharesProxy.h"
 #include "linux/protocol/UpdateLink.h"
 
@@ -58,9 +59,11 @@ class DaemonProxy final : public LocalDaemon {
   explicit DaemonProxy(DaemonCalls calls)
       : _calls(std::move(calls)),
         _files(makeFilesProxy(_calls)),
+        _records(makeRecordsProxy(_calls)),
         _shares(makeSharesProxy(_calls)) {}
 
   LocalFiles& files() override { return *_files; }
+  LocalRecords& records() override { return *_records; }
   LocalShares& shares() override { return *_shares; }
 
   void enumerateItemsInFolder(std::optional<VLFileObjectID> folder, std::uint8_t sortOrder,
@@ -321,6 +324,7 @@ class DaemonProxy final : public LocalDaemon {
 
   const DaemonCalls _calls;
   const std::unique_ptr<LocalFiles> _files;
+  const std::unique_ptr<LocalRecords> _records;
   const std::unique_ptr<LocalShares> _shares;
 };
 

@@ -23,6 +23,7 @@ void encode(wire::Container::Builder builder, const VLContainer::Properties& con
   if (container.documentsURL) builder.setDocumentsURL(bytes(container.documentsURL->path()));
   builder.setDisplayName(bytes(container.displayName));
   if (container.icon) builder.setIcon(bytes(*container.icon));
+  builder.setIsIconUndecorated(container.isIconUndecorated);
 }
 
 VLContainer::Properties decode(wire::Container::Reader reader) {
@@ -33,6 +34,7 @@ VLContainer::Properties decode(wire::Container::Reader reader) {
   }
   container.displayName = text(reader.getDisplayName());
   if (reader.hasIcon()) container.icon = text(reader.getIcon());
+  container.isIconUndecorated = reader.getIsIconUndecorated();
   return container;
 }
 

@@ -8,6 +8,7 @@
 #include "linux/protocol/DaemonReferences.h"
 #include "linux/protocol/FilesObject.h"
 #include "linux/protocol/LinkBreaking.h"
+#include "linux/protocol/RecordsObject.h"
 #include "linux/protocol/SharesObject.h"
 #include "linux/protocol/SocketServer.h"
 #include "linux/protocol/WithFaults.h"
@@ -36,10 +37,16 @@ void encodeAll(auto list, const auto& values) {
 }
 
 // vald, as one connection sees it. Lives on the loop's thread.
-class DaemonObject : public wire::Daemon::Server, public FilesObject, public SharesObject {
+class DaemonObject : public wire::Daemon::Server,
+                     public FilesObject,
+                     public RecordsObject,
+                     public SharesObject {
  public:
   explicit DaemonObject(DaemonServicePtr service)
-      : FilesObject(service), SharesObject(service), _service(std::move(service)) {}
+      : FilesObject(service),
+        RecordsObject(service),
+        SharesObject(service),
+        _service(std::move(service)) {}
 
   kj::Promise<void> enumerateItemsInFolder(EnumerateItemsInFolderContext context) override {
     const auto params = context.getParams();

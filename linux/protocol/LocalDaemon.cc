@@ -24,4 +24,10 @@ void LocalDaemon::getShareOptionsOfItemIdentifier(
                         });
 }
 
+void LocalDaemon::resolveFileObjectIDsToContentRecordIDs(
+    const std::vector<VLFileObjectID>& fileObjectIDs,
+    Reply<std::optional<VLContentRecordIDs>, NSErrorPtr> reply) {
+  records().resolveFileObjectIDsToContentRecordIDs(fileObjectIDs, std::move(reply));
+}
+
 }  // namespace skein

@@ -11,6 +11,7 @@
 #include <vector>
 
 #include "linux/protocol/LocalFiles.h"
+#include "linux/protocol/LocalRecords.h"
 #include "linux/protocol/LocalShares.h"
 #include "vellum/VLContainer.h"
 #include "vellum/VLDaemonConnection.h"
@@ -60,7 +61,8 @@ struct IndexDifference {
 
 // "The next call of `method` answers this": for tests and trials. Reaches only the
 // owner of the socket, and only a vald that was started with fault injection allowed.
-// checkIndex, injectFault and stop have no faults.
+// checkIndex, injectFault and stop have no faults. "fetchRecords ZONE:OWNER" reaches the
+// cloud's answer of that zone alone, which a client may still cancel.
 struct FaultInjection {
   enum class Action : std::uint8_t { AnswerError, DropConnection, Delay };
   std::string method;  // as the schemas name it, such as "enumerateAllFolders" or "watchItem"
@@ -85,6 +87,8 @@ class LocalDaemon : public VLDaemon {
   // What it does to documents. Lives as long as this object; a proxy's has the same error
   // handler.
   virtual LocalFiles& files() = 0;
+  // The cloud's records, likewise.
+  virtual LocalRecords& records() = 0;
   // Its shares, likewise.
   virtual LocalShares& shares() = 0;
 
@@ -96,6 +100,10 @@ class LocalDaemon : public VLDaemon {
       const NSFileProviderItemIdentifier& identifier,
       Reply<std::int64_t, std::int64_t, std::int64_t, std::optional<std::string>, NSErrorPtr> reply)
       final;
+  // And about the cloud's records, of records().
+  void resolveFileObjectIDsToContentRecordIDs(
+      const std::vector<VLFileObjectID>& fileObjectIDs,
+      Reply<std::optional<VLContentRecordIDs>, NSErrorPtr> reply) final;
 
   // Null URL and an error for an identifier that names nothing.
   virtual void URLForFileObjectID(VLFileObjectID fileObjectID,

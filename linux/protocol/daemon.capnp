@@ -7,6 +7,7 @@ $Cxx.namespace("skein::wire");
 
 using Types = import "types.capnp";
 using Files = import "files.capnp";
+using Records = import "records.capnp";
 using Shares = import "shares.capnp";
 
 struct Account {
@@ -19,6 +20,7 @@ struct Container {
   documentsURL @1 :Data;
   displayName @2 :Data;
   icon @3 :Data;
+  isIconUndecorated @4 :Bool;
 }
 
 struct Status {
@@ -57,7 +59,7 @@ struct Fault {
   times @5 :UInt32;
 }
 
-interface Daemon extends(Files.Files, Shares.Shares) {
+interface Daemon extends(Files.Files, Records.Records, Shares.Shares) {
   enumerateItemsInFolder @0 (folder :Types.ObjectID, sortOrder :UInt8, offset :UInt64,
                              limit :UInt64)
       -> (items :List(Types.Item), nextOffset :UInt64, error :Types.Error);

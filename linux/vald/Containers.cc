@@ -90,6 +90,7 @@ std::vector<VLContainer::Properties> Containers::list() const {
     if (known.documents) container.documentsURL = NSURL::fileURLWithPath(*known.documents);
     container.displayName = std::move(known.app.displayName);
     container.icon = std::move(known.app.icon);
+    container.isIconUndecorated = known.app.isIconUndecorated;
     containers.push_back(std::move(container));
   }
   return containers;

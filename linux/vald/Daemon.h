@@ -27,6 +27,7 @@ struct DaemonParts {
   Containers& containers;
   EventSubscribers& subscribers;
   LocalFiles& files;
+  LocalRecords& records;
   LocalShares& shares;
   FaultInjector& faults;
   Log& log;
@@ -45,6 +46,7 @@ class Daemon final : public LocalDaemon, public std::enable_shared_from_this<Dae
   explicit Daemon(DaemonParts parts);
 
   LocalFiles& files() override { return _parts.files; }
+  LocalRecords& records() override { return _parts.records; }
   LocalShares& shares() override { return _parts.shares; }
 
   void enumerateItemsInFolder(std::optional<VLFileObjectID> folder, std::uint8_t sortOrder,

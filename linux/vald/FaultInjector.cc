@@ -18,7 +18,14 @@ NSErrorPtr refused(std::string text) {
                                   {{NSLocalizedDescriptionKey, std::move(text)}});
 }
 
+// A zone's fetch is the cloud's to answer: it knows no connection.
+constexpr std::string_view kFetchOfZone = "fetchRecords ";
+
 NSErrorPtr checkMethod(const FaultInjection& fault) {
+  if (fault.method.starts_with(kFetchOfZone)) {
+    if (fault.action != FaultInjection::Action::DropConnection) return nullptr;
+    return refused("A zone's fetch answers an error or is delayed; it has no connection.");
+  }
   const std::vector<FaultableMethod> methods = faultableMethods();
   const auto found = std::find_if(methods.begin(), methods.end(),
                                   [&](const auto& method) { return method.name == fault.method; });

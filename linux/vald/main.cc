@@ -33,6 +33,7 @@
 #include "linux/vald/ItemUpdateSenders.h"
 #include "linux/vald/RunLock.h"
 #include "linux/vald/Store.h"
+#include "linux/vald/cloud/RecordFetches.h"
 #include "linux/vald/shares/Shares.h"
 #include "linux/vald/shares/SharingStore.h"
 
@@ -127,9 +128,12 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
     kill(getpid(), SIGTERM);
   };
   const auto faults = std::make_shared<FaultInjector>(mayFail);
+  SystemCloudClock clock;
+  RecordFetches records(
+      {executor, drive->cloud().records(), drive->cloud().conditions(), clock, *faults});
   auto daemon = std::make_shared<Daemon>(DaemonParts{
       executor, slowExecutor, store, senders, accounts, containers, subscribers, drive->files(),
-      *shares, *faults, log, paths.store, stop,
+      records, *shares, *faults, log, paths.store, stop,
       [&drive](const std::vector<StoreRoot>& roots) { drive->containersWillChange(roots); }});
   listener.setAfterChange([weak = std::weak_ptr<Daemon>(daemon)] {
     if (const auto changed = weak.lock()) changed->refreshDriveFolders();

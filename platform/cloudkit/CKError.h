@@ -12,6 +12,7 @@ inline constexpr std::int64_t CKErrorNetworkUnavailable = 3;
 inline constexpr std::int64_t CKErrorPermissionFailure = 10;
 inline constexpr std::int64_t CKErrorUnknownItem = 11;
 inline constexpr std::int64_t CKErrorServerRecordChanged = 14;
+inline constexpr std::int64_t CKErrorOperationCancelled = 20;
 
 // A partial failure's errors, one entry of its user information for each record: the key is
 // this and the record's name.

@@ -47,6 +47,7 @@ class CKRecord {
       : _recordID(std::move(recordID)), _fields(std::move(fields)) {}
 
   const CKRecordID& recordID() const { return _recordID; }
+  const std::map<std::string, Value>& fields() const { return _fields; }
   // nullptr when the record has no such field.
   const Value* objectForKey(const std::string& key) const {
     const auto found = _fields.find(key);

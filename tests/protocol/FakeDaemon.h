@@ -14,6 +14,7 @@
 #include "linux/protocol/LocalDaemon.h"
 #include "tests/protocol/FakeFiles.h"
 #include "tests/protocol/FakeShares.h"
+#include "tests/protocol/FakeRecords.h"
 
 namespace skein {
 
@@ -59,6 +60,8 @@ class FakeDaemon final : public LocalDaemon {
   FakeShares fakeShares;
   LocalFiles& files() override { return fakeFiles; }
   LocalShares& shares() override { return fakeShares; }
+  FakeRecords fakeRecords;
+  LocalRecords& records() override { return fakeRecords; }
 
   // What is answered; set it before asking.
   VLQueryItems items;

@@ -64,6 +64,15 @@ class Receiver final : public VLItemNotificationReceiving {
   std::vector<Reply<>> replies;
 };
 
+// A cloud that has nothing and is not asked.
+class NoRecords final : public LocalRecords {
+ public:
+  void resolveFileObjectIDsToContentRecordIDs(
+      const std::vector<VLFileObjectID>&,
+      Reply<std::optional<VLContentRecordIDs>, NSErrorPtr>) override {}
+  std::shared_ptr<NSProgress> fetchRecords(RecordQuery, RecordsReply) override { return nullptr; }
+};
+
 class TestDaemon {
  public:
   explicit TestDaemon(SenderLimits limits = {}, FakeStore::Settings settings = {})
@@ -81,8 +90,8 @@ class TestDaemon {
     shares = std::make_shared<Shares>(SharesParts{executor, *store, *shareRecords, sharedItems,
                                                   *accounts, *containers, log, drive.path});
     daemon = std::make_shared<Daemon>(DaemonParts{executor, executor, *store, senders, *accounts,
-                                                  *containers, subscribers, files, *shares, faults,
-                                                  log, drive.path, [this] { ++stops; }});
+                                                  *containers, subscribers, files, records, *shares,
+                                                  faults, log, drive.path, [this] { ++stops; }});
   }
 
   // Makes the call that `request(daemon, reply)` makes, and runs everything; the test
@@ -108,6 +117,7 @@ class TestDaemon {
   EventSubscribers subscribers{executor};
   FakeFiles files;
   FaultInjector faults{true};
+  NoRecords records;
   std::optional<FakeStore> store;
   std::optional<Accounts> accounts;
   std::optional<Containers> containers;

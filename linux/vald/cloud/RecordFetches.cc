@@ -1,0 +1,132 @@
+#include "linux/vald/cloud/RecordFetches.h"
+
+#include <algorithm>
+#include <chrono>
+#include <map>
+#include <utility>
+
+#include "linux/vald/cloud/CloudErrors.h"
+#include "platform/cloudkit/CKError.h"
+
+namespace skein::vald {
+namespace {
+
+NSErrorPtr cloudKitError(std::int64_t code, std::string text) {
+  return NSError::errorWithDomain(CKErrorDomain, code,
+                                  {{NSLocalizedDescriptionKey, std::move(text)}});
+}
+
+NSErrorPtr fetchCancelled() {
+  return cloudKitError(CKErrorOperationCancelled, "The records were no longer wanted.");
+}
+
+NSErrorPtr unknownItem(const CKRecordID& recordID) {
+  return cloudKitError(CKErrorUnknownItem, "The zone " + recordID.zoneID.zoneName + " of " +
+                                               recordID.zoneID.ownerName + " has no record " +
+                                               recordID.recordName + ".");
+}
+
+std::map<std::string, CKRecord::Value> fieldsOf(const CloudRecord& record,
+                                                const std::vector<std::string>& desiredKeys) {
+  std::map<std::string, CKRecord::Value> fields;
+  for (const std::string& key : desiredKeys) {
+    if (key == kVLRecordKeySize) {
+      fields.emplace(key, static_cast<std::int64_t>(record.contents.size));
+    } else if (key == kVLRecordKeyThumbnail1024x1024 && record.thumbnail) {
+      fields.emplace(
+          key, std::make_shared<const CKAsset>(CKAsset{NSURL::fileURLWithPath(*record.thumbnail)}));
+    }
+  }
+  return fields;
+}
+
+}  // namespace
+
+void RecordFetches::resolveFileObjectIDsToContentRecordIDs(
+    const std::vector<VLFileObjectID>& fileObjectIDs,
+    Reply<std::optional<VLContentRecordIDs>, NSErrorPtr> reply) {
+  _parts.executor->post([this, fileObjectIDs, reply = std::move(reply)]() mutable {
+    ++_resolutions;
+    const auto records = _parts.records.records(fileObjectIDs);
+    if (!records) {
+      reply(std::nullopt, records.error());
+      return;
+    }
+    VLContentRecordIDs recordIDs;
+    for (const CloudRecord& record : *records) {
+      recordIDs.emplace(record.document, record.recordID());
+    }
+    reply(std::move(recordIDs), nullptr);
+  });
+}
+
+std::shared_ptr<NSProgress> RecordFetches::fetchRecords(RecordQuery query, RecordsReply reply) {
+  auto progress = NSProgress::progressWithTotalUnitCount(0);
+  const auto cancellation = std::make_shared<Cancellation>();
+  progress->setCancellationHandler([cancellation] { cancellation->cancel(); });
+  _parts.executor->post(
+      [this, query = std::move(query), reply = std::move(reply), cancellation]() mutable {
+        ++_fetches;
+        auto records = fetch(query, *cancellation);
+        if (records) {
+          reply(std::move(*records), nullptr);
+        } else {
+          reply({}, records.error());
+        }
+      });
+  return progress;
+}
+
+NSErrorPtr RecordFetches::meetConditions(const CKRecordZoneID& zone, Cancellation& cancellation) {
+  if (NSErrorPtr error = _parts.conditions.admit()) return error;
+  std::chrono::milliseconds delay = _parts.conditions.settings().delay;
+  if (const auto fault =
+          _parts.faults.take("fetchRecords " + zone.zoneName + ":" + zone.ownerName)) {
+    if (fault->action == FaultInjection::Action::AnswerError) {
+      return NSError::errorWithDomain(
+          fault->errorDomain, fault->errorCode,
+          {{NSLocalizedDescriptionKey, "A fault that was asked for: " + fault->method + "."}});
+    }
+    delay += std::chrono::milliseconds(fault->delayMilliseconds);
+  }
+  if (delay.count() > 0) {
+    ScopedWait wait(*_parts.executor);
+    _parts.clock.wait(delay, cancellation);
+  }
+  return cancellation.isCancelled() ? fetchCancelled() : nullptr;
+}
+
+Outcome<std::vector<FetchedRecord>> RecordFetches::fetch(const RecordQuery& query,
+                                                         Cancellation& cancellation) {
+  if (NSErrorPtr error = meetConditions(query.zone, cancellation)) return error;
+
+  std::vector<VLFileObjectID> documents;
+  for (const std::string& name : query.recordNames) {
+    if (const auto document = VLFileObjectID::fileObjectIDWithString(name)) {
+      documents.push_back(*document);
+    }
+  }
+  auto found = _parts.records.records(documents);
+  if (!found) return found.error();
+  std::map<std::string, const CloudRecord*> byName;
+  for (const CloudRecord& record : *found) {
+    // A record's name is known in its own zone alone.
+    if (record.zone == query.zone) byName.emplace(record.recordID().recordName, &record);
+  }
+
+  std::vector<FetchedRecord> records;
+  records.reserve(query.recordNames.size());
+  for (const std::string& name : query.recordNames) {
+    FetchedRecord fetched{{name, query.zone}, nullptr, nullptr};
+    if (const auto record = byName.find(name); record != byName.end()) {
+      fetched.record = std::make_shared<const CKRecord>(
+          fetched.recordID, fieldsOf(*record->second, query.desiredKeys));
+    } else {
+      fetched.error = unknownItem(fetched.recordID);
+    }
+    records.push_back(std::move(fetched));
+  }
+  return records;
+}
+
+}  // namespace skein::vald
