@@ -20,8 +20,7 @@ class VLRemoteUserDefaults {
   virtual std::int64_t minFileSizeForThumbnailTransfer() = 0;
 };
 
-// VLStartDownloadForItemsWithOptions: the download is for a thumbnail. It gives way to
-// what somebody waits for.
+// VLStartDownloadForItemsWithOptions: the download is for a thumbnail; nobody waits for it.
 inline constexpr std::uint64_t VLStartDownloadForThumbnail = 4;
 
 class VLDownloads {

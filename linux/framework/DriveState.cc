@@ -3,12 +3,15 @@
 #include <algorithm>
 #include <utility>
 
+#include "linux/framework/LocalContainer.h"
+
 namespace skein {
 namespace {
 
 bool sameContainer(const VLContainer& a, const VLContainer& b) {
   return a.containerID() == b.containerID() && isEqualURL(a.documentsURL(), b.documentsURL()) &&
-         a.displayName() == b.displayName() && a.icon() == b.icon();
+         a.displayName() == b.displayName() && a.icon() == b.icon() &&
+         a.isIconUndecorated() == b.isIconUndecorated();
 }
 
 bool sameContainers(const VLContainersByID& a, const VLContainersByID& b) {
@@ -140,9 +143,11 @@ std::uint64_t DriveState::nextQuestion() {
 }
 
 void DriveState::setContainers(const Containers& containers, std::uint64_t number) {
+  // Loaded with each list: an app that has come may have brought folders of icons.
+  const auto icons = IconTheme::installed();
   VLContainersByID table;
   for (const VLContainer::Properties& container : containers) {
-    table.emplace(container.containerID, std::make_shared<const VLContainer>(container));
+    table.emplace(container.containerID, std::make_shared<const LocalContainer>(container, icons));
   }
   {
     MutexLock lock(_mutex);

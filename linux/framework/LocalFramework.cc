@@ -3,8 +3,12 @@
 #include <utility>
 
 #include "linux/desktop/DesktopEntries.h"
+#include "linux/desktop/InstalledThumbnailers.h"
 #include "linux/framework/LocalBundles.h"
+#include "linux/framework/LocalCloudKit.h"
+#include "linux/framework/LocalDefaults.h"
 #include "linux/framework/LocalDocuments.h"
+#include "linux/framework/LocalDownloads.h"
 #include "linux/framework/LocalFileManager.h"
 #include "linux/framework/LocalFileOperations.h"
 #include "linux/framework/LocalOperations.h"
@@ -72,6 +76,11 @@ LocalFramework::LocalFramework(std::shared_ptr<RpcLoop> loop, std::shared_ptr<Ex
       _fileOperations(std::make_unique<LocalFileOperations>(_access, _state)),
       _fileManager(std::make_unique<LocalFileManager>(_access, log)),
       _operations(std::make_unique<LocalOperations>(_access)),
+      _cloud(std::make_unique<LocalCloudKit>(_access)),
+      _systemThumbnails(
+          std::make_unique<InstalledThumbnailers>(InstalledThumbnailers::installedFolders())),
+      _remoteDefaults(std::make_unique<LocalDefaults>(LocalDefaults::userPath())),
+      _downloads(std::make_unique<LocalDownloads>(_access, log)),
       _bundles(std::make_unique<LocalBundles>(applicationFolders())),
       _sharingOperations(std::make_unique<LocalSharingOperations>(_access)),
       _resourceValues(std::make_unique<LocalResourceValues>(_access)) {

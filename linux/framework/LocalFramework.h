@@ -6,8 +6,10 @@
 #include "linux/framework/SyncCall.h"
 #include "linux/protocol/DaemonClient.h"
 #include "linux/protocol/DrivePaths.h"
+#include "platform/cloudkit/CloudKit.h"
 #include "platform/launchservices/LSBundleProxy.h"
 #include "platform/log/Log.h"
+#include "platform/quicklook/QLThumbnails.h"
 #include "vellum/VLAccount.h"
 #include "vellum/VLContainer.h"
 #include "vellum/VLDaemonConnection.h"
@@ -15,6 +17,7 @@
 #include "vellum/VLFileOperations.h"
 #include "vellum/VLResourceValues.h"
 #include "vellum/VLSharingOperations.h"
+#include "vellum/VLThumbnailTransfer.h"
 
 namespace skein {
 
@@ -45,6 +48,10 @@ class LocalFramework {
   VLFileOperations& fileOperations() { return *_fileOperations; }
   VLFileManager& fileManager() { return *_fileManager; }
   VLOperations& operations() { return *_operations; }
+  CKContainers& cloud() { return *_cloud; }
+  QLThumbnails& systemThumbnails() { return *_systemThumbnails; }
+  VLRemoteUserDefaults& remoteDefaults() { return *_remoteDefaults; }
+  VLDownloads& downloads() { return *_downloads; }
   LSBundles& bundles() { return *_bundles; }
   VLSharingOperations& sharingOperations() { return *_sharingOperations; }
   VLResourceValues& resourceValues() { return *_resourceValues; }
@@ -63,6 +70,10 @@ class LocalFramework {
   const std::unique_ptr<VLFileOperations> _fileOperations;
   const std::unique_ptr<VLFileManager> _fileManager;
   const std::unique_ptr<VLOperations> _operations;
+  const std::unique_ptr<CKContainers> _cloud;
+  const std::unique_ptr<QLThumbnails> _systemThumbnails;
+  const std::unique_ptr<VLRemoteUserDefaults> _remoteDefaults;
+  const std::unique_ptr<VLDownloads> _downloads;
   const std::unique_ptr<LSBundles> _bundles;
   const std::unique_ptr<VLSharingOperations> _sharingOperations;
   const std::unique_ptr<VLResourceValues> _resourceValues;

@@ -19,7 +19,6 @@
 #include "extension/VLFileProviderExtension.h"
 #include "linux/framework/LocalFramework.h"
 #include "linux/host/HostFileRequests.h"
-#include "linux/framework/UnsupportedThumbnails.h"
 #include "linux/host/HostRequests.h"
 #include "linux/host/LocalListeners.h"
 #include "linux/host/NSExtensionMain.h"
@@ -189,8 +188,6 @@ int serve(const Arguments& arguments, const DrivePaths& paths, const FileDescrip
   VLLogSections logSections(executor);
   RootURL rootURL;
   LocalListeners xpcListeners(executor);
-  UnsupportedCloud cloud;
-  UnsupportedThumbnailTransfer thumbnailTransfer;
   Environment environment{*log,
                           executor,
                           notificationCenter,
@@ -205,10 +202,10 @@ int serve(const Arguments& arguments, const DrivePaths& paths, const FileDescrip
                           framework.fileOperations(),
                           framework.fileManager(),
                           framework.operations(),
-                          cloud,
-                          thumbnailTransfer,
-                          thumbnailTransfer,
-                          thumbnailTransfer,
+                          framework.cloud(),
+                          framework.systemThumbnails(),
+                          framework.remoteDefaults(),
+                          framework.downloads(),
                           framework.bundles(),
                           framework.sharingOperations(),
                           framework.resourceValues(),

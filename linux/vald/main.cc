@@ -129,11 +129,11 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
   };
   const auto faults = std::make_shared<FaultInjector>(mayFail);
   SystemCloudClock clock;
-  RecordFetches records(
+  RecordFetches recordFetches(
       {executor, drive->cloud().records(), drive->cloud().conditions(), clock, *faults});
   auto daemon = std::make_shared<Daemon>(DaemonParts{
       executor, slowExecutor, store, senders, accounts, containers, subscribers, drive->files(),
-      records, *shares, *faults, log, paths.store, stop,
+      recordFetches, *shares, *faults, log, paths.store, stop,
       [&drive](const std::vector<StoreRoot>& roots) { drive->containersWillChange(roots); }});
   listener.setAfterChange([weak = std::weak_ptr<Daemon>(daemon)] {
     if (const auto changed = weak.lock()) changed->refreshDriveFolders();

@@ -88,7 +88,8 @@ TEST_F(FetchingRecords, OneEntryForEachNameWithTheKeysThatItHas) {
   add(1, 5);
   add(2, 3);
   moveTo(others, 2);
-  rig.records->setThumbnail(documentNumber(1), "/thumbnails/1");
+  const auto hash = (*rig.records->record(documentNumber(1)))->contents.hash;
+  rig.records->setThumbnail(documentNumber(1), hash, "/thumbnails/1");
   const auto answer = fetched(own, {two, one, "nonsense"});
   ASSERT_EQ(brief(answer->error), "none");
   ASSERT_EQ(answer->records.size(), 3U);
