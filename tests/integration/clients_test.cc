@@ -42,16 +42,21 @@ class Tree {
     MutexLock lock(_mutex);
     _folders.push_back(identifier);
   }
-  HostTarget document(std::mt19937& random) const { return pick(_identifiers, random); }
-  HostTarget folder(std::mt19937& random) const { return pick(_folders, random); }
+  HostTarget document(std::mt19937& random) const {
+    MutexLock lock(_mutex);
+    return pick(_identifiers, random);
+  }
+  HostTarget folder(std::mt19937& random) const {
+    MutexLock lock(_mutex);
+    return pick(_folders, random);
+  }
   std::map<std::string, std::string> documents() const {
     MutexLock lock(_mutex);
     return _documents;
   }
 
  private:
-  HostTarget pick(const std::vector<std::string>& from, std::mt19937& random) const {
-    MutexLock lock(_mutex);
+  static HostTarget pick(const std::vector<std::string>& from, std::mt19937& random) {
     if (from.empty()) return HostTarget::path("/nothing-yet");
     return HostTarget::identifier(from[random() % from.size()]);
   }
@@ -134,16 +139,19 @@ class Client {
         break;
       }
       case 4:
-        change([&](auto reply) { files.rename(document, fresh("renamed"), _origin, reply()); });
+        change([&](auto reply) {
+          files.rename(document, fresh("renamed"), _origin, std::move(reply));
+        });
         break;
       case 5:
         change([&](auto reply) {
-          files.reparent(document, _tree.folder(_random), std::nullopt, _origin, reply());
+          files.reparent(document, _tree.folder(_random), std::nullopt, _origin, std::move(reply));
         });
         break;
-      case 6: change([&](auto reply) { files.trash(document, _origin, reply()); }); break;
+      case 6: change([&](auto reply) { files.trash(document, _origin, std::move(reply)); }); break;
       case 7:
-        change([&](auto reply) { files.untrash(document, std::nullopt, _origin, reply()); });
+        change(
+            [&](auto reply) { files.untrash(document, std::nullopt, _origin, std::move(reply)); });
         break;
       case 8: {
         Answer<> removed(_tally);
@@ -152,7 +160,9 @@ class Client {
         break;
       }
       case 9:
-        change([&](auto reply) { files.setTags(document, {"tag", fresh("tag")}, reply()); });
+        change([&](auto reply) {
+          files.setTags(document, {"tag", fresh("tag")}, std::move(reply));
+        });
         break;
       case 10: {
         Answer<> evicted(_tally);
@@ -179,7 +189,7 @@ class Client {
   template <class Start>
   void change(Start start) {
     Answer<HostItem> changed(_tally);
-    start([&] { return changed.reply(); });
+    start(changed.reply());
     changed.wait();
   }
 

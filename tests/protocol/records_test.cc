@@ -84,11 +84,12 @@ TEST_F(Records, AQueryAndItsRecordsCrossAsTheyAre) {
           nullptr},
          {{"b", zone}, nullptr, NSError::errorWithDomain(CKErrorDomain, CKErrorUnknownItem)}},
         nullptr);
-  const auto [got, error] = fetched.value();
+  const auto [records, error] = fetched.value();
   EXPECT_FALSE(error);
+  const auto& got = records;
   ASSERT_EQ(got.size(), 2U);
   EXPECT_EQ(got[0].recordID, a);
-  const auto assetURL = [&](const char* key) {
+  const auto assetURL = [&got](const char* key) {
     return std::get<std::shared_ptr<const CKAsset>>(*got[0].record->objectForKey(key))->fileURL;
   };
   EXPECT_EQ(assetURL("asset")->path(), "/t/\xfe");

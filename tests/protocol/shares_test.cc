@@ -37,7 +37,7 @@ class SharesAcross : public ProtocolTest {
   SharesAcross() {
     DaemonClient::Options options;
     options.socketPath = socketPath;
-    framework = std::make_unique<LocalFramework>(clientLoop, executor, center, options);
+    framework = std::make_unique<LocalFramework>(clientLoop, executor, center, log, options);
   }
   ~SharesAcross() override { framework.reset(); }
 

@@ -17,14 +17,14 @@ struct FetchingRecords : testing::Test {
   // A document of `size` bytes with a record; uploads leave it without a thumbnail.
   void add(std::uint64_t number, std::size_t size) {
     const std::string path = rig.write(std::to_string(number), std::string(size, 'x'));
-    ASSERT_EQ(brief(rig.upload(documentNumber(number), path).error), "none");
+    ASSERT_TRUE(std::holds_alternative<UploadDone>(rig.upload(documentNumber(number), path)));
   }
   // Moves its record into another zone.
   void moveTo(const CKRecordZoneID& zone, std::uint64_t number) {
     auto record = **rig.records->record(documentNumber(number));
     record.zone = zone;
     const auto stamp = **rig.records->stamp(documentNumber(number));
-    ASSERT_TRUE(rig.records->put(record, stamp, rig.contents->hold()));
+    ASSERT_TRUE(rig.records->put(record, stamp, *rig.contents->hold(record.contents)));
   }
 
   struct Answer {
@@ -115,8 +115,9 @@ TEST_F(FetchingRecords, AZoneFailsOrIsLateByItself) {
   EXPECT_EQ(brief(fetched(own, {one})->error), "none");
   EXPECT_EQ(brief(fetched(others, {one})->error), "D 7");
   EXPECT_EQ(brief(fetched(others, {one})->error), "none");
-  EXPECT_NE(faults.plan({"fetchRecords trip:ada", FaultInjection::Action::DropConnection}),
-            nullptr);
+  EXPECT_NE(
+      faults.plan({"fetchRecords trip:ada", FaultInjection::Action::DropConnection, "", 0, 0, 1}),
+      nullptr);
 
   // A zone that is late holds up no other one, also on one thread.
   plan("trip:ada", FaultInjection::Action::Delay);
