@@ -12,7 +12,8 @@ namespace skein {
 namespace {
 
 // What one connection may have and one call may ask for.
-constexpr std::size_t kMostTransfers = 1024;
+// Each keeps a call open, and these count against what a peer may leave unanswered.
+constexpr std::size_t kMostTransfers = 256;
 constexpr std::uint64_t kLongestPage = 1000;
 
 constexpr auto encodeURL = [](auto results, const NSURLPtr& url, const NSErrorPtr& error) {

@@ -259,6 +259,29 @@ TEST_F(Transfers, ALostConnectionFailsThemOnceAndEndsThemInVald) {
   expectAnswers(0, 0);
 }
 
+TEST_F(Transfers, AClientHasOnlySoManyAndAllEndWithIt) {
+  constexpr std::size_t kMost = 256;
+  std::vector<std::shared_ptr<NSProgress>> progresses;
+  for (std::size_t at = 0; at <= kMost; ++at) progresses.push_back(import(*client));
+  ASSERT_TRUE(files().transfers.waitForCount(kMost));
+  const NSErrorPtr refusal = unreachable(imported.errors->take().value_or(nullptr));
+  EXPECT_NE(refusal->localizedDescription().find("too many transfers"), std::string::npos);
+  // Another client has its own.
+  const auto other = newClient();
+  Outcome<NSErrorPtr> downloaded;
+  const auto download = other->remoteObjectProxyWithErrorHandler(downloaded.errorHandler())
+                            ->files()
+                            .download(url("/s/a"), false, downloaded.reply());
+  ASSERT_TRUE(files().transfers.waitForCount(kMost + 1));
+  client.reset();
+  EXPECT_TRUE(files().cancellations.waitForCount(kMost));
+  EXPECT_TRUE(imported.errors->waitForCount(kMost));
+  EXPECT_EQ(files().cancellations.count(), kMost) << "the other client's goes on";
+  while (files().transfers.count() > 0) begun().reply(nullptr, nullptr);
+  EXPECT_FALSE(std::get<0>(downloaded.value()));
+  EXPECT_EQ(imported.replies->count(), 0U);
+}
+
 // --- Faults, of every object that vald serves.
 
 class PlannedFaults final : public CallFaults {

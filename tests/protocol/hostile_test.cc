@@ -2,6 +2,7 @@
 // memory, and nobody else anything.
 #include <capnp/message.h>
 #include <capnp/rpc.capnp.h>
+#include <capnp/schema.h>
 #include <capnp/serialize.h>
 #include <poll.h>
 #include <sys/socket.h>
@@ -14,6 +15,7 @@
 #include "linux/protocol/SocketServer.h"
 #include "linux/protocol/UnixSocket.h"
 #include "linux/protocol/daemon.capnp.h"
+#include "linux/protocol/files.capnp.h"
 #include "tests/protocol/ProtocolTest.h"
 
 namespace skein {
@@ -40,6 +42,18 @@ std::string listMessage(std::uint32_t question) {
   call.setInterfaceId(capnp::typeId<wire::Daemon>());
   call.setMethodId(0);
   call.initParams().getContent().initAs<wire::Daemon::EnumerateItemsInFolderParams>().setLimit(200);
+  return flat(message);
+}
+
+// A file operation of number `method`, without parameters, on the same object.
+std::string emptyFilesMessage(std::uint32_t question, std::uint16_t method) {
+  capnp::MallocMessageBuilder message;
+  auto call = message.initRoot<capnp::rpc::Message>().initCall();
+  call.setQuestionId(question);
+  call.initTarget().initPromisedAnswer().setQuestionId(0);
+  call.setInterfaceId(capnp::typeId<wire::Files>());
+  call.setMethodId(method);
+  call.initParams();
   return flat(message);
 }
 
@@ -121,6 +135,22 @@ TEST_F(Hostile, GarbageClosesItsConnectionAndNothingElse) {
     EXPECT_TRUE(closes(socket));
     expectServed();
   }
+}
+
+TEST_F(Hostile, FileOperationsWithoutWhatTheyNeedCostNothing) {
+  daemon->fakeFiles.error = vlc_errorInvalidParameter("url", "(null)");
+  const FileDescriptor socket = connectRaw();
+  std::string bytes = bootstrapMessage(0);
+  const auto methods = capnp::Schema::from<wire::Files>().getMethods().size();
+  // One more than there are: unknown to the server.
+  for (unsigned method = 0; method <= methods; ++method) {
+    bytes += emptyFilesMessage(method + 1, static_cast<std::uint16_t>(method));
+  }
+  EXPECT_EQ(sendSome(socket, bytes), bytes.size());
+  // All but the two transfers, for which nobody could be told of, reach the daemon.
+  EXPECT_TRUE(daemon->fakeFiles.asked.waitForCount(methods - 2));
+  expectServed();
+  EXPECT_EQ(daemon->fakeFiles.transfers.count(), 0U);
 }
 
 TEST_F(Hostile, HalfMessageIsWaitedForWithoutHoldingOthersUp) {
