@@ -103,11 +103,13 @@ std::unique_ptr<OperationJournal> OperationJournal::open(const std::string& data
   }
   if (code == SQLITE_OK) code = journal->run(kTables);
   if (code == SQLITE_OK) code = journal->run("PRAGMA user_version = " + std::to_string(kVersion));
+  const std::string insert =
+      std::string("INSERT INTO operation(") + (kColumns + 4) + ") VALUES(?, 0, ?, ?, ?, ?, ?, ?)";
+  if (code == SQLITE_OK) code = journal->prepare("BEGIN IMMEDIATE", journal->_beginTransaction);
+  if (code == SQLITE_OK) code = journal->prepare("COMMIT", journal->_commit);
+  if (code == SQLITE_OK) code = journal->prepare(insert, journal->_insert);
   if (code == SQLITE_OK) {
-    const std::string sql =
-        std::string("INSERT INTO operation(") + (kColumns + 4) + ") VALUES(?, 0, ?, ?, ?, ?, ?, ?)";
-    code = sqlite3_prepare_v3(database, sql.c_str(), -1, SQLITE_PREPARE_PERSISTENT,
-                              &journal->_insert, nullptr);
+    code = journal->prepare("UPDATE operation SET state = ?1 WHERE id = ?2", journal->_setState);
   }
   if (code != SQLITE_OK) return refuse(sqlite3_errmsg(database));
   return journal;
@@ -119,12 +121,25 @@ OperationJournal::OperationJournal(sqlite3* database, std::uint64_t retention, F
 OperationJournal::~OperationJournal() {
   MutexLock lock(_mutex);
   for (const End& end : _unwritten) write(end);
-  sqlite3_finalize(_insert);
+  for (sqlite3_stmt* statement : {_beginTransaction, _commit, _insert, _setState}) {
+    sqlite3_finalize(statement);
+  }
   sqlite3_close(_database);
 }
 
 int OperationJournal::run(const std::string& sql) {
   return sqlite3_exec(_database, sql.c_str(), nullptr, nullptr, nullptr);
+}
+
+int OperationJournal::run(sqlite3_stmt* statement) {
+  const int code = sqlite3_step(statement);
+  sqlite3_reset(statement);
+  return code == SQLITE_DONE ? SQLITE_OK : code;
+}
+
+int OperationJournal::prepare(const std::string& sql, sqlite3_stmt*& statement) {
+  return sqlite3_prepare_v3(_database, sql.c_str(), -1, SQLITE_PREPARE_PERSISTENT, &statement,
+                            nullptr);
 }
 
 NSErrorPtr OperationJournal::failure(const char* doing, int code) {
@@ -147,19 +162,16 @@ int OperationJournal::insert(OperationEntry& entry) {
   bindPath(_insert, 5, entry.path);
   bindPath(_insert, 6, entry.destination);
   bindPath(_insert, 7, entry.aside);
-  const int code = sqlite3_step(_insert);
-  sqlite3_reset(_insert);
-  if (code != SQLITE_DONE) return code;
+  if (const int code = run(_insert)) return code;
   entry.id = sqlite3_last_insert_rowid(_database);
   return SQLITE_OK;
 }
 
 int OperationJournal::write(const End& end) {
-  const std::string id = std::to_string(end.id);
-  return end.state
-             ? run("UPDATE operation SET state = " + std::to_string(static_cast<int>(*end.state)) +
-                   " WHERE id = " + id)
-             : run("DELETE FROM operation WHERE id = " + id);
+  if (!end.state) return run("DELETE FROM operation WHERE id = " + std::to_string(end.id));
+  sqlite3_bind_int(_setState, 1, static_cast<int>(*end.state));
+  sqlite3_bind_int64(_setState, 2, end.id);
+  return run(_setState);
 }
 
 NSErrorPtr OperationJournal::begin(OperationEntry& entry) {
@@ -168,7 +180,8 @@ NSErrorPtr OperationJournal::begin(OperationEntry& entry) {
   }
   entry.when = std::chrono::time_point_cast<NSDate::duration>(std::chrono::system_clock::now());
   MutexLock lock(_mutex);
-  int code = run("PRAGMA synchronous = FULL; BEGIN IMMEDIATE");
+  int code = run("PRAGMA synchronous = FULL");
+  if (code == SQLITE_OK) code = run(_beginTransaction);
   if (code == SQLITE_OK) {
     for (const End& end : _unwritten) {
       if (code == SQLITE_OK) code = write(end);
@@ -178,7 +191,7 @@ NSErrorPtr OperationJournal::begin(OperationEntry& entry) {
       code = run("DELETE FROM operation WHERE state <> 0 AND id <= " +
                  std::to_string(entry.id - static_cast<std::int64_t>(_retention)));
     }
-    if (code == SQLITE_OK) code = run("COMMIT");
+    if (code == SQLITE_OK) code = run(_commit);
   }
   if (code == SQLITE_OK) {
     _unwritten.clear();

@@ -87,6 +87,8 @@ class OperationJournal {
   void finish(End end);
   // 0 or SQLite's code.
   int run(const std::string& sql) SKEIN_REQUIRES(_mutex);
+  int run(sqlite3_stmt* statement) SKEIN_REQUIRES(_mutex);
+  int prepare(const std::string& sql, sqlite3_stmt*& statement) SKEIN_REQUIRES(_mutex);
   int write(const End& end) SKEIN_REQUIRES(_mutex);
   int insert(OperationEntry& entry) SKEIN_REQUIRES(_mutex);
   NSErrorPtr failure(const char* doing, int code) SKEIN_REQUIRES(_mutex);
@@ -97,7 +99,11 @@ class OperationJournal {
   const std::uint64_t _retention;
   Mutex _mutex;
   sqlite3* const _database;
+  // What every operation runs; each is parsed once.
+  sqlite3_stmt* _beginTransaction SKEIN_GUARDED_BY(_mutex) = nullptr;
+  sqlite3_stmt* _commit SKEIN_GUARDED_BY(_mutex) = nullptr;
   sqlite3_stmt* _insert SKEIN_GUARDED_BY(_mutex) = nullptr;
+  sqlite3_stmt* _setState SKEIN_GUARDED_BY(_mutex) = nullptr;
   std::set<End> _unwritten SKEIN_GUARDED_BY(_mutex);
 };
 
