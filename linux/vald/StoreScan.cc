@@ -418,7 +418,7 @@ void StoreWriter::tellAnew(VLFileObjectID id, bool withContents) {
   while (!rows.empty()) {
     ItemRow row = std::move(rows.back());
     rows.pop_back();
-    _journal.update(row, row.parent);
+    _journal.updateDetails(row);
     if (!withContents || row.folder == kNoFolder) continue;
     std::vector<ItemRow> children = _index.childrenOf(row.folder);
     rows.insert(rows.end(), std::make_move_iterator(children.begin()),

@@ -1,3 +1,5 @@
+#include <unistd.h>
+
 #include "tests/vald/SharesRig.h"
 
 namespace skein::vald {
@@ -138,6 +140,11 @@ TEST_F(SharesTest, WhatCannotBeSharedIsRefusedWithTheReason) {
   settle();
   EXPECT_FALSE(isShareable(store->itemAtPath(app, true, nullptr)->fileObjectID()));
   EXPECT_TRUE(isShareable(store->itemAtPath(app + "/Inner", true, nullptr)->fileObjectID()));
+
+  const std::string trash = ".Trash-" + std::to_string(getuid()) + "/files";
+  makeFolder(trash);
+  move("Plain", trash + "/Plain");
+  EXPECT_FALSE(isShareable(id(trash + "/Plain/Inner")));
 
   const auto refused = fresh("Private/Inner/A.txt").second;
   EXPECT_EQ(codeOf(refused), kRefused);
