@@ -114,7 +114,10 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
 
   Accounts accounts(store, loginName(), log);
   const auto shares = std::make_shared<Shares>(
-      SharesParts{executor, store, **records, sharedItems, accounts, containers, log, paths.store});
+      SharesParts{executor, store, **records, sharedItems, accounts, containers, log, paths.store,
+                  [&drive](const std::string& path, std::uint64_t document) {
+                    drive->operations().writeHint(path, document);
+                  }});
   sharingListener.setCoverageHandler([weak = std::weak_ptr(shares)](VLFileObjectID folder) {
     if (const auto changed = weak.lock()) changed->coverageDidChange(folder);
   });
@@ -130,7 +133,8 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
   const auto faults = std::make_shared<FaultInjector>(mayFail);
   SystemCloudClock clock;
   RecordFetches recordFetches(
-      {executor, drive->cloud().records(), drive->cloud().conditions(), clock, *faults});
+      {executor, drive->cloud().records(), drive->cloud().conditions(), clock, *faults,
+       [&shares](VLFileObjectID document) { return shares->attachedZoneOf(document); }});
   auto daemon = std::make_shared<Daemon>(DaemonParts{
       executor, slowExecutor, store, senders, accounts, containers, subscribers, drive->files(),
       recordFetches, *shares, *faults, log, paths.store, stop,

@@ -48,7 +48,8 @@ class SharesRig : public testing::Test {
     ASSERT_TRUE(opened) << opened.error()->localizedDescription();
     records = std::move(*opened);
     shares = std::make_shared<Shares>(
-        SharesParts{executor, *store, *records, *shared, *accounts, *containers, log, drive.path});
+        SharesParts{executor, *store, *records, *shared, *accounts, *containers, log, drive.path,
+                    [this](const std::string&, std::uint64_t document) { hinted = document; }});
     sharing->setCoverageHandler(
         [weak = std::weak_ptr(shares)](VLFileObjectID id) { weak.lock()->coverageDidChange(id); });
     ASSERT_FALSE(shares->load());
@@ -176,6 +177,7 @@ class SharesRig : public testing::Test {
   std::unique_ptr<SharingStore> store;
   std::optional<Accounts> accounts;
   std::shared_ptr<Shares> shares;
+  std::uint64_t hinted = 0;  // the document that last got a hint
 };
 
 }  // namespace skein::vald

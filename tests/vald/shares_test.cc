@@ -30,6 +30,7 @@ TEST_F(SharesTest, AShareIsMadeChangedAndRemovedAndSurvivesARestart) {
   told();
   const auto [saved, error] = save(wanted);
   ASSERT_TRUE(saved) << error->localizedDescription();
+  EXPECT_EQ(hinted, id("Notes.md").rawID());
   ASSERT_EQ(saved->participants.size(), 3U);
   EXPECT_EQ(description(saved->participants[0]),
             R"(<CKShareParticipant "me" role 1, status 2, permission 3>)");
@@ -219,8 +220,8 @@ TEST_F(SharesTest, BothOwnersHaveItems) {
   reopen();
   EXPECT_TRUE(isShared("From ann/Deep/A.txt"));
   EXPECT_FALSE(isShared("Mine.txt"));
-  EXPECT_EQ(shares->zoneOfPath(drive.path + "/From ann/Deep/A.txt")->ownerName, "ann");
-  EXPECT_EQ(shares->zoneOfPath(drive.path + "/Mine.txt")->ownerName, CKCurrentUserDefaultName);
+  EXPECT_EQ((*shares->attachedZoneOf(id("From ann/Deep/A.txt")))->ownerName, "ann");
+  EXPECT_FALSE(*shares->attachedZoneOf(id("Mine.txt")));
   const auto [zones, _] = call<std::vector<AttachedZone>, NSErrorPtr>(
       [](auto& to, auto reply) { to.attachedZones(std::move(reply)); });
   ASSERT_EQ(zones.size(), 1U);
@@ -238,7 +239,7 @@ TEST_F(SharesTest, BothOwnersHaveItems) {
 
   ASSERT_FALSE(detach("From ann"));
   EXPECT_FALSE(isShared("From ann/Deep/A.txt"));
-  EXPECT_EQ(shares->zoneOfPath(drive.path + "/From ann")->ownerName, CKCurrentUserDefaultName);
+  EXPECT_FALSE(*shares->attachedZoneOf(id("From ann")));
   EXPECT_EQ(codeOf(detach("From ann")), "VLVellumErrorDomain 15");
 }
 

@@ -84,6 +84,22 @@ TEST_F(FetchingRecords, DocumentsHaveTheirRecordInTheirOwnersZone) {
                                            {documentNumber(2), {two, others}}}));
 }
 
+TEST_F(FetchingRecords, WhatIsInAnAttachedZoneHasItsRecordThere) {
+  add(1, 5);
+  RecordFetches attached{{executor, *rig.records, rig.conditions, rig.clock, faults,
+                          [this](VLFileObjectID) { return std::optional(others); }}};
+  auto found = std::make_shared<Answer>();
+  RecordQuery query;
+  query.zone = others;
+  query.recordNames = {one};
+  attached.fetchRecords(query, [found](std::vector<FetchedRecord> records, const NSErrorPtr&) {
+    found->records = std::move(records);
+    found->came.set();
+  });
+  ASSERT_TRUE(found->came.wait());
+  EXPECT_TRUE(found->records[0].record);
+}
+
 TEST_F(FetchingRecords, OneEntryForEachNameWithTheKeysThatItHas) {
   add(1, 5);
   add(2, 3);

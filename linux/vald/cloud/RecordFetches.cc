@@ -42,12 +42,24 @@ std::map<std::string, CKRecord::Value> fieldsOf(const CloudRecord& record,
 
 }  // namespace
 
+Outcome<std::vector<CloudRecord>> RecordFetches::recordsOf(
+    const std::vector<VLFileObjectID>& documents) {
+  auto found = _parts.records.records(documents);
+  if (!found || !_parts.attachedZoneOf) return found;
+  for (CloudRecord& record : *found) {
+    const auto zone = _parts.attachedZoneOf(record.document);
+    if (!zone) return zone.error();
+    if (*zone) record.zone = **zone;
+  }
+  return found;
+}
+
 void RecordFetches::resolveFileObjectIDsToContentRecordIDs(
     const std::vector<VLFileObjectID>& fileObjectIDs,
     Reply<std::optional<VLContentRecordIDs>, NSErrorPtr> reply) {
   _parts.executor->post([this, fileObjectIDs, reply = std::move(reply)]() mutable {
     ++_resolutions;
-    const auto records = _parts.records.records(fileObjectIDs);
+    const auto records = recordsOf(fileObjectIDs);
     if (!records) {
       reply(std::nullopt, records.error());
       return;
@@ -106,7 +118,7 @@ Outcome<std::vector<FetchedRecord>> RecordFetches::fetch(const RecordQuery& quer
       documents.push_back(*document);
     }
   }
-  auto found = _parts.records.records(documents);
+  auto found = recordsOf(documents);
   if (!found) return found.error();
   std::map<std::string, const CloudRecord*> byName;
   for (const CloudRecord& record : *found) {

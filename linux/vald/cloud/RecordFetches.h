@@ -2,7 +2,10 @@
 
 #include <atomic>
 #include <cstdint>
+#include <functional>
 #include <memory>
+#include <optional>
+#include <vector>
 
 #include "base/Executor.h"
 #include "linux/protocol/CallFaults.h"
@@ -27,6 +30,9 @@ class RecordFetches final : public LocalRecords {
     CloudConditions& conditions;
     CloudClock& clock;
     CallFaults& faults;
+    // The zone of somebody else's that a document is in, whatever zone its record was put
+    // into; nil for one's own. May be empty, and may block.
+    std::function<Outcome<std::optional<CKRecordZoneID>>(VLFileObjectID)> attachedZoneOf = {};
   };
 
   explicit RecordFetches(Parts parts) : _parts(std::move(parts)) {}
@@ -41,6 +47,8 @@ class RecordFetches final : public LocalRecords {
   std::uint64_t fetches() const { return _fetches.load(); }
 
  private:
+  // Each record in the zone that its document is in at the moment.
+  Outcome<std::vector<CloudRecord>> recordsOf(const std::vector<VLFileObjectID>& documents);
   Outcome<std::vector<FetchedRecord>> fetch(const RecordQuery& query, Cancellation& cancellation);
   // What the request meets before it is answered; null: nothing.
   NSErrorPtr meetConditions(const CKRecordZoneID& zone, Cancellation& cancellation);

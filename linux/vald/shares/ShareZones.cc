@@ -5,7 +5,6 @@
 
 #include "linux/vald/Replies.h"
 #include "linux/vald/WatchScope.h"
-#include "linux/vald/cloud/CloudRecords.h"
 #include "linux/vald/shares/Shares.h"
 #include "platform/cloudkit/CKError.h"
 #include "vellum/VLErrors.h"
@@ -99,14 +98,17 @@ void Shares::attachedZones(Reply<std::vector<AttachedZone>, NSErrorPtr> reply) {
   });
 }
 
-Outcome<CKRecordZoneID> Shares::zoneOfPath(const std::string& path) {
+Outcome<std::optional<CKRecordZoneID>> Shares::attachedZoneOf(VLFileObjectID item) {
   const auto zones = _parts.records.zones();
   if (!zones) return zones.error();
+  std::optional<CKRecordZoneID> zoneOfItem;
+  const auto path = zones->empty() ? std::nullopt : _parts.store.pathForID(item, nullptr);
+  if (!path) return zoneOfItem;
   for (const ZoneRecord& zone : *zones) {
     const auto folder = _parts.store.pathForID(zone.folder, nullptr);
-    if (folder && pathIsWithin(path, *folder)) return zone.zone;
+    if (folder && pathIsWithin(*path, *folder)) zoneOfItem = zone.zone;
   }
-  return CKRecordZoneID{kDocumentsZone, CKCurrentUserDefaultName};
+  return zoneOfItem;
 }
 
 // ---- questions

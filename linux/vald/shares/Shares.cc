@@ -174,6 +174,9 @@ Outcome<ShareRecord> Shares::keep(CKShare share, const SharePlace& place) {
   share.url = record.share.url;
   record.share = shareToKeep(std::move(share), place, ownerName);
   if (NSErrorPtr error = _parts.records.put(record)) return error;
+  if (!record.item.isFolderOrAliasID() && _parts.writeHint) {
+    _parts.writeHint(place.path, record.item.rawID());
+  }
   tell(record.item, true);
   return record;
 }

@@ -1,5 +1,7 @@
 #pragma once
 
+#include <cstdint>
+#include <functional>
 #include <memory>
 #include <optional>
 #include <string>
@@ -31,6 +33,9 @@ struct SharesParts {
   Containers& containers;
   Log& log;
   std::string drive;  // the drive's folder, absolute
+  // Notes on a document's file which document it is, so that a shared one is known again when
+  // the index is lost; may be empty.
+  std::function<void(const std::string& path, std::uint64_t document)> writeHint = {};
 };
 
 // vald's shares. Calls are served one at a time, in the order in which they came, and
@@ -70,9 +75,9 @@ class Shares final : public LocalShares, public std::enable_shared_from_this<Sha
   void shareOptions(NSFileProviderItemIdentifier item,
                     Reply<ShareOptions, NSErrorPtr> reply) override;
 
-  // The zone that the item at a path is in: that of the attached folder it lies in, else
-  // one's own documents'. Any thread.
-  Outcome<CKRecordZoneID> zoneOfPath(const std::string& path);
+  // The zone of somebody else's that the item is in; nil for one's own items and for one that
+  // is gone. Any thread.
+  Outcome<std::optional<CKRecordZoneID>> attachedZoneOf(VLFileObjectID item);
 
   // A folder that was moved into or out of a shared one: has the store tell of what it holds.
   // Any thread; returns at once.
