@@ -31,7 +31,7 @@ bool isAliasFile(const ServiceItem& item) {
 // An error, a lost connection too, stands for NO.
 bool isShareable(const ServiceItem& item) {
   const auto objectID = VLFileObjectID::fileObjectIDWithString(item.itemIdentifier);
-  VLDaemonSyncProxy proxy(item.environment.daemonConnection, item.environment.executor);
+  VLDaemonSyncProxy<> proxy(item.environment.daemonConnection, item.environment.executor);
   proxy->checkIfItemIsShareableWithInode(
       objectID ? objectID->rawID() : 0,
       [answer = proxy.answer()](bool isShareable, NSErrorPtr error) {
