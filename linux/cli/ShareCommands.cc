@@ -108,16 +108,17 @@ void writeShare(Output& output, const CKShare& share, bool json) {
   if (share.url) writeField(output, "url", share.url->absoluteString());
   writeField(output, "public", nameOf(share.publicPermission));
   for (const CKShareParticipant& one : share.participants) {
-    std::string words(nameOf(one.role));
-    words += ", " + std::string(nameOf(one.permission));
+    output.write(one.role == CKShareParticipantRole::Owner ? "owner       " : "with        ");
+    output.writeName(one.name);
     if (one.role != CKShareParticipantRole::Owner) {
-      words += ", " + std::string(nameOf(one.acceptanceStatus));
+      output.write(", " + std::string(nameOf(one.permission)) + ", " +
+                   std::string(nameOf(one.acceptanceStatus)));
     }
-    writeField(output, words, one.name);
+    output.write("\n");
   }
 }
 
-// Runs `request(sharing, error)`, which answers what to print; complains about an error.
+// Runs `request(sharing, output)`, which answers an error; complains about it.
 template <class Request>
 int withSharing(ServiceSession& session, const ShareOptions& options, Request request) {
   NSErrorPtr error;

@@ -2,6 +2,15 @@
 
 namespace skein {
 
+void DriveRequests::findIdentifier(HostTarget target, Reply<std::string, NSErrorPtr> reply) {
+  withDrive<std::string>(std::move(reply), [self = shared_from_this(), target = std::move(target)](
+                                               const Timed<std::string>& timed) {
+    NSErrorPtr error;
+    auto identifier = self->resolve(target, &error);
+    (*timed)(std::move(identifier).value_or(""), std::move(error));
+  });
+}
+
 std::optional<NSFileProviderItemIdentifier> DriveRequests::resolve(const HostTarget& target,
                                                                    NSErrorOut error) const {
   if (target.kind == HostTarget::Kind::Identifier) return target.text;

@@ -49,6 +49,9 @@ class DriveRequests final : public std::enable_shared_from_this<DriveRequests> {
   void withDrive(std::type_identity_t<Reply<Values..., NSErrorPtr>> reply, Work work,
                  std::chrono::milliseconds deadline);
 
+  // The identifier of what `target` names: of a reference, not of what it refers to.
+  void findIdentifier(HostTarget target, Reply<std::string, NSErrorPtr> reply);
+
   // The rest is synchronous and may ask vald.
 
   // Nil with an error that says why.

@@ -103,18 +103,14 @@ void HostRequests::watch(HostTarget container,
   // Only finding the container is timed here: the watch times its own steps, and the first
   // listing of a large folder takes as long as it takes.
   auto shared = std::make_shared<Reply<std::shared_ptr<HostWatch>, NSErrorPtr>>(std::move(reply));
-  withDrive<std::string>(
+  _drive->findIdentifier(
+      std::move(container),
       [self = shared_from_this(), shared](const std::string& identifier, NSErrorPtr error) {
         if (error) {
           (*shared)(nullptr, std::move(error));
         } else {
-          WatchStream::begin(*self->_host, identifier, std::move(*shared));
+          WatchStream::begin(self->_drive->host(), identifier, std::move(*shared));
         }
-      },
-      [self = shared_from_this(), container = std::move(container)](Timed<std::string> timed) {
-        NSErrorPtr error;
-        auto identifier = self->_drive->resolve(container, &error);
-        (*timed)(std::move(identifier).value_or(""), std::move(error));
       });
 }
 

@@ -4,6 +4,7 @@
 
 #include "linux/host/Deadline.h"
 #include "linux/host/LocalListeners.h"
+#include "platform/fileprovider/NSFileProviderError.h"
 
 namespace skein {
 namespace {
@@ -107,18 +108,18 @@ NSErrorPtr notOffered(const std::string& serviceName, const NSFileProviderServic
 void ServiceRequests::findSources(HostTarget target,
                                   Reply<std::string, Sources, NSErrorPtr> reply) {
   auto timed = TimedReply<std::string, Sources>::begin(_host->tools(), std::move(reply));
-  _findItem(std::move(target),
-            [self = shared_from_this(), timed](const HostItem& found, const NSErrorPtr& error) {
-              if (error) {
-                (*timed)("", {}, error);
-                return;
-              }
-              const std::string identifier = found.item->itemIdentifier();
-              NSErrorPtr problem;
-              auto sources = self->_host->extension().supportedServiceSourcesForItemIdentifier(
-                  identifier, &problem);
-              (*timed)(identifier, std::move(sources), problem);
-            });
+  _findIdentifier(std::move(target), [self = shared_from_this(), timed](
+                                         const std::string& identifier, NSErrorPtr error) {
+    NSFileProviderExtension& extension = self->_host->extension();
+    Sources sources;
+    // The lookup says whether the item is there and whether anybody is logged in.
+    if (!error && extension.itemForIdentifier(identifier, &error)) {
+      sources = extension.supportedServiceSourcesForItemIdentifier(identifier, &error);
+    } else if (!error) {
+      error = fileProviderErrorForNonExistentItemWithIdentifier(identifier);
+    }
+    (*timed)(identifier, std::move(sources), std::move(error));
+  });
 }
 
 void ServiceRequests::serviceSources(HostTarget target,

@@ -18,11 +18,11 @@ namespace skein {
 class ServiceRequests final : public HostServices,
                               public std::enable_shared_from_this<ServiceRequests> {
  public:
-  // HostService's item().
-  using FindItem = std::function<void(HostTarget, Reply<HostItem, NSErrorPtr>)>;
+  // Answers the identifier that a target names; see DriveRequests.
+  using FindIdentifier = std::function<void(HostTarget, Reply<std::string, NSErrorPtr>)>;
 
-  ServiceRequests(std::shared_ptr<FileProviderHost> host, FindItem findItem)
-      : _host(std::move(host)), _findItem(std::move(findItem)) {}
+  ServiceRequests(std::shared_ptr<FileProviderHost> host, FindIdentifier findIdentifier)
+      : _host(std::move(host)), _findIdentifier(std::move(findIdentifier)) {}
 
   void serviceSources(HostTarget target,
                       Reply<std::vector<std::string>, NSErrorPtr> reply) override;
@@ -35,7 +35,7 @@ class ServiceRequests final : public HostServices,
   void findSources(HostTarget target, Reply<std::string, Sources, NSErrorPtr> reply);
 
   const std::shared_ptr<FileProviderHost> _host;
-  const FindItem _findItem;
+  const FindIdentifier _findIdentifier;
 };
 
 }  // namespace skein

@@ -228,8 +228,8 @@ int serve(const Arguments& arguments, const DrivePaths& paths, const FileDescrip
   const auto requests =
       std::make_shared<HostRequests>(drive, std::make_unique<HostFileRequests>(drive), *log);
   const auto services = std::make_shared<ServiceRequests>(
-      host, [requests](HostTarget target, Reply<HostItem, NSErrorPtr> reply) {
-        requests->item(std::move(target), std::move(reply));
+      host, [drive](HostTarget target, Reply<std::string, NSErrorPtr> reply) {
+        drive->findIdentifier(std::move(target), std::move(reply));
       });
   auto server =
       HostServer::listen(loop, executor, requests, services, paths.hostSocket, *log, &error);

@@ -103,50 +103,59 @@ void ProgressTable::Request::sendCount() {
 
 namespace {
 
-// The service's progress, once it is known, and whether it is to be cancelled. Held by the
-// handler of the caller's progress.
+void sendCancel(wire::Progress::Client& progress) {
+  // Whether it arrives does not matter: without the connection the request ends as well.
+  progress.cancelRequest().send().ignoreResult().detach([](kj::Exception&&) {});
+}
+
+// The service's progress, once it is known. The handler of the caller's progress holds it:
+// while nobody can cancel any more, nothing keeps the service's progress.
 class Cancellation final : public std::enable_shared_from_this<Cancellation> {
  public:
+  // Whether it was cancelled; outlives the handler, which goes when it has run. On the
+  // loop's thread.
+  struct Wish {
+    bool isCancelled = false;
+  };
+
   explicit Cancellation(std::shared_ptr<RpcLoop> loop) : _loop(std::move(loop)) {}
+
+  const std::shared_ptr<Wish>& wish() const { return _wish; }
 
   // Any thread.
   void cancel() {
     _loop->post([self = shared_from_this()] {
-      self->_wanted = true;
-      self->sendIfWanted();
+      self->_wish->isCancelled = true;
+      if (self->_remote) sendCancel(*self->_remote);
     });
   }
   // On the loop's thread.
   void attach(wire::Progress::Client progress) {
     _remote = _loop->own(std::make_unique<wire::Progress::Client>(kj::mv(progress)));
-    sendIfWanted();
   }
 
  private:
-  void sendIfWanted() {
-    if (!_wanted || !_remote) return;
-    // Whether it arrives does not matter: without the connection the request ends as well.
-    _remote->cancelRequest().send().ignoreResult().detach([](kj::Exception&&) {});
-  }
-
   const std::shared_ptr<RpcLoop> _loop;
-  // On the loop's thread.
-  std::shared_ptr<wire::Progress::Client> _remote;
-  bool _wanted = false;
+  const std::shared_ptr<Wish> _wish = std::make_shared<Wish>();
+  std::shared_ptr<wire::Progress::Client> _remote;  // on the loop's thread
 };
 
 class ObserverObject final : public wire::ProgressObserver::Server {
  public:
   ObserverObject(const std::shared_ptr<Executor>& executor, std::weak_ptr<NSProgress> progress,
-                 std::weak_ptr<Cancellation> cancellation)
+                 std::weak_ptr<Cancellation> cancellation, std::shared_ptr<Cancellation::Wish> wish)
       : _queue("progress", executor),
         _progress(std::move(progress)),
-        _cancellation(std::move(cancellation)) {}
+        _cancellation(std::move(cancellation)),
+        _wish(std::move(wish)) {}
 
   kj::Promise<void> began(BeganContext context) override {
     const auto params = context.getParams();
-    if (const auto cancellation = _cancellation.lock()) {
-      cancellation->attach(params.getProgress());
+    auto remote = params.getProgress();
+    if (_wish->isCancelled) {
+      sendCancel(remote);
+    } else if (const auto cancellation = _cancellation.lock()) {
+      cancellation->attach(kj::mv(remote));
     }
     _queue.async([weak = _progress, total = params.getTotalUnitCount(),
                   completed = params.getCompletedUnitCount()] {
@@ -168,6 +177,7 @@ class ObserverObject final : public wire::ProgressObserver::Server {
   SerialQueue _queue;
   const std::weak_ptr<NSProgress> _progress;
   const std::weak_ptr<Cancellation> _cancellation;
+  const std::shared_ptr<Cancellation::Wish> _wish;
 };
 
 }  // namespace
@@ -177,12 +187,12 @@ RemoteProgress makeRemoteProgress(std::shared_ptr<RpcLoop> loop,
   auto progress = NSProgress::progressWithTotalUnitCount(0);
   const auto cancellation = std::make_shared<Cancellation>(std::move(loop));
   progress->setCancellationHandler([cancellation] { cancellation->cancel(); });
-  return {
-      progress,
-      [executor = std::move(executor), weak = std::weak_ptr(progress),
-       weakCancellation = std::weak_ptr(cancellation)]() mutable -> wire::ProgressObserver::Client {
-        return kj::heap<ObserverObject>(executor, std::move(weak), std::move(weakCancellation));
-      }};
+  return {progress,
+          [executor = std::move(executor), weak = std::weak_ptr(progress),
+           weakCancellation = std::weak_ptr(cancellation),
+           wish = cancellation->wish()]() -> wire::ProgressObserver::Client {
+            return kj::heap<ObserverObject>(executor, weak, weakCancellation, wish);
+          }};
 }
 
 }  // namespace skein

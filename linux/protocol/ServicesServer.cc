@@ -40,6 +40,8 @@ class ClientHold {
 
   const ServicePeerPtr& peer() const { return _peer; }
   const std::shared_ptr<T>& get() const { return _held; }
+  // What is held, given up; null from now on.
+  std::shared_ptr<T> take() { return std::exchange(_held, nullptr); }
 
  private:
   const ServicePeerPtr _peer;
@@ -85,8 +87,9 @@ class ConnectionObject : public Wire {
     return answer(
         _hold.peer(), context,
         [&](auto reply) {
-          _messages.async([connection = _hold.get(), reply = std::move(reply)]() mutable {
-            connection->close();
+          _messages.async([connection = _hold.take(), reply = std::move(reply)]() mutable {
+            if (connection) connection->close();
+            connection = nullptr;
             reply();
           });
         },
@@ -95,9 +98,11 @@ class ConnectionObject : public Wire {
 
  protected:
   // A message with a reply of `Values` and an error: call(service, completion) in its turn,
-  // which answers a progress or nothing.
+  // which answers a progress or nothing. The service may take long: whoever waits for it must
+  // not keep a connection whose client is gone.
   template <class... Values, class Context, class Call, class Encode>
   kj::Promise<void> request(Context context, Call call, Encode encode) {
+    context.allowCancellation();
     auto tracked = _progresses->begin(observerIn(context.getParams()));
     return answer(
         _hold.peer(), context,
@@ -109,7 +114,7 @@ class ConnectionObject : public Wire {
               });
           _messages.async([connection = _hold.get(), exported = _exported, tracked,
                            call = std::move(call), completion = std::move(completion)]() mutable {
-            const auto service = (connection.get()->*exported)();
+            const auto service = connection ? (connection.get()->*exported)() : nullptr;
             if (!service) {
               completion(Values()..., connectionHasEndedError());
             } else if constexpr (std::is_void_v<decltype(call(*service, std::move(completion)))>) {
@@ -130,7 +135,8 @@ class ConnectionObject : public Wire {
         [&](auto reply) {
           _messages.async([connection = _hold.get(), exported = _exported, call = std::move(call),
                            reply = std::move(reply)]() mutable {
-            if (const auto service = (connection.get()->*exported)()) call(*service);
+            const auto service = connection ? (connection.get()->*exported)() : nullptr;
+            if (service) call(*service);
             reply();
           });
         },
@@ -138,7 +144,9 @@ class ConnectionObject : public Wire {
   }
 
   const ServicePeerPtr& peer() const { return _hold.peer(); }
-  std::shared_ptr<Service> exported() const { return (_hold.get().get()->*_exported)(); }
+  std::shared_ptr<Service> exported() const {
+    return _hold.get() ? (_hold.get().get()->*_exported)() : nullptr;
+  }
 
  private:
   template <class Params>

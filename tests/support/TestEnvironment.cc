@@ -7,7 +7,8 @@
 namespace skein {
 
 TestEnvironment::TestEnvironment(std::shared_ptr<Executor> other,
-                                 NSFileProviderManager* otherManager)
+                                 NSFileProviderManager* otherManager,
+                                 NSXPCListeners* otherListeners)
     : logSections(other ? other : executor),
       environment{log,
                   other ? std::move(other) : executor,
@@ -30,7 +31,7 @@ TestEnvironment::TestEnvironment(std::shared_ptr<Executor> other,
                   framework.bundles,
                   framework.sharing,
                   framework.resourceValues,
-                  framework.xpcListeners,
+                  otherListeners != nullptr ? *otherListeners : framework.xpcListeners,
                   fileProviderLog} {
   framework.containers.add(VLUbiquitousDefaultContainerID, storeURL());
   _previousFaultHandler =

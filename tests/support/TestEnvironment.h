@@ -17,9 +17,10 @@ namespace skein {
 class TestEnvironment {
  public:
   // With the manual executor, `executor`, unless another one is given, and with the
-  // framework's own manager unless another one is.
+  // framework's own manager and listeners unless others are.
   explicit TestEnvironment(std::shared_ptr<Executor> other = nullptr,
-                           NSFileProviderManager* otherManager = nullptr);
+                           NSFileProviderManager* otherManager = nullptr,
+                           NSXPCListeners* otherListeners = nullptr);
   ~TestEnvironment();
 
   // Runs what is posted, and answers what was recorded since the last time.
