@@ -1,6 +1,7 @@
 // What is done to documents, through a whole drive: nothing that a person gave a document is
 // lost on any way, and every answer is what the store says from then on.
 #include <fcntl.h>
+#include <sys/wait.h>
 #include <sys/xattr.h>
 #include <unistd.h>
 
@@ -204,6 +205,67 @@ TEST_F(DriveTest, AnEvictedDocumentIsTheSameOneOnAllItsWays) {
   EXPECT_FALSE(exists(".doc.txt.skein"));
   EXPECT_EQ(item("doc.txt"), nullptr);
   EXPECT_TRUE(differences().empty());
+}
+
+TEST_F(DriveTest, AKillAtAnyStepLeavesAnEvictedDocumentWholeAtOneOfItsPlaces) {
+  std::filesystem::create_directory(at("folder"));
+  open();
+  const std::string before = makePrecious("doc.txt");
+  ASSERT_TRUE(uploaded("doc.txt"));
+  ASSERT_EQ(evicted("doc.txt"), "");
+  const std::string inTrash = ".Trash-" + std::to_string(geteuid()) + "/files/doc.txt";
+  struct Way {
+    std::string from, to;
+    std::function<std::string()> go, back;
+  };
+  const std::vector<Way> ways = {
+      {"doc.txt", "new.txt", [&] { return renamed("doc.txt", "new.txt"); },
+       [&] { return renamed("new.txt", "doc.txt"); }},
+      {"doc.txt", "folder/doc.txt", [&] { return moved("doc.txt", "folder"); },
+       [&] { return moved("folder/doc.txt", ""); }},
+      {"doc.txt", inTrash, [&] { return trashed("doc.txt"); }, [&] { return moved(inTrash, ""); }},
+      {"doc.txt", "doc.txt", [&] { return downloaded("doc.txt"); },
+       [&] {
+         if (item("doc.txt")->isDownloaded()) {
+           EXPECT_TRUE(uploaded("doc.txt"));
+           EXPECT_EQ(evicted("doc.txt"), "");
+         }
+         return std::string("doc.txt");
+       }},
+  };
+  for (const Way& way : ways) {
+    bool isDone = false;
+    for (std::uint64_t step = 1; !isDone; ++step) {
+      ASSERT_LT(step, 100U);
+      SCOPED_TRACE(way.to + ", step " + std::to_string(step));
+      close();
+      const pid_t child = fork();
+      if (child == 0) {
+        open();
+        layer.crashAt(step);
+        way.go();
+        _exit(0);
+      }
+      int status = 0;
+      ASSERT_EQ(waitpid(child, &status, 0), child);
+      ASSERT_TRUE(WIFEXITED(status));
+      isDone = WEXITSTATUS(status) == 0;
+      ASSERT_TRUE(isDone || WEXITSTATUS(status) == FaultyFileLayer::kCrashStatus);
+      open();
+      const bool isBefore = item(way.from) != nullptr;
+      EXPECT_TRUE(!isDone || !isBefore || way.from == way.to);
+      EXPECT_EQ(portrait(isBefore ? way.from : way.to), before);
+      if (way.from != way.to) {
+        EXPECT_EQ(item(way.to) != nullptr, !isBefore);
+      }
+      EXPECT_TRUE(differences().empty());
+      if (!isBefore || way.from == way.to) {
+        ASSERT_EQ(way.back(), "doc.txt");
+      }
+    }
+  }
+  EXPECT_EQ(downloaded("doc.txt"), "");
+  EXPECT_EQ(read("doc.txt"), "contents");
 }
 
 TEST_F(DriveTest, WhatIsTrashedKeepsItsIdentifierWhoeverTrashesIt) {
