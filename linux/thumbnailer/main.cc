@@ -24,6 +24,11 @@ extern "C" const char* __asan_default_options();   // NOLINT
 extern "C" const char* __asan_default_options() {  // NOLINT
   return "max_allocation_size_mb=512:allocator_may_return_null=1:detect_leaks=0";
 }
+// Pango's threads are not this program's to judge.
+extern "C" const char* __tsan_default_options();   // NOLINT
+extern "C" const char* __tsan_default_options() {  // NOLINT
+  return "ignore_noninstrumented_modules=1";
+}
 #endif
 
 namespace skein::thumbnailer {

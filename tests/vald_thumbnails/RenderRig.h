@@ -18,7 +18,8 @@ namespace skein::vald {
 inline RenderWorker::Options workerOptions() {
   RenderWorker::Options options;
   options.program = std::string(SKEIN_BIN_DIR) + "/skein-thumbnailer";
-  options.keepsStandardError = true;  // a sanitizer's report is to be seen
+  options.keepsStandardError = true;           // a sanitizer's report is to be seen
+  options.patience = std::chrono::minutes(2);  // tests may run on a busy machine
   return options;
 }
 

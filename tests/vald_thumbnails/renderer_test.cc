@@ -14,13 +14,13 @@ const std::string& good() {
 
 TEST(RendererTest, AWorkerThatADocumentEndedIsReplaced) {
   auto options = RenderRig::withLimit(1);
-  options.worker.processorTime = std::chrono::seconds(1);
+  options.worker.patience = std::chrono::seconds(2);
   RenderRig rig(options);
   rig.ask(PictureKind::Png, good());
   rig.ask(PictureKind::Pdf, samples::slowPdf(9));
   rig.ask(PictureKind::Png, good());
   EXPECT_EQ(rig.answer(), "none");
-  EXPECT_EQ(rig.answer(), failureText(RenderFailure::TookTooLong));
+  EXPECT_EQ(rig.answer(), failureText(RenderFailure::NotInTime));
   EXPECT_EQ(rig.answer(), "none");
   EXPECT_TRUE(becomesTrue([&] { return rig.renderer->workers() == 1; }));
 }

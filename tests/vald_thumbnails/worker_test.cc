@@ -137,16 +137,17 @@ TEST_F(WorkerTest, ADocumentThatTakesTooLongEndsTheWorker) {
   options.patience = std::chrono::milliseconds(200);
   const auto waited = start();
   ASSERT_NE(waited, nullptr);
-  EXPECT_EQ(failureOf(draw(*waited, PictureKind::Pdf, samples::slowPdf(9)).error()),
-            failureText(RenderFailure::TookTooLong));
+  const auto late = draw(*waited, PictureKind::Pdf, samples::slowPdf(9));
+  EXPECT_EQ(failureOf(late.error()), failureText(RenderFailure::NotInTime));
+  EXPECT_FALSE(isAboutDocument(late.error()));  // the machine may have been busy
   EXPECT_FALSE(waited->isUsable());
 }
 
-TEST_F(WorkerTest, MemoryEndsBeforeTheMachineHasNoMore) {
+TEST_F(WorkerTest, APictureIsInMemoryOnce) {
   const auto worker = start();
   ASSERT_NE(worker, nullptr);
-  // As many pixels as are allowed, from a file of 200 KB.
-  const auto drawn = draw(*worker, PictureKind::Png, samples::pngOfZeros(9'900, 9'900, 9'900));
+  // 100 MB from a file of 160 KB.
+  const auto drawn = draw(*worker, PictureKind::Png, samples::pngOfZeros(5'000, 5'000, 5'000));
   EXPECT_EQ(failureOf(drawn.error()), "none");
   std::ifstream status("/proc/" + std::to_string(worker->processID()) + "/status");
   std::uint64_t peak = 0;
@@ -154,7 +155,7 @@ TEST_F(WorkerTest, MemoryEndsBeforeTheMachineHasNoMore) {
     if (line.starts_with("VmHWM:")) peak = std::stoull(line.substr(6));
   }
   EXPECT_GT(peak, 0u);
-  EXPECT_LT(peak, 1u << 20);  // in KiB
+  EXPECT_LT(peak, 300u << 10);  // in KiB, with what a sanitizer takes
 }
 
 TEST_F(WorkerTest, IsLockedDownBeforeItsFirstDocument) {
@@ -199,6 +200,12 @@ int tryEverything(const std::string& ownFile) {
                 MAP_FAILED)) {
     return attempt;
   }
+#ifndef SKEIN_SANITIZED
+  if (succeeded(mmap(nullptr, thumbnailer::kAddressSpace, PROT_READ,
+                     MAP_PRIVATE | MAP_ANONYMOUS | MAP_NORESERVE, -1, 0) != MAP_FAILED)) {
+    return attempt;
+  }
+#endif
   const pid_t child = fork();
   if (child == 0) _exit(0);
   if (succeeded(child > 0)) return attempt;

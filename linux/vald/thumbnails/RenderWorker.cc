@@ -37,6 +37,10 @@ constexpr const char* kEnvironment[] = {"LANG=C.UTF-8", "RAYON_NUM_THREADS=1", "
 
 int spawn(const std::string& program, int socket, bool keepsStandardError, pid_t& process) {
   SpawnSettings settings;
+  // In a group of its own, away from a terminal's signals, but in this process's session: how
+  // nice a process is counts only among those of its session.
+  posix_spawnattr_setflags(&settings.attributes,
+                           POSIX_SPAWN_SETPGROUP | POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETSIGDEF);
   posix_spawn_file_actions_addopen(&settings.actions, STDIN_FILENO, "/dev/null", O_RDONLY, 0);
   posix_spawn_file_actions_addopen(&settings.actions, STDOUT_FILENO, "/dev/null", O_WRONLY, 0);
   if (!keepsStandardError) {
@@ -165,7 +169,8 @@ Outcome<RenderedPicture> RenderWorker::render(const Job& job, Cancellation& canc
     const int status = end();
     if (cancellation.isCancelled()) return cancelledError();
     if (code == ETIMEDOUT) {
-      return renderError(RenderFailure::TookTooLong, "Drawing the document took too long.");
+      return renderError(RenderFailure::NotInTime,
+                         "The document was not drawn in time; try again when less is going on.");
     }
     return endingError(status);
   }

@@ -34,7 +34,7 @@ class RenderWorker : public std::enable_shared_from_this<RenderWorker> {
   struct Options {
     std::string program;  // skein-thumbnailer's file; empty: beside the running program
     std::chrono::seconds processorTime{10};      // for one document
-    std::chrono::milliseconds patience{30'000};  // by the clock on the wall, for one document
+    std::chrono::milliseconds patience{60'000};  // by the clock on the wall, for one document
     std::chrono::milliseconds patienceAtStart{10'000};
     bool keepsStandardError = false;  // for tests: else what it says goes nowhere
   };

@@ -151,6 +151,7 @@ struct ThumbnailMaker::Core : std::enable_shared_from_this<Core> {
 
   // It has no thumbnail, then, until it is looked for at the next start.
   void tellOfFailure(VLFileObjectID document, const NSErrorPtr& error) {
+    if (error->code() == NSUserCancelledError && error->domain() == NSCocoaErrorDomain) return;
     VL_ERROR(services.log, "[ERROR] no thumbnail was made for %@: %@", document.asString(),
              error->localizedDescription());
   }
