@@ -78,9 +78,31 @@ bool Cloud::probeSharing() {
          ::ioctl(to.get(), FICLONE, from.get()) == 0;
 }
 
+void Cloud::startThumbnails(FolderStore& store) {
+  if (_options.desktopThumbnails.empty()) return;
+  auto started =
+      ThumbnailService::start({*_contents, *_records, _operations.layer(), _clock, _log,
+                               joinPath(_options.folder, "thumbnails"), _options.desktopThumbnails,
+                               [&store](VLFileObjectID document) -> std::optional<std::string> {
+                                 NSErrorPtr error;
+                                 const VLQueryItemPtr item = store.itemWithID(document, &error);
+                                 return item ? item->typeIdentifier() : std::nullopt;
+                               },
+                               ThumbnailRenderer::Options()});
+  if (!started) {
+    VL_ERROR(_log, "[ERROR] no thumbnails are made: %@", started.error()->localizedDescription());
+    return;
+  }
+  MutexLock lock(_mutex);
+  _thumbnails = std::move(*started);
+}
+
 void Cloud::start(FolderStore& store) {
-  auto feed =
-      std::make_shared<UploadFeed>(UploadFeed::Parts{store, *_records, _options.policy, _log});
+  startThumbnails(store);
+  auto feed = std::make_shared<UploadFeed>(
+      UploadFeed::Parts{store, *_records, _options.policy, _log, [this](VLFileObjectID document) {
+                          if (const auto told = thumbnails()) told->documentWasUploaded(document);
+                        }});
   _uploader = std::make_unique<Uploader>(UploadServices{_operations.roots(), _operations.layer(),
                                                         *_contents, *_records, _conditions, _clock},
                                          *feed, _uploadThreads, _options.uploads);
@@ -91,9 +113,11 @@ void Cloud::start(FolderStore& store) {
 
 void Cloud::stop() {
   std::shared_ptr<UploadFeed> feed;
+  std::shared_ptr<ThumbnailService> thumbnails;
   {
     MutexLock lock(_mutex);
     feed.swap(_feed);
+    thumbnails.swap(_thumbnails);
   }
   if (feed) feed->stop();
   _answers->close();
@@ -107,6 +131,22 @@ void Cloud::stop() {
 std::shared_ptr<UploadFeed> Cloud::feed() {
   MutexLock lock(_mutex);
   return _feed;
+}
+
+std::shared_ptr<ThumbnailService> Cloud::thumbnails() {
+  MutexLock lock(_mutex);
+  return _thumbnails;
+}
+
+void Cloud::documentWasEvicted(const std::string& path, VLFileObjectID document) {
+  const auto told = thumbnails();
+  if (!told) return;
+  const auto record = _records->record(document);
+  if (record && *record) told->documentWasEvicted(path, **record);
+}
+
+void Cloud::documentWasDownloaded(const std::string& path) {
+  if (const auto told = thumbnails()) told->documentCameBack(path);
 }
 
 void Cloud::storeDidChange(const std::vector<StoreChange>& changes) {

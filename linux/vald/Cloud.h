@@ -9,6 +9,7 @@
 #include "linux/vald/cloud/CloudPlaces.h"
 #include "linux/vald/cloud/Downloader.h"
 #include "linux/vald/files/FileOperations.h"
+#include "linux/vald/thumbnails/ThumbnailService.h"
 
 namespace skein::vald {
 
@@ -22,7 +23,8 @@ class Cloud final : public LocalCloud {
     std::string drive;   // the drive's folder
     UploadPolicy policy;
     bool allowsConditions = false;
-    std::size_t downloads = 4;  // at a time
+    std::string desktopThumbnails;  // the desktop's cache of them; empty: none are made
+    std::size_t downloads = 4;      // at a time
     Uploader::Options uploads;
   };
   // Null with an error. `operations` and `log` outlive it.
@@ -44,6 +46,9 @@ class Cloud final : public LocalCloud {
   void storeDidChange(const std::vector<StoreChange>& changes) SKEIN_EXCLUDES(_mutex);
   void storeDidOverflow() SKEIN_EXCLUDES(_mutex);
   std::string whyNotUploaded(VLFileObjectID document) SKEIN_EXCLUDES(_mutex);
+  // What became of the document at this path. Cheap; any thread.
+  void documentWasEvicted(const std::string& path, VLFileObjectID document) SKEIN_EXCLUDES(_mutex);
+  void documentWasDownloaded(const std::string& path) SKEIN_EXCLUDES(_mutex);
 
   // Answered on a thread of the cloud's.
   void setConditions(LocalCloudConditions conditions, Reply<NSErrorPtr> reply) override;
@@ -53,6 +58,9 @@ class Cloud final : public LocalCloud {
   Cloud(Options options, FileOperations& operations, Log& log);
 
   std::shared_ptr<UploadFeed> feed() SKEIN_EXCLUDES(_mutex);
+  void startThumbnails(FolderStore& store) SKEIN_EXCLUDES(_mutex);
+  // Null unless thumbnails are made.
+  std::shared_ptr<ThumbnailService> thumbnails() SKEIN_EXCLUDES(_mutex);
   // Whether a copy of a document shares its blocks.
   bool probeSharing();
 
@@ -72,6 +80,7 @@ class Cloud final : public LocalCloud {
 
   Mutex _mutex;
   std::shared_ptr<UploadFeed> _feed SKEIN_GUARDED_BY(_mutex);
+  std::shared_ptr<ThumbnailService> _thumbnails SKEIN_GUARDED_BY(_mutex);
 };
 
 }  // namespace skein::vald

@@ -44,6 +44,12 @@ std::unique_ptr<Drive> Drive::open(DriveOptions options, StoreListener& listener
                  drive->_cloud->downloader(), drive->_threads, drive->_importThreads,
                  [cloud = drive->_cloud.get()](VLFileObjectID document) {
                    return cloud->whyNotUploaded(document);
+                 },
+                 [cloud = drive->_cloud.get()](const std::string& path, VLFileObjectID document) {
+                   cloud->documentWasEvicted(path, document);
+                 },
+                 [cloud = drive->_cloud.get()](const std::string& path) {
+                   cloud->documentWasDownloaded(path);
                  }});
   // The round that begins now sees these, too; who asks at once shall not see them before.
   std::vector<std::string> recovered;

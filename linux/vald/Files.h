@@ -29,6 +29,9 @@ struct FilesParts {
   std::shared_ptr<Executor> importExecutor;  // for what may take minutes
   // Why a document may not be uploaded although nothing failed; empty when it will be.
   std::function<std::string(VLFileObjectID)> whyNotUploaded;
+  // Told after it succeeded; both return soon.
+  std::function<void(const std::string& path, VLFileObjectID)> didEvict;
+  std::function<void(const std::string& path)> didDownload;
 };
 
 // Posts `work(reply)` to an executor.

@@ -47,6 +47,7 @@ void Files::startDownload(const std::string& path, const std::shared_ptr<NSProgr
                [this, file, progress, error](Reply<NSErrorPtr>& answered) {
                  progress->setCancellationHandler([] {});
                  _parts.store.lookAtPaths({file});
+                 if (!error) _parts.didDownload(file);
                  answered(error);
                });
   };
@@ -66,6 +67,7 @@ void Files::evict(NSURLPtr url, Reply<NSErrorPtr> reply) {
     NSErrorPtr error = _eviction.evict(request);
     // Also after a failure: the file may have been away for a moment.
     _parts.store.lookAtPaths({request.path});
+    if (!error) _parts.didEvict(request.path, request.document);
     const bool isNotUploaded =
         error && error->domain() == SkeinEvictionErrorDomain &&
         error->code() == static_cast<std::int64_t>(EvictionRefusal::NotUploaded);

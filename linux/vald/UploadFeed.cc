@@ -4,6 +4,8 @@
 #include <sys/syscall.h>
 #include <unistd.h>
 
+#include <utility>
+
 namespace skein::vald {
 namespace {
 
@@ -21,7 +23,7 @@ std::int64_t nanoseconds(NSDate date) { return date.time_since_epoch().count(); 
 
 }  // namespace
 
-UploadFeed::UploadFeed(Parts parts) : _parts(parts) {}
+UploadFeed::UploadFeed(Parts parts) : _parts(std::move(parts)) {}
 
 UploadFeed::~UploadFeed() { stop(); }
 
@@ -65,6 +67,7 @@ void UploadFeed::storeDidChange(const std::vector<StoreChange>& changes) {
 void UploadFeed::storeDidOverflow() { poke(); }
 
 void UploadFeed::uploadStateDidChange(VLFileObjectID document, const UploadState& state) {
+  if (state.phase == UploadState::Phase::Uploaded) _parts.didUpload(document);
   {
     MutexLock lock(_mutex);
     if (state.phase == UploadState::Phase::Uploaded && state.stamp) {

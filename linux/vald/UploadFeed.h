@@ -26,6 +26,7 @@ class UploadFeed final : public UploadListener {
     CloudRecords& records;
     UploadPolicy policy;
     Log& log;
+    std::function<void(VLFileObjectID)> didUpload;  // on a thread of the uploader's; returns soon
   };
   explicit UploadFeed(Parts parts);
   ~UploadFeed() override;

@@ -101,6 +101,7 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
   cloud.folder = paths.cloudDirectory;
   cloud.policy = UploadPolicy::fromEnvironment();
   cloud.allowsConditions = mayFail;
+  cloud.desktopThumbnails = DesktopThumbnails::userFolder();
   FileLayer layer;
   SharedItems sharedItems;
   SharingListener sharingListener(sharedItems, listener);
