@@ -136,6 +136,31 @@ TEST_F(Files, EvictGivesUpWhatTheCloudHasAndGetBringsItBack) {
   EXPECT_EQ(partly.lines(), (Lines{drive.store() + "/letter.txt"}));
 }
 
+TEST_F(Files, WhatIsEvictedHasAThumbnailThatFileManagersFind) {
+  const auto files = [](const fs::path& folder, const std::string& part) {
+    std::error_code none;
+    std::size_t count = 0;
+    for (const auto& entry : fs::recursive_directory_iterator(folder, none)) {
+      const bool counts = entry.is_regular_file(none);
+      if (counts && entry.path().string().find(part) != std::string::npos) ++count;
+    }
+    return count;
+  };
+  const fs::path own = fs::path(drive.home()).parent_path() / "data";
+  const std::string cache = drive.home() + "/.cache/thumbnails";
+  drive.write("/letter.txt", "dear");
+  // The machine's own types: without them this is no text.
+  EXPECT_EQ(drive.shell("XDG_DATA_DIRS=/usr/share skein ls /").code, 0);
+  ASSERT_TRUE(isUploaded("/letter.txt"));
+  ASSERT_TRUE(comesTrue([&] { return files(own, "/pictures/") == 1; }));
+  EXPECT_EQ(files(cache, ".png"), 0u);
+  skein({"evict", "/letter.txt"});
+  EXPECT_TRUE(comesTrue([&] { return files(cache, "/xx-large/") == 1; }));
+  EXPECT_EQ(files(cache, "/normal/"), 1u);
+  skein({"get", "/letter.txt"});
+  EXPECT_TRUE(comesTrue([&] { return files(cache, ".png") == 0; }));
+}
+
 TEST_F(Files, FoldersMovesAndAliasesGoWherePeopleExpect) {
   drive.write("/a.txt", "a");
   drive.write("/b.txt", "b");
