@@ -12,6 +12,7 @@
 namespace skein {
 namespace {
 
+using Entries = std::vector<FileHistoryEntry>;
 using ItemCompletion = NSFileProviderExtension::ItemCompletion;
 using TimedTransfer = std::shared_ptr<TimedReply<std::shared_ptr<HostTransfer>>>;
 
@@ -92,6 +93,12 @@ void placeInDrive(const DriveRequests& drive, FileHistoryEntry& entry) {
   };
   if (entry.operation != "import") place(entry.path);
   if (!entry.destination.empty()) place(entry.destination);
+}
+
+void askHistory(const DriveRequests& drive, const std::shared_ptr<TimedReply<Entries>>& timed,
+                const std::string& path, const std::string& identifier, std::uint64_t limit,
+                Reply<Entries, NSErrorPtr> reply) {
+  drive.daemon()(failing(timed))->files().history(path, identifier, limit, std::move(reply));
 }
 
 }  // namespace
@@ -390,8 +397,7 @@ void HostFileRequests::defaultContainer(std::optional<std::string> bundleIdentif
 }
 
 void HostFileRequests::history(HostTarget target, std::uint64_t limit,
-                               Reply<std::vector<FileHistoryEntry>, NSErrorPtr> reply) {
-  using Entries = std::vector<FileHistoryEntry>;
+                               Reply<Entries, NSErrorPtr> reply) {
   _drive->withDrive<Entries>(
       std::move(reply), [drive = _drive, target = std::move(target),
                          limit](const std::shared_ptr<TimedReply<Entries>>& timed) {
@@ -401,14 +407,24 @@ void HostFileRequests::history(HostTarget target, std::uint64_t limit,
           (*timed)({}, error);
           return;
         }
-        // Nothing needs to be there any more.
+        const auto answer = [drive, timed](Entries entries, NSErrorPtr problem) {
+          for (FileHistoryEntry& entry : entries) placeInDrive(*drive, entry);
+          (*timed)(std::move(entries), std::move(problem));
+        };
         const std::string identifier = drive->resolve(target, nullptr).value_or("");
-        drive->daemon()(failing(timed))
-            ->files()
-            .history(path, identifier, limit, [drive, timed](Entries entries, NSErrorPtr problem) {
-              for (FileHistoryEntry& entry : entries) placeInDrive(*drive, entry);
-              (*timed)(std::move(entries), std::move(problem));
-            });
+        if (!identifier.empty()) {
+          askHistory(*drive, timed, path, identifier, limit, answer);
+          return;
+        }
+        // Nothing is there any more: what was there last is asked for.
+        askHistory(*drive, timed, path, "", limit,
+                   [drive, timed, path, limit, answer](Entries entries, NSErrorPtr problem) {
+                     if (entries.empty() || entries.front().identifier.empty()) {
+                       answer(std::move(entries), std::move(problem));
+                       return;
+                     }
+                     askHistory(*drive, timed, path, entries.front().identifier, limit, answer);
+                   });
       });
 }
 

@@ -365,9 +365,10 @@ TEST_F(FileRequests, WhatTheExtensionDoesNotOfferGoesToVald) {
   run();
   Words asked;
   while (daemon->fakeFiles.asked.count() > 0) asked.push_back(*daemon->fakeFiles.asked.take());
-  EXPECT_EQ(asked, (Words{"evict /drive/a", "setPinned /drive/a yes",
-                          "makeAlias /drive link /drive/a me", "makeAlias /drive link /etc me",
-                          "history /drive/a a 5", "history /drive/gone  5"}));
+  EXPECT_EQ(asked,
+            (Words{"evict /drive/a", "setPinned /drive/a yes", "makeAlias /drive link /drive/a me",
+                   "makeAlias /drive link /etc me", "history /drive/a a 5",
+                   "history /drive/gone  5", "history /drive/gone a 5"}));
   // Paths in the drive are shown as the drive's, but for where an import came from.
   EXPECT_EQ(heard,
             (Words{"done", "done", "b at /b", "b at /b", "/a -> /elsewhere/a", "/drive/x -> /a"}));
