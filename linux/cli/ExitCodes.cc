@@ -76,6 +76,9 @@ constexpr Meaning kMeanings[] = {
      kLogIn},
     {VLVellumErrorDomain, VLVellumErrorInvalidParameter, kUsage, "an argument is not valid",
      "paths begin at the drive's root, such as /Documents, and have no \".\" or \"..\""},
+    {VLVellumErrorDomain, VLVellumErrorNotEntitled, kRefused,
+     "the app keeps no documents in the drive",
+     "its desktop entry would name a container: X-Skein-Containers="},
     {VLVellumErrorDomain, VLVellumErrorDaemonUnreachable, kUnreachable,
      "the drive's processes cannot be reached", kTryAgain},
     {NSPOSIXErrorDomain, EACCES, kRefused, "permission denied", kPermissions},
@@ -115,14 +118,16 @@ ExitCode exitCodeFor(const NSErrorPtr& error) {
 
 std::string textFor(const NSErrorPtr& error) {
   const Meaning* meaning = firstMeaningOf(error);
+  const ExitCode code = meaning != nullptr ? meaning->exitCode : kFailure;
   std::string cause = describedBy(error);
   while (!cause.empty() && (cause.back() == '.' || cause.back() == ' ')) cause.pop_back();
+  // A refusal's own words are enough; others mostly name the next step themselves.
+  const bool isComplete =
+      !cause.empty() &&
+      (code == kRefused || (code != kUnreachable && cause.find("; ") != std::string::npos));
+  if (isComplete) return cause;
   if (cause.empty() && meaning != nullptr) cause = meaning->cause;
   if (cause.empty()) cause = error->domain() + " " + std::to_string(error->code());
-  // What goes wrong with a file is told with the next step already.
-  const bool isComplete = cause.find("; ") != std::string::npos &&
-                          (meaning == nullptr || meaning->exitCode != kUnreachable);
-  if (isComplete) return cause;
   return cause + "; " +
          std::string(meaning != nullptr ? meaning->nextStep
                                         : "the log may say more: skein log -n 20");

@@ -159,8 +159,15 @@ int runDefaultLocation(HostService& host, const AppOptions& options) {
   const auto [folder, error] =
       await<HostItem>([&](auto reply) { host.files().defaultContainer(app, std::move(reply)); });
   Report report(options.json);
-  if (error) {
-    report.failed(options.app, error);
+  if (exitCodeFor(error) == kUsage) {
+    report.failed(options.app,
+                  NSError::errorWithDomain(
+                      NSCocoaErrorDomain, NSFileNoSuchFileError,
+                      {{NSLocalizedDescriptionKey,
+                        std::string("no such app is installed; an app is named as its desktop "
+                                    "entry is, without \".desktop\"")}}));
+  } else if (error) {
+    report.failed(options.app.empty() ? "/" : options.app, error);
   } else {
     report.done(options.app, folder, folder.path + '\n');
   }
