@@ -68,6 +68,8 @@ class Drive {
   Result shell(const std::string& line) const;
   // A folder outside the store, for what a test brings in.
   const std::string& home() const { return _home; }
+  // Where the drive's processes keep what is theirs.
+  std::string state() const { return _folder + "/state"; }
   // The drive's processes; 0 when they do not run.
   pid_t daemon() const { return processOf("vald"); }
   pid_t host() const { return processOf("skein-host"); }
