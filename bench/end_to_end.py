@@ -36,7 +36,7 @@ class Drive:
         self.store.mkdir(parents=True)
         self.skein = str(binaries / "skein")
         self.environment = dict(os.environ, SKEIN_STORE=str(self.store), SKEIN_LOG="notice",
-                                NO_COLOR="1")
+                                SKEIN_UPLOADS="2048", NO_COLOR="1")
         for name in ("RUNTIME_DIR", "STATE_HOME", "DATA_HOME", "CONFIG_HOME", "CACHE_HOME"):
             folder = top / name.lower()
             folder.mkdir(mode=0o700)
