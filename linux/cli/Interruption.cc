@@ -2,6 +2,7 @@
 
 #include <unistd.h>
 
+#include <algorithm>
 #include <array>
 #include <atomic>
 #include <climits>
@@ -15,6 +16,7 @@ namespace {
 std::array<char, PATH_MAX> temporaryFolder;
 std::array<char, PATH_MAX> temporaryFile;
 std::atomic<bool> isThere{false};
+std::atomic<bool> lineIsOpen{false};
 static_assert(std::atomic<bool>::is_always_lock_free);
 
 void interrupted(int signal) {
@@ -22,6 +24,8 @@ void interrupted(int signal) {
     unlink(temporaryFile.data());
     rmdir(temporaryFolder.data());
   }
+  if (lineIsOpen) [[maybe_unused]]
+    const ssize_t written = write(STDERR_FILENO, "\n", 1);
   _exit(128 + signal);
 }
 
@@ -35,6 +39,8 @@ void copy(std::array<char, PATH_MAX>& to, const std::string& from) {
 void installInterruption() {
   for (const int signal : {SIGINT, SIGTERM, SIGHUP}) std::signal(signal, interrupted);
 }
+
+void setLineIsOpen(bool isOpen) { lineIsOpen = isOpen; }
 
 void rememberTemporaryFile(const std::string& folder, const std::string& file) {
   copy(temporaryFolder, folder);

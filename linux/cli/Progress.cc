@@ -3,6 +3,7 @@
 #include <array>
 #include <cstdio>
 
+#include "linux/cli/Interruption.h"
 #include "linux/cli/Output.h"
 
 namespace skein::cli {
@@ -34,10 +35,13 @@ void Progress::show(const std::string& text) {
   if (!_terminal || Clock::now() - _begin < 1s) return;
   write("\r\x1b[K" + text);
   _shown = true;
+  setLineIsOpen(true);
 }
 
 void Progress::clear() {
-  if (std::exchange(_shown, false)) write("\r\x1b[K");
+  if (!std::exchange(_shown, false)) return;
+  write("\r\x1b[K");
+  setLineIsOpen(false);
 }
 
 std::string sizeText(std::uint64_t bytes) {
