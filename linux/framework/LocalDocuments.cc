@@ -8,6 +8,7 @@
 #include <string_view>
 #include <utility>
 
+#include "linux/framework/DocumentURLScope.h"
 #include "vellum/VLErrors.h"
 
 namespace skein {
@@ -38,6 +39,7 @@ LocalDocuments::LocalDocuments(DaemonAccess access, std::shared_ptr<DriveState> 
 
 NSURLPtr LocalDocuments::vl_documentURLFromFileObjectID(const VLFileObjectID& fileObjectID,
                                                         NSErrorOut error) {
+  if (NSURLPtr known = DocumentURLScope::find(fileObjectID)) return known;
   auto [url, problem] = askDaemon<NSURLPtr>(_access, [&](LocalDaemon& daemon, auto reply) {
     daemon.URLForFileObjectID(fileObjectID, std::move(reply));
   });
