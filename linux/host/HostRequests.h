@@ -4,6 +4,7 @@
 #include <type_traits>
 
 #include "linux/host/DriveRequests.h"
+#include "linux/host/ThumbnailRequests.h"
 #include "linux/protocol/HostService.h"
 #include "platform/log/Log.h"
 
@@ -30,6 +31,7 @@ class HostRequests final : public HostService, public std::enable_shared_from_th
   void check(Reply<std::shared_ptr<HostCheck>, NSErrorPtr> reply) override;
   void setDebugLog(bool enabled, Reply<NSErrorPtr> reply) override;
   HostFiles& files() override { return *_files; }
+  HostThumbnails& thumbnails() override { return _thumbnails; }
 
  private:
   template <class... Values>
@@ -42,6 +44,7 @@ class HostRequests final : public HostService, public std::enable_shared_from_th
 
   const std::shared_ptr<DriveRequests> _drive;
   const std::unique_ptr<HostFiles> _files;
+  ThumbnailRequests _thumbnails{_drive};
   const std::shared_ptr<FileProviderHost> _host;
   const DaemonProxies _daemon;
   Log& _log;

@@ -5,6 +5,7 @@
 #include "linux/protocol/HostCalls.h"
 #include "linux/protocol/HostCodec.h"
 #include "linux/protocol/HostFilesProxy.h"
+#include "linux/protocol/HostThumbnailsProxy.h"
 
 namespace skein {
 namespace {
@@ -41,7 +42,9 @@ Task decodeStep(const auto& results, const SharedReply<HostCheckStep>& reply) {
 class HostProxy final : public HostService, private HostCalls<wire::Host> {
  public:
   explicit HostProxy(std::shared_ptr<SocketClient> socket)
-      : HostCalls(socket), _files(makeHostFilesProxy(std::move(socket))) {}
+      : HostCalls(socket),
+        _files(makeHostFilesProxy(socket)),
+        _thumbnails(makeHostThumbnailsProxy(std::move(socket))) {}
   ~HostProxy() override { _socket->close(); }
 
   void list(HostTarget container, HostOrder order,
@@ -180,9 +183,11 @@ class HostProxy final : public HostService, private HostCalls<wire::Host> {
   }
 
   HostFiles& files() override { return *_files; }
+  HostThumbnails& thumbnails() override { return *_thumbnails; }
 
  private:
   const std::unique_ptr<HostFiles> _files;
+  const std::unique_ptr<HostThumbnails> _thumbnails;
 };
 
 }  // namespace

@@ -5,6 +5,7 @@
 #include "linux/protocol/HostCodec.h"
 #include "linux/protocol/HostFilesObject.h"
 #include "linux/protocol/HostPeer.h"
+#include "linux/protocol/HostThumbnailsObject.h"
 #include "linux/protocol/ServicesServer.h"
 #include "linux/protocol/SocketServer.h"
 
@@ -73,10 +74,13 @@ class CheckObject final : public wire::Check::Server {
 };
 
 // The host, as one connection sees it. Lives on the loop's thread.
-class HostObject final : public virtual wire::Host::Server, public HostFilesObject {
+class HostObject final : public virtual wire::Host::Server,
+                         public HostFilesObject,
+                         public HostThumbnailsObject {
  public:
   explicit HostObject(HostPeerPtr peer)
       : HostFilesObject(peer),
+        HostThumbnailsObject(peer),
         _peer(std::move(peer)),
         _services(makeServicesObject(_peer->loop, _peer->executor, _peer->services)) {}
 

@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "linux/protocol/HostFiles.h"
+#include "linux/protocol/HostThumbnails.h"
 #include "linux/protocol/HostTypes.h"
 #include "linux/protocol/LocalDaemon.h"
 
@@ -93,6 +94,8 @@ class HostService {
 
   // What changes documents. Lives as long as this.
   virtual HostFiles& files() = 0;
+  // Pictures of items. The same holds for it.
+  virtual HostThumbnails& thumbnails() = 0;
 };
 
 }  // namespace skein

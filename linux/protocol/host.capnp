@@ -7,6 +7,7 @@ $Cxx.namespace("skein::wire");
 
 using Daemon = import "daemon.capnp";
 using HostFiles = import "hostfiles.capnp";
+using HostThumbnails = import "hostthumbnails.capnp";
 using HostTypes = import "hosttypes.capnp";
 using Types = import "types.capnp";
 
@@ -34,7 +35,7 @@ struct HostDifference {
   detail @2 :Data;
 }
 
-interface Host extends(HostFiles.HostFiles) {
+interface Host extends(HostFiles.HostFiles, HostThumbnails.HostThumbnails) {
   list @0 (container :Target, order :UInt8) -> (listing :Listing, error :Types.Error);
   item @1 (target :Target) -> (item :HostItem, error :Types.Error);
   identifierForPath @2 (path :Data) -> (identifier :Data, error :Types.Error);

@@ -1,0 +1,82 @@
+// A batch of thumbnails between the extension and whoever takes it out.
+#include <gtest/gtest.h>
+
+#include "linux/host/ThumbnailStream.h"
+#include "tests/host/HostFixture.h"
+
+namespace skein {
+namespace {
+
+struct Thumbnails : HostTest {
+  // What was handed out since the last time: "INDEX kind DATA", then how far it is.
+  Words take() {
+    stream->next([this](const HostThumbnailStep& step, const NSErrorPtr& error) {
+      for (const HostThumbnail& one : step.thumbnails) {
+        words.push_back(std::to_string(one.index) + " " + kNames[static_cast<int>(one.kind)] +
+                        (one.data ? " " + std::string(one.data->view().substr(0, 8)) : "") +
+                        (one.error ? " " + std::to_string(one.error->code()) : ""));
+      }
+      words.push_back(std::to_string(step.done) + "/" + std::to_string(step.total) +
+                      (step.finished ? " end" : "") + (error ? " with error" : ""));
+    });
+    run();
+    return std::exchange(words, {});
+  }
+  void come(const std::string& identifier, std::optional<NSData> data, NSErrorPtr error = nullptr) {
+    stream->thumbnailDidCome(identifier, std::move(data), std::nullopt, std::move(error));
+  }
+
+  static constexpr const char* kNames[] = {"thumbnail", "icon", "none", "missing", "error"};
+  const std::shared_ptr<ThumbnailStream> stream =
+      std::make_shared<ThumbnailStream>(HostTools{executor, timers}, 5);
+  const std::string folder = "i0000000000000007";
+  Words words;
+};
+
+TEST_F(Thumbnails, EachTargetIsToldOfOnceWhateverTheExtensionCalls) {
+  stream->fail(0, expired());
+  stream->expect(1, idOf(1));
+  stream->expect(2, folder);
+  stream->expect(3, idOf(1));  // named twice
+  stream->expect(4, idOf(4));  // left out
+  EXPECT_EQ(take(), (Words{"0 error -1002", "1/5"}));
+  come(idOf(1), NSData("picture"));
+  come(idOf(1), NSData("again"));
+  come(folder, NSData("icon"));
+  come("stranger", std::nullopt);
+  EXPECT_EQ(take(), (Words{"1 thumbnail picture", "3 thumbnail picture", "2 icon icon", "4/5"}));
+  EXPECT_EQ(take(), Words{});
+  stream->batchDidEnd(nullptr);
+  run();
+  EXPECT_EQ(words, (Words{"4 missing", "5/5 end"}));
+  words.clear();
+  EXPECT_EQ(take(), Words{"5/5 end"});
+}
+
+TEST_F(Thumbnails, WhatIsLeftOutOfAFailedBatchFailsWithIt) {
+  stream->expect(0, idOf(1));
+  stream->expect(1, folder);
+  come(folder, std::nullopt);
+  stream->batchDidEnd(expired());
+  run();
+  EXPECT_EQ(take(), (Words{"1 none", "0 error -1002", "2/5 end with error"}));
+}
+
+TEST_F(Thumbnails, LettingGoCancelsTheBatchAlsoBeforeItHasBegun) {
+  const auto progress = NSProgress::progressWithTotalUnitCount(0);
+  int cancellations = 0;
+  progress->setCancellationHandler([&] { ++cancellations; });
+  stream->setProgress(progress);
+  EXPECT_EQ(cancellations, 0);
+  stream->letGo();
+  EXPECT_EQ(cancellations, 1);
+
+  const auto late = std::make_shared<ThumbnailStream>(HostTools{executor, timers}, 1);
+  late->letGo();
+  const auto second = NSProgress::progressWithTotalUnitCount(0);
+  late->setProgress(second);
+  EXPECT_TRUE(second->isCancelled());
+}
+
+}  // namespace
+}  // namespace skein
