@@ -28,6 +28,7 @@ void addTrashCommands(CLI::App& app, Invocation& invocation);    // trash, resto
 void addTagCommand(CLI::App& app, Invocation& invocation);       // tag
 void addMarkCommands(CLI::App& app, Invocation& invocation);     // favorite, touch-used
 void addWhyCommand(CLI::App& app, Invocation& invocation);       // why
+void addThumbCommand(CLI::App& app, Invocation& invocation);     // thumb
 void addChangeCommands(CLI::App& app, Invocation& invocation);   // watch, changes
 void addAccountCommand(CLI::App& app, Invocation& invocation);   // account
 void addStatusCommands(CLI::App& app, Invocation& invocation);   // status, doctor

@@ -43,6 +43,7 @@ int main(int argc, char** argv) {
   addTagCommand(app, invocation);
   addMarkCommands(app, invocation);
   addWhyCommand(app, invocation);
+  addThumbCommand(app, invocation);
   addChangeCommands(app, invocation);
   addAccountCommand(app, invocation);
   addStatusCommands(app, invocation);
