@@ -124,6 +124,7 @@ void IconTheme::add(const std::string& name, std::vector<std::string>& seen) {
 
   // The first index that there is speaks for the theme's folders under every base.
   const KeyFile index(g_key_file_new(), g_key_file_unref);
+  g_key_file_set_list_separator(index.get(), ',');
   const bool hasIndex =
       std::any_of(_baseFolders.begin(), _baseFolders.end(), [&](const std::string& base) {
         const std::string path = base + "/" + name + "/index.theme";
