@@ -1,6 +1,33 @@
 #include "linux/host/DriveRequests.h"
 
+#include "vellum/VLErrors.h"
+
 namespace skein {
+namespace {
+
+using namespace std::chrono_literals;
+using Clock = std::chrono::steady_clock;
+
+constexpr auto kBetweenTries = 50ms;
+// An error that took longer is not that of a connection that was just closed.
+constexpr auto kAtOnce = 1s;
+
+}  // namespace
+
+void DriveRequests::reachVald(int tries, UniqueFunction<void(NSErrorPtr)> then) {
+  const auto shared = std::make_shared<UniqueFunction<void(NSErrorPtr)>>(std::move(then));
+  const auto answered = [self = shared_from_this(), tries, shared,
+                         begin = Clock::now()](const NSErrorPtr& error) {
+    const bool wasLost = error && error->domain() == VLVellumErrorDomain &&
+                         error->code() == VLVellumErrorDaemonUnreachable;
+    if (!wasLost || tries == 1 || Clock::now() - begin > kAtOnce) return (*shared)(error);
+    self->tools().timers->after(
+        kBetweenTries, [self, tries, shared]() { self->reachVald(tries - 1, std::move(*shared)); });
+  };
+  // Either the reply or the error handler runs.
+  _daemon(answered)->containers([answered](const std::vector<VLContainer::Properties>&,
+                                           const NSErrorPtr& error) { answered(error); });
+}
 
 void DriveRequests::findIdentifier(HostTarget target, Reply<std::string, NSErrorPtr> reply) {
   withDrive<std::string>(std::move(reply), [self = shared_from_this(), target = std::move(target)](

@@ -1,6 +1,5 @@
 #pragma once
 
-#include <atomic>
 #include <chrono>
 #include <functional>
 #include <memory>
@@ -37,9 +36,10 @@ class DriveRequests final : public std::enable_shared_from_this<DriveRequests> {
   const DaemonProxies& daemon() const { return _daemon; }
   const ItemPaths& paths() const { return _paths; }
 
-  // Runs `work(timed)` on the executor. The first time it waits until vald has told where
-  // the drive is: the extension asks that once and keeps the answer, so asking it while
-  // vald cannot be reached would leave the process without a drive.
+  // Runs `work(timed)` on the executor, after vald has answered: the extension's lookups take
+  // a vald that cannot be reached for an item that is not there, and its root URL, which is
+  // asked once and kept, for a drive without one. So whoever asks after vald was lost waits
+  // here until it is back, or hears that it is not.
   template <class... Values, class Work>
   void withDrive(std::type_identity_t<Reply<Values..., NSErrorPtr>> reply, Work work) {
     withDrive<Values...>(std::move(reply), std::move(work), tools().deadline);
@@ -61,10 +61,15 @@ class DriveRequests final : public std::enable_shared_from_this<DriveRequests> {
   HostItem place(NSFileProviderItemPtr item) const;
 
  private:
+  static constexpr int kTries = 4;
+
+  // Calls `then` once vald has answered, or with the error of the last of `tries`: a vald that
+  // is just ending, or coming, closes the connection of whoever asks it.
+  void reachVald(int tries, UniqueFunction<void(NSErrorPtr)> then);
+
   const std::shared_ptr<FileProviderHost> _host;
   const DaemonProxies _daemon;
   const ItemPaths _paths;
-  std::atomic<bool> _driveIsKnown{false};
 };
 
 // For calls that go straight to vald: its answer, or the connection's error.
@@ -79,20 +84,13 @@ void DriveRequests::withDrive(std::type_identity_t<Reply<Values..., NSErrorPtr>>
   HostTools timing = tools();
   timing.deadline = deadline;
   auto timed = TimedReply<Values...>::begin(timing, std::move(reply));
-  if (_driveIsKnown) {
-    tools().executor->post([timed, work = std::move(work)]() mutable { work(std::move(timed)); });
-    return;
-  }
-  _daemon(failing(timed))
-      ->containers([self = shared_from_this(), timed, work = std::move(work)](
-                       const std::vector<VLContainer::Properties>&, NSErrorPtr error) mutable {
-        if (error) {
-          (*timed)(Values()..., std::move(error));
-          return;
-        }
-        self->_driveIsKnown = true;
-        work(std::move(timed));
-      });
+  reachVald(kTries, [timed, work = std::move(work)](NSErrorPtr error) mutable {
+    if (error) {
+      (*timed)(Values()..., std::move(error));
+    } else {
+      work(std::move(timed));
+    }
+  });
 }
 
 }  // namespace skein

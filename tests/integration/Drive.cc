@@ -123,6 +123,12 @@ std::vector<std::string> Result::lines() const {
   return result;
 }
 
+std::vector<std::string> Drive::list(const std::string& path) const {
+  const Result result = run({"ls", path});
+  EXPECT_EQ(result.code, 0) << result.errors;
+  return result.lines();
+}
+
 Drive::Drive() {
   std::string name = testing::TempDir() + "skein-drive-XXXXXX";
   if (mkdtemp(name.data()) == nullptr) throw std::runtime_error("mkdtemp");

@@ -62,7 +62,8 @@ class Drive {
 
   // Runs `skein ARGUMENTS` to its end.
   Result run(const Arguments& arguments) const;
-  std::vector<std::string> list(const std::string& path) const { return run({"ls", path}).lines(); }
+  // The names in a folder; none, and a failed test, when it cannot be listed.
+  std::vector<std::string> list(const std::string& path) const;
   std::unique_ptr<Process> start(const Arguments& arguments) const;
   // Runs a line of sh(1), where `skein` is this drive's, from the folder for such things.
   Result shell(const std::string& line) const;

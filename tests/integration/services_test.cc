@@ -124,7 +124,8 @@ TEST_F(ServicesOfDrive, ClientsThatDieAtAnyTimeLeaveNothingBehind) {
     client->readLine(std::chrono::milliseconds(8 * stage));
     sendSignal(client->pid(), SIGKILL);
   }
-  EXPECT_EQ(drive.run({"share", "info", "/letter.txt"}).code, 0);
+  const Result after = drive.run({"share", "info", "/letter.txt"});
+    EXPECT_EQ(after.code, 0) << after.errors;
   EXPECT_EQ(drive.host(), host);
   EXPECT_TRUE(becomesTrue([&] { return descriptorsOf(host) <= before; }))
       << descriptorsOf(host) << " descriptors, " << before << " before";
@@ -172,7 +173,8 @@ class LostDaemon : public ServicesOfDrive {
     EXPECT_LT(time, 1s) << method;
     EXPECT_EQ(outcome.replies->count(), 0U);
     // Everything goes on with a new vald.
-    EXPECT_EQ(drive.run({"share", "info", "/letter.txt"}).code, 0);
+    const Result after = drive.run({"share", "info", "/letter.txt"});
+    EXPECT_EQ(after.code, 0) << after.errors;
     return std::get<NSErrorPtr>(values);
   }
   std::shared_ptr<ServiceConnection> connect(const char* serviceName) {
