@@ -214,7 +214,7 @@ bool change(CKShare& share, const ShareOptions& options) {
 }
 
 int runSave(ServiceSession& session, const ShareOptions& options, bool isNew) {
-  bool refused = false;
+  std::optional<ExitCode> refused;
   const int code =
       withSharing(session, options, [&](const Sharing& sharing, Output& output) -> NSErrorPtr {
         const auto [share, error] = fetchShare(session, sharing);
@@ -223,12 +223,12 @@ int runSave(ServiceSession& session, const ShareOptions& options, bool isNew) {
           complain(isNew ? "this is shared already; change the share with: skein share save " +
                                options.item
                          : "this is not shared; share it with: skein share create " + options.item);
-          refused = true;
+          refused = isNew ? kCollision : kFailure;
           return nullptr;
         }
         CKShare wanted = *share;
         if (!change(wanted, options)) {
-          refused = true;
+          refused = kUsage;
           return nullptr;
         }
         const auto [saved, problem] = session.ask<CKSharePtr>([&](auto reply) {
@@ -237,8 +237,7 @@ int runSave(ServiceSession& session, const ShareOptions& options, bool isNew) {
         if (saved && !problem) writeShare(output, *saved, options.json);
         return problem;
       });
-  if (!refused) return code;
-  return isNew ? kCollision : kFailure;
+  return refused ? *refused : code;
 }
 
 int runURL(ServiceSession& session, const ShareOptions& options) {

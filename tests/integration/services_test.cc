@@ -59,7 +59,7 @@ TEST_F(ServicesOfDrive, ADocumentIsSharedChangedAndNoLongerShared) {
   EXPECT_EQ(ask({"share", "info", "/letter.txt"})["shared"], true);
   const json saved = ask({"share", "save", "/letter.txt", "--without", "ada"});
   EXPECT_EQ(saved["participants"].size(), 2U);
-  EXPECT_EQ(drive.run({"share", "save", "/letter.txt", "--without", "nobody"}).code, 1);
+  EXPECT_EQ(drive.run({"share", "save", "/letter.txt", "--without", "nobody"}).code, 2);
 
   EXPECT_EQ(ask({"collab", "version", "/letter.txt"}),
             json({{"version", 1}, {"capabilities", 82}, {"provider", "com.tessel.Vellum"}}));
@@ -96,7 +96,7 @@ TEST_F(ServicesOfDrive, WhatIsNotOfferedIsToldSo) {
   EXPECT_EQ(drive.run({"share", "show", "/"}).code, 1);
   EXPECT_EQ(drive.run({"share", "info", "/nothing"}).code, 3);
   EXPECT_EQ(drive.run({"collab", "token", "/Team"}).code, 1);
-  EXPECT_EQ(drive.run({"share", "create", "/letter.txt", "--with", ":write"}).code, 1);
+  EXPECT_EQ(drive.run({"share", "create", "/letter.txt", "--with", ":write"}).code, 2);
   EXPECT_EQ(drive.run({"share", "create", "/letter.txt", "--public", "all"}).code, 2);
   EXPECT_EQ(drive.run({"account", "logout"}).code, 0);
   EXPECT_EQ(drive.run({"share", "info", "/letter.txt"}).code, 4);
