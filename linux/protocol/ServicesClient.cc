@@ -466,7 +466,7 @@ class HostServicesProxy final : public HostServices {
                               .getServices()
                               .castAs<wire::Services>();
           return build(kj::mv(services))
-              .then([decode = std::move(decode), shared](auto&& results) mutable -> Task {
+              .then([shared, decode = std::move(decode)](auto&& results) mutable -> Task {
                 return
                     [shared, value = decode(results), error = codec::errorOf(results)]() mutable {
                       (*shared)(std::move(value), std::move(error));

@@ -209,19 +209,20 @@ class SharesProxy final : public LocalShares {
     _calls.call<wire::Shares>(
         [build = std::move(build), decode = std::move(decode),
          cancellable = std::move(cancellable)](wire::Shares::Client& shares) mutable {
-          std::tuple<Values...> givenUp;
-          std::get<NSErrorPtr>(givenUp) = cancelled();
-          kj::Promise<std::tuple<Values...>> answered = nullptr;
+          auto givenUp = kj::heap<std::tuple<Values...>>();
+          std::get<NSErrorPtr>(*givenUp) = cancelled();
+          kj::Promise<kj::Own<std::tuple<Values...>>> answered = nullptr;
           if (!cancellable->isCancelled()) {
             answered = build(shares).then([decode = std::move(decode)](auto&& results) {
-              return std::tuple<Values...>(decode(results));
+              return kj::heap<std::tuple<Values...>>(decode(results));
             });
           }
-          return cancellable->unlessCancelled(kj::mv(answered), std::move(givenUp))
+          return cancellable->unlessCancelled(kj::mv(answered), kj::mv(givenUp))
               .attach(std::move(cancellable));
         },
-        [reply = std::move(reply), progress](std::tuple<Values...>& values) mutable -> Task {
-          return [reply = std::move(reply), progress, values = std::move(values)]() mutable {
+        [reply = std::move(reply),
+         progress](kj::Own<std::tuple<Values...>>& values) mutable -> Task {
+          return [reply = std::move(reply), progress, values = std::move(*values)]() mutable {
             progress->setCompletedUnitCount(1);
             std::apply([&](Values&... each) { reply(std::move(each)...); }, values);
           };
