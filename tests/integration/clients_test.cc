@@ -3,6 +3,7 @@
 // index and the listing agree. SKEIN_LONG=1 makes a minute of it.
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <atomic>
 #include <csignal>
 #include <cstdlib>
@@ -11,7 +12,6 @@
 #include <map>
 #include <nlohmann/json.hpp>
 #include <random>
-#include <set>
 #include <thread>
 
 #include "base/ThreadPool.h"
@@ -108,6 +108,11 @@ class Answer {
   const std::shared_ptr<State> _state = std::make_shared<State>();
 };
 
+std::shared_ptr<HostService> connect(const std::string& socket) {
+  return makeHostClient(RpcLoop::start("client"), std::make_shared<ThreadPool>(1, "client"),
+                        {"skein-host", socket, std::nullopt, 4000ms});
+}
+
 // A client with a connection of its own.
 class Client {
  public:
@@ -117,8 +122,7 @@ class Client {
         _random(static_cast<unsigned>(number)),
         _tree(tree),
         _tally(tally),
-        _host(makeHostClient(RpcLoop::start("client"), std::make_shared<ThreadPool>(1, "client"),
-                             {"skein-host", socket, std::nullopt, 4000ms})) {}
+        _host(connect(socket)) {}
 
   void work(Clock::time_point end) {
     while (Clock::now() < end) perform(_random() % 12);
@@ -282,31 +286,37 @@ class Trouble {
   std::mt19937 _random{20261125};
 };
 
-// Every document that is listed or in the trash, by identifier, with its path.
-std::map<std::string, std::string> presentDocuments(const Drive& drive) {
-  std::map<std::string, std::string> present;
+struct Present {
+  std::string path;
+  bool isDownloaded = false;
+};
+
+// Every document that is listed or in the trash, by identifier.
+std::map<std::string, Present> presentDocuments(const Drive& drive) {
+  std::map<std::string, Present> present;
   for (const Arguments& arguments :
        {Arguments{"ls", "-R", "--json", "/"}, Arguments{"trash", "list", "--json"}}) {
     const Result result = drive.run(arguments);
     EXPECT_EQ(result.code, 0) << result.errors;
     for (const std::string& line : result.lines()) {
       const auto item = nlohmann::json::parse(line);
-      if (item["kind"] == "document") present[item["id"]] = item["path"];
+      if (item["kind"] == "document") present[item["id"]] = {item["path"], item["downloaded"]};
     }
   }
   return present;
 }
 
-// Whether a request removed the document, or an import of it was given up.
-bool hasBeenRemoved(const Drive& drive, const std::string& identifier) {
-  for (const std::string& line : drive.run({"why", "--json", identifier}).lines()) {
-    const auto entry = nlohmann::json::parse(line);
-    const std::string origin = entry["origin"];
-    if (entry["operation"] == "remove" && !entry["undone"] && origin.starts_with("client ")) {
-      return true;
-    }
-  }
-  return false;
+// Whether a request of a client removed the document.
+bool hasBeenRemoved(HostService& host, const std::string& identifier) {
+  Tally tally;
+  Answer<std::vector<FileHistoryEntry>> answer(tally);
+  host.files().history(HostTarget::identifier(identifier), 100, answer.reply());
+  const auto history = answer.wait();
+  if (!history) return false;
+  const auto& entries = std::get<0>(*history);
+  return std::any_of(entries.begin(), entries.end(), [](const FileHistoryEntry& entry) {
+    return entry.operation == "remove" && !entry.undone && entry.origin.starts_with("client ");
+  });
 }
 
 TEST(Clients, AreAllAnsweredAndLoseNothingWhileValdFailsAndIsKilled) {
@@ -339,12 +349,16 @@ TEST(Clients, AreAllAnsweredAndLoseNothingWhileValdFailsAndIsKilled) {
   const Result doctor = drive.run({"doctor"});
   EXPECT_EQ(doctor.code, 0) << doctor.output;
   const auto present = presentDocuments(drive);
+  const auto host = connect(socket);
   for (const auto& [identifier, text] : tree.documents()) {
     const auto at = present.find(identifier);
     if (at == present.end()) {
-      EXPECT_TRUE(hasBeenRemoved(drive, identifier)) << "nobody removed " << text;
-    } else if (!at->second.starts_with("/.Trash")) {
-      EXPECT_EQ(drive.run({"cat", identifier}).output, text);
+      EXPECT_TRUE(hasBeenRemoved(*host, identifier)) << "nobody removed " << text;
+    } else if (at->second.isDownloaded) {
+      std::ifstream file(drive.store() + at->second.path, std::ios::binary);
+      EXPECT_EQ(std::string(std::istreambuf_iterator<char>(file), {}), text) << at->second.path;
+    } else {
+      EXPECT_EQ(drive.run({"cat", identifier}).output, text) << at->second.path;
     }
   }
 }
