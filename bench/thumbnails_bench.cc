@@ -24,6 +24,7 @@
 #include "linux/protocol/DaemonServer.h"
 #include "linux/vald/Daemon.h"
 #include "linux/vald/Drive.h"
+#include "linux/vald/DriveListener.h"
 #include "linux/vald/cloud/RecordFetches.h"
 #include "linux/vald/shares/Shares.h"
 
@@ -108,6 +109,7 @@ class Vald {
 
   using Drive = vald::Drive;
   using DriveOptions = vald::DriveOptions;
+  const fs::path _top;
   std::vector<std::string> identifiers;
   NoLog log;
   std::shared_ptr<Executor> executor = std::make_shared<ThreadPool>(4, "vald");
@@ -147,7 +149,6 @@ class Vald {
     }
   }
 
-  const fs::path _top;
   std::unique_ptr<vald::ShareRecords> shareRecords;
   std::unique_ptr<vald::Accounts> _accounts;
   std::shared_ptr<vald::Shares> shares;

@@ -138,6 +138,7 @@ class Gallery {
 NSErrorPtr runBatch(HostService& host, const std::vector<std::string>& items,
                     const ThumbOptions& options, Gallery& gallery) {
   std::vector<HostTarget> targets;
+  targets.reserve(items.size());
   for (const std::string& item : items) targets.push_back(targetOf(item));
   const auto side = static_cast<double>(options.size);
   const auto [batch, refused] = await<std::shared_ptr<HostThumbnailBatch>>([&](auto reply) {

@@ -60,8 +60,9 @@ Sizes sizesOf(GKeyFile* index, const std::string& folder) {
 std::vector<std::pair<std::string, Sizes>> usualFolders() {
   std::vector<std::pair<std::string, Sizes>> folders;
   for (const int size : {16, 22, 24, 32, 36, 48, 64, 72, 96, 128, 192, 256, 512}) {
-    const std::string side = std::to_string(size);
-    folders.push_back({side + "x" + side + "/apps", {size - 2, size + 2, 1}});
+    std::string folder = std::to_string(size);
+    folder += "x" + folder + "/apps";
+    folders.push_back({std::move(folder), {size - 2, size + 2, 1}});
   }
   folders.push_back({"scalable/apps", {1, 512, 1}});
   return folders;
@@ -147,7 +148,7 @@ void IconTheme::add(const std::string& name, std::vector<std::string>& seen) {
     if (sizes.scale != 1) continue;
     for (const std::string& base : _baseFolders) {
       std::error_code ignored;
-      Folder there{base + "/" + name + "/" + folder, sizes.least, sizes.most};
+      Folder there{fs::path(base) / name / folder, sizes.least, sizes.most};
       if (fs::is_directory(there.path, ignored)) theme.push_back(std::move(there));
     }
   }
