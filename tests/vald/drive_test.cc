@@ -382,10 +382,14 @@ TEST_F(DriveTest, WhatIsNotSafelyUploadedIsNotEvicted) {
   EXPECT_EQ(evicted("small.txt"), code(EvictionRefusal::AlreadyEvicted));
 
   // The cloud is away; a cancelled download leaves nothing.
-  drive->cloud().setConditions({.offline = true}, [](NSErrorPtr error) { EXPECT_FALSE(error); });
+  LocalCloudConditions conditions;
+  conditions.offline = true;
+  drive->cloud().setConditions(conditions, [](NSErrorPtr error) { EXPECT_FALSE(error); });
   EXPECT_TRUE(eventually([&] { return drive->cloud().conditions().settings().offline; }));
   EXPECT_NE(downloaded("small.txt"), "");
-  drive->cloud().setConditions({.delayMilliseconds = 60'000}, [](NSErrorPtr) {});
+  conditions = {};
+  conditions.delayMilliseconds = 60'000;
+  drive->cloud().setConditions(conditions, [](NSErrorPtr) {});
   EXPECT_TRUE(eventually([&] { return !drive->cloud().conditions().settings().offline; }));
   std::shared_ptr<NSProgress> progress;
   const auto error = std::get<0>(ask<NSErrorPtr>([&](LocalFiles& files, auto reply) {
