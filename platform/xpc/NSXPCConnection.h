@@ -41,7 +41,7 @@ class NSXPCConnection {
 
   // From now on the client's messages reach the exported object.
   virtual void resume() = 0;
-  // Ends it; idempotent. What is under way is not answered any more.
+  // Ends it; idempotent. No further message reaches the exported object.
   virtual void invalidate() = 0;
 };
 
