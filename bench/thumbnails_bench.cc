@@ -99,8 +99,8 @@ class Vald {
         executor, drive->cloud().records(), drive->cloud().conditions(), clock, faults});
     daemon = std::make_shared<vald::Daemon>(vald::DaemonParts{
         executor, executor, drive->store(), senders, accounts(), containers, subscribers,
-        drive->files(), *fetches, *shares, faults, log, (top / "drive").string(), [] {},
-        [](const std::vector<vald::StoreRoot>&) {}});
+        drive->files(), *fetches, *shares, drive->cloud(), faults, log, (top / "drive").string(),
+        [] {}, [](const std::vector<vald::StoreRoot>&) {}});
     server = DaemonServer::listen(loop, executor, daemon, socket(), log, &error);
     if (!server) std::abort();
   }

@@ -157,6 +157,20 @@ void HostRequests::status(Reply<HostStatus, NSErrorPtr> reply) {
       });
 }
 
+void HostRequests::cloudStatus(Reply<LocalCloudStatus, NSErrorPtr> reply) {
+  auto timed = TimedReply<LocalCloudStatus>::begin(_host->tools(), std::move(reply));
+  _daemon(failing(timed))->cloud().cloudStatus([timed](LocalCloudStatus status, NSErrorPtr error) {
+    (*timed)(std::move(status), std::move(error));
+  });
+}
+
+void HostRequests::setCloudConditions(LocalCloudConditions conditions, Reply<NSErrorPtr> reply) {
+  auto timed = TimedReply<>::begin(_host->tools(), std::move(reply));
+  _daemon(failing(timed))->cloud().setConditions(conditions, [timed](NSErrorPtr error) {
+    (*timed)(std::move(error));
+  });
+}
+
 void HostRequests::check(Reply<std::shared_ptr<HostCheck>, NSErrorPtr> reply) {
   withDrive<std::shared_ptr<HostCheck>>(
       std::move(reply), [self = shared_from_this()](Timed<std::shared_ptr<HostCheck>> timed) {

@@ -28,6 +28,8 @@ class HostRequests final : public HostService, public std::enable_shared_from_th
   void logIn(LocalAccount account, Reply<NSErrorPtr> reply) override;
   void logOut(Reply<NSErrorPtr> reply) override;
   void status(Reply<HostStatus, NSErrorPtr> reply) override;
+  void cloudStatus(Reply<LocalCloudStatus, NSErrorPtr> reply) override;
+  void setCloudConditions(LocalCloudConditions conditions, Reply<NSErrorPtr> reply) override;
   void check(Reply<std::shared_ptr<HostCheck>, NSErrorPtr> reply) override;
   void setDebugLog(bool enabled, Reply<NSErrorPtr> reply) override;
   HostFiles& files() override { return *_files; }

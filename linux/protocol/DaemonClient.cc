@@ -4,6 +4,7 @@
 #include <vector>
 
 #include "base/SerialQueue.h"
+#include "linux/protocol/CloudProxy.h"
 #include "linux/protocol/DaemonCalls.h"
 #include "linux/protocol/DaemonCodec.h"
 #include "linux/protocol/FilesProxy.h"
@@ -60,11 +61,13 @@ class DaemonProxy final : public LocalDaemon {
       : _calls(std::move(calls)),
         _files(makeFilesProxy(_calls)),
         _records(makeRecordsProxy(_calls)),
-        _shares(makeSharesProxy(_calls)) {}
+        _shares(makeSharesProxy(_calls)),
+        _cloud(makeCloudProxy(_calls)) {}
 
   LocalFiles& files() override { return *_files; }
   LocalRecords& records() override { return *_records; }
   LocalShares& shares() override { return *_shares; }
+  LocalCloud& cloud() override { return *_cloud; }
 
   void enumerateItemsInFolder(std::optional<VLFileObjectID> folder, std::uint8_t sortOrder,
                               std::uint64_t offset, std::uint64_t limit,
@@ -326,6 +329,7 @@ class DaemonProxy final : public LocalDaemon {
   const std::unique_ptr<LocalFiles> _files;
   const std::unique_ptr<LocalRecords> _records;
   const std::unique_ptr<LocalShares> _shares;
+  const std::unique_ptr<LocalCloud> _cloud;
 };
 
 }  // namespace

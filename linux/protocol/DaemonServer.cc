@@ -5,6 +5,7 @@
 #include <vector>
 
 #include "linux/protocol/Answer.h"
+#include "linux/protocol/CloudObject.h"
 #include "linux/protocol/DaemonReferences.h"
 #include "linux/protocol/FilesObject.h"
 #include "linux/protocol/LinkBreaking.h"
@@ -38,12 +39,14 @@ void encodeAll(auto list, const auto& values) {
 
 // vald, as one connection sees it. Lives on the loop's thread.
 class DaemonObject : public wire::Daemon::Server,
+                     public CloudObject,
                      public FilesObject,
                      public RecordsObject,
                      public SharesObject {
  public:
   explicit DaemonObject(DaemonServicePtr service)
-      : FilesObject(service),
+      : CloudObject(service),
+        FilesObject(service),
         RecordsObject(service),
         SharesObject(service),
         _service(std::move(service)) {}

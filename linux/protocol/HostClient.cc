@@ -2,6 +2,7 @@
 
 #include <utility>
 
+#include "linux/protocol/CloudCodec.h"
 #include "linux/protocol/HostCalls.h"
 #include "linux/protocol/HostCodec.h"
 #include "linux/protocol/HostFilesProxy.h"
@@ -158,6 +159,22 @@ class HostProxy final : public HostService, private HostCalls<wire::Host> {
   void status(Reply<HostStatus, NSErrorPtr> reply) override {
     call<HostStatus>([](wire::Host::Client& host) { return host.statusRequest().send(); },
                      [](auto& results) { return codec::decode(results.getStatus()); }, reply);
+  }
+
+  void cloudStatus(Reply<LocalCloudStatus, NSErrorPtr> reply) override {
+    call<LocalCloudStatus>(
+        [](wire::Host::Client& host) { return host.cloudStatusRequest().send(); },
+        [](auto& results) { return codec::decode(results.getStatus()); }, reply);
+  }
+
+  void setCloudConditions(LocalCloudConditions conditions, Reply<NSErrorPtr> reply) override {
+    callForError(
+        [conditions](wire::Host::Client& host) {
+          auto request = host.setCloudConditionsRequest();
+          codec::encode(request.initConditions(), conditions);
+          return request.send();
+        },
+        reply);
   }
 
   void check(Reply<std::shared_ptr<HostCheck>, NSErrorPtr> reply) override {

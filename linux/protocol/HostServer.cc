@@ -2,6 +2,7 @@
 
 #include <utility>
 
+#include "linux/protocol/CloudCodec.h"
 #include "linux/protocol/HostCodec.h"
 #include "linux/protocol/HostFilesObject.h"
 #include "linux/protocol/HostPeer.h"
@@ -197,6 +198,24 @@ class HostObject final : public virtual wire::Host::Server,
           codec::encode(results.initStatus(), status);
           codec::setError(results, error);
         });
+  }
+
+  kj::Promise<void> cloudStatus(CloudStatusContext context) override {
+    return answerOnExecutor(
+        _peer, context,
+        [service = service()](auto reply) { service->cloudStatus(std::move(reply)); },
+        [](auto results, const LocalCloudStatus& status, const NSErrorPtr& error) {
+          codec::encode(results.initStatus(), status);
+          codec::setError(results, error);
+        });
+  }
+
+  kj::Promise<void> setCloudConditions(SetCloudConditionsContext context) override {
+    return answerOnExecutor(
+        _peer, context,
+        [service = service(), conditions = codec::decode(context.getParams().getConditions())](
+            auto reply) { service->setCloudConditions(conditions, std::move(reply)); },
+        encodeError);
   }
 
   kj::Promise<void> check(CheckContext context) override {

@@ -89,6 +89,9 @@ class HostService {
   virtual void logIn(LocalAccount account, Reply<NSErrorPtr> reply) = 0;
   virtual void logOut(Reply<NSErrorPtr> reply) = 0;
   virtual void status(Reply<HostStatus, NSErrorPtr> reply) = 0;
+  virtual void cloudStatus(Reply<LocalCloudStatus, NSErrorPtr> reply) = 0;
+  // Errors as LocalCloud says.
+  virtual void setCloudConditions(LocalCloudConditions conditions, Reply<NSErrorPtr> reply) = 0;
   virtual void check(Reply<std::shared_ptr<HostCheck>, NSErrorPtr> reply) = 0;
   virtual void setDebugLog(bool enabled, Reply<NSErrorPtr> reply) = 0;
 

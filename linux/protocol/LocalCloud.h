@@ -20,6 +20,8 @@ struct LocalCloudConditions {
   std::uint32_t delayMilliseconds = 0;  // before a transfer's first byte
   std::uint64_t bytesPerSecond = 0;     // of each transfer; 0: no limit
   std::uint32_t failures = 0;           // this many transfers fail at their start, as offline
+
+  friend bool operator==(const LocalCloudConditions&, const LocalCloudConditions&) = default;
 };
 
 struct LocalCloudStatus {
@@ -29,13 +31,16 @@ struct LocalCloudStatus {
     Unlimited,  // wanted so, or uploads share the documents' blocks
   };
   Uploads uploads = Uploads::Bounded;
-  std::uint64_t uploadLimit = 0;  // bytes in the cloud; with Bounded alone
-  bool sharesBlocks = false;      // the file system keeps equal blocks once
-  std::uint64_t usedBytes = 0;    // in the cloud
-  std::uint64_t waiting = 0;      // documents whose upload is to come, or runs
-  std::uint64_t failed = 0;       // documents whose upload failed; tried again when they change
-  std::uint64_t leftOut = 0;      // documents that are not uploaded because of the limit
-  std::string lastFailure;        // why the latest of them failed; empty when none did
+  std::uint64_t uploadLimit = 0;    // bytes in the cloud; with Bounded alone
+  bool sharesBlocks = false;        // the file system keeps equal blocks once
+  std::uint64_t usedBytes = 0;      // in the cloud
+  std::uint64_t waiting = 0;        // documents whose upload is to come, or runs
+  std::uint64_t failed = 0;         // documents whose upload failed; tried again when they change
+  std::uint64_t leftOut = 0;        // documents that are not uploaded because of the limit
+  std::string lastFailure;          // why the latest of them failed; empty when none did
+  LocalCloudConditions conditions;  // in force
+
+  friend bool operator==(const LocalCloudStatus&, const LocalCloudStatus&) = default;
 };
 
 // Threads, replies and errors as LocalDaemon says.

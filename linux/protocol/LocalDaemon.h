@@ -10,6 +10,7 @@
 #include <string>
 #include <vector>
 
+#include "linux/protocol/LocalCloud.h"
 #include "linux/protocol/LocalFiles.h"
 #include "linux/protocol/LocalRecords.h"
 #include "linux/protocol/LocalShares.h"
@@ -91,6 +92,8 @@ class LocalDaemon : public VLDaemon {
   virtual LocalRecords& records() = 0;
   // Its shares, likewise.
   virtual LocalShares& shares() = 0;
+  // The local cloud itself, likewise.
+  virtual LocalCloud& cloud() = 0;
 
   // The framework's questions about sharing, asked of shares().
   void checkIfItemIsShareableWithInode(std::uint64_t inode, Reply<bool, NSErrorPtr> reply) final;

@@ -6,6 +6,7 @@ using Cxx = import "/capnp/c++.capnp";
 $Cxx.namespace("skein::wire");
 
 using Types = import "types.capnp";
+using Cloud = import "cloud.capnp";
 using Files = import "files.capnp";
 using Records = import "records.capnp";
 using Shares = import "shares.capnp";
@@ -59,7 +60,7 @@ struct Fault {
   times @5 :UInt32;
 }
 
-interface Daemon extends(Files.Files, Records.Records, Shares.Shares) {
+interface Daemon extends(Cloud.Cloud, Files.Files, Records.Records, Shares.Shares) {
   enumerateItemsInFolder @0 (folder :Types.ObjectID, sortOrder :UInt8, offset :UInt64,
                              limit :UInt64)
       -> (items :List(Types.Item), nextOffset :UInt64, error :Types.Error);

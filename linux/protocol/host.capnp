@@ -5,6 +5,7 @@
 using Cxx = import "/capnp/c++.capnp";
 $Cxx.namespace("skein::wire");
 
+using Cloud = import "cloud.capnp";
 using Daemon = import "daemon.capnp";
 using HostFiles = import "hostfiles.capnp";
 using HostThumbnails = import "hostthumbnails.capnp";
@@ -51,6 +52,8 @@ interface Host extends(HostFiles.HostFiles, HostThumbnails.HostThumbnails) {
   check @10 () -> (check :Check, error :Types.Error);
   setDebugLog @11 (enabled :Bool) -> (error :Types.Error);
   services @12 () -> (services :Capability);  # Services of services.capnp
+  cloudStatus @13 () -> (status :Cloud.CloudStatus, error :Types.Error);
+  setCloudConditions @14 (conditions :Cloud.CloudConditions) -> (error :Types.Error);
 }
 
 # Streams: each ends when its last reference goes. next may be called again before the

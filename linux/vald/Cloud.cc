@@ -168,8 +168,8 @@ void Cloud::setConditions(LocalCloudConditions conditions, Reply<NSErrorPtr> rep
       return reply(NSError::errorWithDomain(
           NSCocoaErrorDomain, NSFeatureUnsupportedError,
           {{NSLocalizedDescriptionKey,
-            std::string("vald was not started with faults allowed; set SKEIN_ALLOW_FAULTS=1 "
-                        "and start it again.")}}));
+            std::string("vald was started without SKEIN_ALLOW_FAULTS=1; stop the drive "
+                        "(skein stop) and start it with that variable set.")}}));
     }
     _conditions.change([&](CloudConditions::Settings& settings) {
       settings = {};
@@ -198,6 +198,11 @@ void Cloud::cloudStatus(Reply<LocalCloudStatus, NSErrorPtr> reply) {
       status.leftOut = asked->leftOut();
       status.lastFailure = asked->lastFailure();
     }
+    const CloudConditions::Settings settings = _conditions.settings();
+    status.conditions = {
+        settings.offline,        settings.corrupt,
+        settings.quota,          static_cast<std::uint32_t>(settings.delay.count()),
+        settings.bytesPerSecond, settings.failures};
     reply(std::move(status), nullptr);
   });
 }

@@ -29,6 +29,7 @@ struct DaemonParts {
   LocalFiles& files;
   LocalRecords& records;
   LocalShares& shares;
+  LocalCloud& cloud;
   FaultInjector& faults;
   Log& log;
   std::string drive;           // the drive's folder, absolute
@@ -48,6 +49,7 @@ class Daemon final : public LocalDaemon, public std::enable_shared_from_this<Dae
   LocalFiles& files() override { return _parts.files; }
   LocalRecords& records() override { return _parts.records; }
   LocalShares& shares() override { return _parts.shares; }
+  LocalCloud& cloud() override { return _parts.cloud; }
 
   void enumerateItemsInFolder(std::optional<VLFileObjectID> folder, std::uint8_t sortOrder,
                               std::uint64_t offset, std::uint64_t limit,

@@ -138,7 +138,7 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
        [&shares](VLFileObjectID document) { return shares->attachedZoneOf(document); }});
   auto daemon = std::make_shared<Daemon>(DaemonParts{
       executor, slowExecutor, store, senders, accounts, containers, subscribers, drive->files(),
-      recordFetches, *shares, *faults, log, paths.store, stop,
+      recordFetches, *shares, drive->cloud(), *faults, log, paths.store, stop,
       [&drive](const std::vector<StoreRoot>& roots) { drive->containersWillChange(roots); }});
   listener.setAfterChange([weak = std::weak_ptr<Daemon>(daemon)] {
     if (const auto changed = weak.lock()) changed->refreshDriveFolders();

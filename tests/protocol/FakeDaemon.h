@@ -12,9 +12,10 @@
 #include "base/Mutex.h"
 #include "linux/protocol/LinkBreaking.h"
 #include "linux/protocol/LocalDaemon.h"
+#include "tests/protocol/FakeCloud.h"
 #include "tests/protocol/FakeFiles.h"
-#include "tests/protocol/FakeShares.h"
 #include "tests/protocol/FakeRecords.h"
+#include "tests/protocol/FakeShares.h"
 
 namespace skein {
 
@@ -62,6 +63,8 @@ class FakeDaemon final : public LocalDaemon {
   LocalShares& shares() override { return fakeShares; }
   FakeRecords fakeRecords;
   LocalRecords& records() override { return fakeRecords; }
+  FakeCloud fakeCloud;
+  LocalCloud& cloud() override { return fakeCloud; }
 
   // What is answered; set it before asking.
   VLQueryItems items;

@@ -13,6 +13,7 @@
 
 #include "linux/vald/Daemon.h"
 #include "linux/vald/shares/Shares.h"
+#include "tests/protocol/FakeCloud.h"
 #include "tests/protocol/FakeFiles.h"
 #include "tests/support/ManualExecutor.h"
 #include "tests/vald/FakeStore.h"
@@ -89,9 +90,9 @@ class TestDaemon {
     shareRecords = std::move(*ShareRecords::open(state.path + "/shares.sqlite"));
     shares = std::make_shared<Shares>(SharesParts{executor, *store, *shareRecords, sharedItems,
                                                   *accounts, *containers, log, drive.path});
-    daemon = std::make_shared<Daemon>(DaemonParts{executor, executor, *store, senders, *accounts,
-                                                  *containers, subscribers, files, records, *shares,
-                                                  faults, log, drive.path, [this] { ++stops; }});
+    daemon = std::make_shared<Daemon>(
+        DaemonParts{executor, executor, *store, senders, *accounts, *containers, subscribers, files,
+                    records, *shares, cloud, faults, log, drive.path, [this] { ++stops; }});
   }
 
   // Makes the call that `request(daemon, reply)` makes, and runs everything; the test
@@ -116,6 +117,7 @@ class TestDaemon {
   ItemUpdateSenders senders;
   EventSubscribers subscribers{executor};
   FakeFiles files;
+  FakeCloud cloud;
   FaultInjector faults{true};
   NoRecords records;
   std::optional<FakeStore> store;

@@ -1,0 +1,26 @@
+// vald's local cloud, as one connection sees it. Include this in few files: it costs seconds
+// to compile.
+#pragma once
+
+#include <utility>
+
+#include "linux/protocol/CloudCodec.h"
+#include "linux/protocol/DaemonService.h"
+
+namespace skein {
+
+// The part of vald's object that has to do with the cloud. Lives on the loop's thread.
+class CloudObject : public virtual wire::Cloud::Server {
+ public:
+  explicit CloudObject(DaemonServicePtr service) : _service(std::move(service)) {}
+
+  kj::Promise<void> setConditions(SetConditionsContext context) override;
+  kj::Promise<void> cloudStatus(CloudStatusContext context) override;
+
+ private:
+  LocalCloud& cloud() const { return _service->daemon->cloud(); }
+
+  const DaemonServicePtr _service;
+};
+
+}  // namespace skein
