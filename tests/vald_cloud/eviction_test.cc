@@ -70,6 +70,15 @@ TEST_F(EvictionTest, AFileGoesAndComesBackWithAllItHas) {
   EXPECT_EQ(brief(rig.evict(kDocument, path)), "none");
 }
 
+TEST_F(EvictionTest, TagsThatChangedAfterTheUploadGoWithTheFile) {
+  const std::string path = uploaded("a");
+  setTags(path, "new");
+  const std::string before = portraitOf(path);
+  ASSERT_EQ(brief(rig.evict(kDocument, path)), "none");
+  ASSERT_EQ(brief(rig.download(kDocument, path)), "none");
+  EXPECT_EQ(portraitOf(path), before);
+}
+
 TEST_F(EvictionTest, NamesOfEveryLengthAndByte) {
   const std::string odd = "a\n%b\xff é.txt";
   for (const std::string& name :
@@ -106,7 +115,10 @@ TEST_F(EvictionTest, WhatIsNotSafeStaysWithTheReason) {
   }
   const std::ifstream reader(path);  // who reads goes on reading
 
-  setTags(path, "new");
+  // Other words of the same length, with the date put back.
+  const auto date = std::filesystem::last_write_time(path);
+  std::ofstream(path) << "sword";
+  std::filesystem::last_write_time(path, date);
   EXPECT_EQ(refusal(path), code(EvictionRefusal::ChangedSinceUpload));
   ASSERT_TRUE(std::holds_alternative<UploadDone>(rig.upload(kDocument, path)));
 

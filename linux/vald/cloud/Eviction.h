@@ -13,7 +13,7 @@ namespace skein::vald {
 inline constexpr char SkeinEvictionErrorDomain[] = "SkeinEvictionErrorDomain";
 enum class EvictionRefusal : std::int64_t {
   NotUploaded = 1,         // or the cloud has lost its contents
-  ChangedSinceUpload = 2,  // in any way: contents, times, name or attributes
+  ChangedSinceUpload = 2,  // its contents or their date; or large, and anything about it
   Pinned = 3,
   OpenForWriting = 4,
   AlreadyEvicted = 5,
@@ -24,7 +24,8 @@ enum class EvictionRefusal : std::int64_t {
 };
 
 // Replaces files by their markers (see EvictionMarker.h). Any thread; calls block, for some
-// milliseconds however large the file is.
+// milliseconds however large the file is; a file that changed in its tags, its mode or its name
+// alone is read once more, and when it is too large for that it has to be uploaded again.
 //
 // The steps, so that a crash leaves the file or its marker and never neither:
 //   1. the marker is written beside the file under another name, and made durable;
@@ -52,6 +53,7 @@ class Eviction {
   NSErrorPtr check(Subject& subject);
   NSErrorPtr checkFile(Subject& subject);
   NSErrorPtr checkUpload(Subject& subject);
+  NSErrorPtr checkContents(Subject& subject, const HashedContents& uploaded);
   NSErrorPtr perform(Subject& subject);
   NSErrorPtr writeMarker(Subject& subject);
   NSErrorPtr setAside(Subject& subject);
