@@ -31,6 +31,7 @@ void addWhyCommand(CLI::App& app, Invocation& invocation);       // why
 void addThumbCommand(CLI::App& app, Invocation& invocation);     // thumb
 void addChangeCommands(CLI::App& app, Invocation& invocation);   // watch, changes
 void addAccountCommand(CLI::App& app, Invocation& invocation);   // account
+void addCloudCommand(CLI::App& app, Invocation& invocation);     // cloud
 void addStatusCommands(CLI::App& app, Invocation& invocation);   // status, doctor
 void addProcessCommands(CLI::App& app, Invocation& invocation);  // stop
 void addLogCommand(CLI::App& app, Invocation& invocation);       // log

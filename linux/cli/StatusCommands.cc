@@ -1,6 +1,7 @@
 // skein status, skein doctor
 #include <utility>
 
+#include "linux/cli/CloudText.h"
 #include "linux/cli/Commands.h"
 #include "linux/cli/ExitCodes.h"
 #include "linux/cli/Progress.h"
@@ -52,7 +53,7 @@ std::string watchText(const LocalDaemonStatus& daemon) {
   return text;
 }
 
-void writeStatus(Output& output, const HostStatus& status) {
+void writeStatus(Output& output, const HostStatus& status, const LocalCloudStatus& cloud) {
   const LocalDaemonStatus& daemon = status.daemon;
   const auto field = [&](std::string label, const std::string& value) {
     label.resize(12, ' ');
@@ -68,6 +69,7 @@ void writeStatus(Output& output, const HostStatus& status) {
   field("watch", watchText(daemon));
   field("changes", "up to " + std::to_string(daemon.rank) + ", kept from " +
                        std::to_string(daemon.oldestTokenRank));
+  field("cloud", summaryOf(cloud));
   field("account", !daemon.account ? "nobody is logged in"
                    : daemon.account->perAppAccountIdentifier
                        ? daemon.account->name
@@ -79,7 +81,7 @@ void writeStatus(Output& output, const HostStatus& status) {
                           (status.debugLog ? ", debug lines are logged" : ""));
 }
 
-void writeJson(Output& output, const HostStatus& status) {
+void writeJson(Output& output, const HostStatus& status, const LocalCloudStatus& cloud) {
   const LocalDaemonStatus& daemon = status.daemon;
   std::string json = "{\"store\":" + jsonString(daemon.store) + jsonBytes("store", daemon.store);
   const auto number = [&](const char* key, auto value) {
@@ -106,18 +108,21 @@ void writeJson(Output& output, const HostStatus& status) {
   number("hostProcessID", status.processID);
   number("watchedContainers", status.watchedContainers);
   json += std::string(",\"debugLog\":") + (status.debugLog ? "true" : "false");
-  output.write(json + "}\n");
+  output.write(json + ",\"cloud\":" + jsonOf(cloud) + "}\n");
 }
 
 int runStatus(HostService& host, bool json) {
   const auto [status, error] =
       await<HostStatus>([&](auto reply) { host.status(std::move(reply)); });
   if (error) return complainAbout(error);
+  const auto [cloud, problem] =
+      await<LocalCloudStatus>([&](auto reply) { host.cloudStatus(std::move(reply)); });
+  if (problem) return complainAbout(problem);
   Output output;
   if (json) {
-    writeJson(output, status);
+    writeJson(output, status, cloud);
   } else {
-    writeStatus(output, status);
+    writeStatus(output, status, cloud);
   }
   return kSuccess;
 }

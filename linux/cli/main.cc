@@ -47,6 +47,7 @@ int main(int argc, char** argv) {
   addChangeCommands(app, invocation);
   addAccountCommand(app, invocation);
   addStatusCommands(app, invocation);
+  addCloudCommand(app, invocation);
   addShareCommand(app, invocation);
   addCollabCommand(app, invocation);
   addLogCommand(app, invocation);

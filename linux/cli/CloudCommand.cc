@@ -1,0 +1,103 @@
+// skein cloud
+#include <utility>
+
+#include "linux/cli/CloudText.h"
+#include "linux/cli/Commands.h"
+#include "linux/cli/ExitCodes.h"
+#include "linux/cli/Progress.h"
+
+namespace skein::cli {
+namespace {
+
+struct StatusOptions {
+  bool json = false;
+};
+
+struct TryOptions {
+  LocalCloudConditions conditions;
+  bool reset = false;
+};
+
+int runCloudStatus(HostService& host, const StatusOptions& options) {
+  const auto [cloud, error] =
+      await<LocalCloudStatus>([&](auto reply) { host.cloudStatus(std::move(reply)); });
+  if (error) return complainAbout(error);
+  Output output;
+  if (options.json) {
+    output.write(jsonOf(cloud) + '\n');
+    return kSuccess;
+  }
+  const auto field = [&output](std::string label, const std::string& value) {
+    label.resize(14, ' ');
+    output.write(label);
+    output.writeName(value);
+    output.write("\n");
+  };
+  field("in the cloud", sizeText(cloud.usedBytes));
+  field("uploads", uploadsText(cloud));
+  field("waiting", std::to_string(cloud.waiting));
+  field("failed", std::to_string(cloud.failed));
+  field("left out", std::to_string(cloud.leftOut));
+  field("last failure", cloud.lastFailure.empty() ? "none" : cloud.lastFailure);
+  field("conditions", conditionsText(cloud.conditions));
+  return kSuccess;
+}
+
+int runTry(HostService& host, const TryOptions& options) {
+  if (!options.reset && options.conditions == LocalCloudConditions()) {
+    complain("nothing to try; name conditions, or end the trial with: skein cloud try --reset");
+    return kUsage;
+  }
+  const auto [error] =
+      await<>([&](auto reply) { host.setCloudConditions(options.conditions, std::move(reply)); });
+  return error ? complainAbout(error) : kSuccess;
+}
+
+}  // namespace
+
+void addCloudCommand(CLI::App& app, Invocation& invocation) {
+  auto* cloud = app.add_subcommand("cloud", "Show the local cloud, or try it out");
+  auto status = std::make_shared<StatusOptions>();
+  cloud->require_subcommand(0, 1);
+  cloud->add_flag("--json", status->json, "As one JSON object");
+  cloud->footer("Example: skein cloud");
+
+  auto options = std::make_shared<TryOptions>();
+  LocalCloudConditions& conditions = options->conditions;
+  auto* trial = cloud->add_subcommand("try", "Set how the cloud behaves, in place of before");
+  trial->fallthrough();
+  auto* reset = trial->add_flag("--reset", options->reset, "Behave as usual again");
+  const CLI::AsSizeValue size(false);
+  for (CLI::Option* option :
+       {trial->add_flag("--offline", conditions.offline, "It cannot be reached"),
+        trial->add_flag("--corrupt", conditions.corrupt, "Contents arrive with other bytes"),
+        trial
+            ->add_option("--quota", conditions.quota,
+                         "BYTES of room in all, such as 500K, 20M or 1G")
+            ->transform(size),
+        trial->add_option("--delay", conditions.delayMilliseconds,
+                          "MS before the first byte of each transfer"),
+        trial
+            ->add_option("--bandwidth", conditions.bytesPerSecond,
+                         "BYTES per second of each transfer, such as 500K or 20M")
+            ->transform(size),
+        trial->add_option("--failures", conditions.failures, "So many transfers fail at first")}) {
+    option->excludes(reset);
+  }
+  runs(trial, invocation,
+       "Only for a drive that was started with SKEIN_ALLOW_FAULTS=1.\n"
+       "Example: skein cloud try --delay 200 --bandwidth 1M\n"
+       "         skein cloud try --reset",
+       options, runTry);
+
+  // Runs after that of its subcommand.
+  cloud->callback([&invocation, cloud, status] {
+    if (!cloud->get_subcommands().empty()) return;
+    invocation.run = [&invocation, status] {
+      return withSession(invocation,
+                         [&](HostService& host) { return runCloudStatus(host, *status); });
+    };
+  });
+}
+
+}  // namespace skein::cli

@@ -1,0 +1,83 @@
+#include "linux/cli/CloudText.h"
+
+#include <string_view>
+
+#include "linux/cli/Output.h"
+#include "linux/cli/Progress.h"
+
+namespace skein::cli {
+namespace {
+
+using Uploads = LocalCloudStatus::Uploads;
+
+std::string_view wordOf(Uploads uploads) {
+  switch (uploads) {
+    case Uploads::Off: return "off";
+    case Uploads::Bounded: return "bounded";
+    case Uploads::Unlimited: return "unlimited";
+  }
+  return "off";
+}
+
+}  // namespace
+
+std::string uploadsText(const LocalCloudStatus& cloud) {
+  switch (cloud.uploads) {
+    case Uploads::Off: return "uploads are off";
+    case Uploads::Bounded: return "uploads up to " + sizeText(cloud.uploadLimit);
+    case Uploads::Unlimited: break;
+  }
+  return cloud.sharesBlocks ? "uploads without limit, sharing the documents' blocks"
+                            : "uploads without limit";
+}
+
+std::string conditionsText(const LocalCloudConditions& conditions) {
+  std::string text;
+  const auto add = [&text](const std::string& part) { text += (text.empty() ? "" : ", ") + part; };
+  if (conditions.offline) add("offline");
+  if (conditions.corrupt) add("corrupt contents");
+  if (conditions.quota) add("quota " + sizeText(*conditions.quota));
+  if (conditions.delayMilliseconds > 0) {
+    add("delay " + std::to_string(conditions.delayMilliseconds) + " ms");
+  }
+  if (conditions.bytesPerSecond > 0) {
+    add("bandwidth " + sizeText(conditions.bytesPerSecond) + "/s");
+  }
+  if (conditions.failures > 0) {
+    add("the next " + std::to_string(conditions.failures) + " transfers fail");
+  }
+  return text.empty() ? "none" : text;
+}
+
+std::string summaryOf(const LocalCloudStatus& cloud) {
+  std::string text = sizeText(cloud.usedBytes) + ", " + uploadsText(cloud);
+  if (cloud.waiting > 0) text += ", " + std::to_string(cloud.waiting) + " waiting";
+  if (cloud.failed > 0) text += ", " + std::to_string(cloud.failed) + " failed";
+  if (cloud.leftOut > 0) text += ", " + std::to_string(cloud.leftOut) + " left out";
+  if (cloud.conditions != LocalCloudConditions()) {
+    text += " (on trial: " + conditionsText(cloud.conditions) + ')';
+  }
+  return text;
+}
+
+std::string jsonOf(const LocalCloudStatus& cloud) {
+  const auto flag = [](bool value) { return value ? "true" : "false"; };
+  const LocalCloudConditions& conditions = cloud.conditions;
+  std::string json =
+      "{\"usedBytes\":" + std::to_string(cloud.usedBytes) +
+      ",\"uploads\":" + jsonString(wordOf(cloud.uploads)) + ",\"uploadLimit\":" +
+      (cloud.uploads == Uploads::Bounded ? std::to_string(cloud.uploadLimit) : "null") +
+      ",\"sharesBlocks\":" + flag(cloud.sharesBlocks) +
+      ",\"waiting\":" + std::to_string(cloud.waiting) +
+      ",\"failed\":" + std::to_string(cloud.failed) +
+      ",\"leftOut\":" + std::to_string(cloud.leftOut) +
+      ",\"lastFailure\":" + (cloud.lastFailure.empty() ? "null" : jsonString(cloud.lastFailure));
+  return json + ",\"conditions\":{\"offline\":" + flag(conditions.offline) +
+         ",\"corrupt\":" + flag(conditions.corrupt) +
+         ",\"quota\":" + (conditions.quota ? std::to_string(*conditions.quota) : "null") +
+         ",\"delayMilliseconds\":" + std::to_string(conditions.delayMilliseconds) +
+         ",\"bytesPerSecond\":" + std::to_string(conditions.bytesPerSecond) +
+         ",\"failures\":" + std::to_string(conditions.failures) + "}}";
+}
+
+}  // namespace skein::cli
