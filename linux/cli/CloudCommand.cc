@@ -67,7 +67,7 @@ void addCloudCommand(CLI::App& app, Invocation& invocation) {
   auto* trial = cloud->add_subcommand("try", "Set how the cloud behaves, in place of before");
   trial->fallthrough();
   auto* reset = trial->add_flag("--reset", options->reset, "Behave as usual again");
-  const CLI::AsSizeValue size(false);
+  const CLI::AsSizeValue size(true);  // as sizes are shown: a kB is 1000 bytes
   for (CLI::Option* option :
        {trial->add_flag("--offline", conditions.offline, "It cannot be reached"),
         trial->add_flag("--corrupt", conditions.corrupt, "Contents arrive with other bytes"),

@@ -23,12 +23,11 @@ std::string_view wordOf(Uploads uploads) {
 
 std::string uploadsText(const LocalCloudStatus& cloud) {
   switch (cloud.uploads) {
-    case Uploads::Off: return "uploads are off";
-    case Uploads::Bounded: return "uploads up to " + sizeText(cloud.uploadLimit);
+    case Uploads::Off: return "off";
+    case Uploads::Bounded: return "up to " + sizeText(cloud.uploadLimit);
     case Uploads::Unlimited: break;
   }
-  return cloud.sharesBlocks ? "uploads without limit, sharing the documents' blocks"
-                            : "uploads without limit";
+  return cloud.sharesBlocks ? "without limit, sharing the documents' blocks" : "without limit";
 }
 
 std::string conditionsText(const LocalCloudConditions& conditions) {
@@ -50,7 +49,7 @@ std::string conditionsText(const LocalCloudConditions& conditions) {
 }
 
 std::string summaryOf(const LocalCloudStatus& cloud) {
-  std::string text = sizeText(cloud.usedBytes) + ", " + uploadsText(cloud);
+  std::string text = sizeText(cloud.usedBytes) + ", uploads " + uploadsText(cloud);
   if (cloud.waiting > 0) text += ", " + std::to_string(cloud.waiting) + " waiting";
   if (cloud.failed > 0) text += ", " + std::to_string(cloud.failed) + " failed";
   if (cloud.leftOut > 0) text += ", " + std::to_string(cloud.leftOut) + " left out";

@@ -7,7 +7,7 @@
 
 namespace skein::cli {
 
-// "uploads up to 1.0 GiB"
+// "up to 1.1 GB", "without limit" or "off"
 std::string uploadsText(const LocalCloudStatus& cloud);
 // What is in force beyond the usual, such as "offline, delay 200 ms"; "none".
 std::string conditionsText(const LocalCloudConditions& conditions);

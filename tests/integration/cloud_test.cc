@@ -78,7 +78,7 @@ TEST_F(CloudTrial, DownloadsFailClearlyAndLeaveNothing) {
   EXPECT_EQ(files(), 1u);
 
   tryOut({"--bandwidth", "1K"});
-  EXPECT_EQ(cloud()["conditions"]["bytesPerSecond"], 1024);
+  EXPECT_EQ(cloud()["conditions"]["bytesPerSecond"], 1000);
   EXPECT_FALSE(cloud()["conditions"]["corrupt"]);
   const auto slow = drive.start({"get", "/letter.txt"});
   ASSERT_TRUE(comesTrue([&] { return files() == 2; }));
