@@ -33,7 +33,8 @@ class VLDaemonSyncProxy {
     // setBoolResult:error: an error means that there is no result.
     void setBoolResult(bool result, NSErrorPtr error) SKEIN_EXCLUDES(_mutex) {
       static_assert(std::same_as<Result, bool>);
-      setObjResult(error ? std::nullopt : std::optional(result), std::move(error));
+      const auto answer = error ? std::nullopt : std::optional(result);
+      setObjResult(answer, std::move(error));
     }
 
    private:

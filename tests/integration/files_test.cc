@@ -271,14 +271,15 @@ TEST_F(Files, WhyTellsWhoseRequestItWas) {
   EXPECT_EQ(Json::parse(skein({"why", "--json", "/b.txt"}).at(0))["origin"], process);
 
   drive.write("/c.txt", "c");
+  ASSERT_TRUE(comesTrue([&] { return drive.run({"id", "/c.txt"}).code == 0; }));
   EXPECT_EQ(skein({"why", "/c.txt"}), (Lines{"no request of the drive changed it"}));
   EXPECT_EQ(fails({"why", "/never"}), 3);
 }
 
 TEST_F(Files, EveryVerbHasAnExample) {
   for (const char* verb :
-       {"get", "cat", "evict", "import", "mkdir", "mv", "alias", "trash", "restore", "rm", "tag",
-        "favorite", "touch-used", "default-location", "why"}) {
+       {"get", "cat", "cloud", "evict", "import", "mkdir", "mv", "alias", "trash", "restore", "rm",
+        "tag", "favorite", "touch-used", "default-location", "why"}) {
     const Result help = drive.run({verb, "--help"});
     EXPECT_EQ(help.code, 0) << verb;
     EXPECT_NE(help.output.find("Example: skein "), std::string::npos) << verb;

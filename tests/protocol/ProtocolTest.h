@@ -64,10 +64,11 @@ class ProtocolTest : public testing::Test {
   std::string folder;
   std::string socketPath;
   SilentLog log;
+  // Outlives the executor, whose last tasks may still be calling it.
+  std::shared_ptr<FakeDaemon> daemon = std::make_shared<FakeDaemon>();
   std::shared_ptr<Executor> executor = std::make_shared<ThreadPool>(2, "test");
   std::shared_ptr<RpcLoop> loop = RpcLoop::start("vald-io");
   std::shared_ptr<RpcLoop> clientLoop = RpcLoop::start("client-io");
-  std::shared_ptr<FakeDaemon> daemon = std::make_shared<FakeDaemon>();
   std::unique_ptr<DaemonServer> server;
   std::shared_ptr<DaemonClient> client;
 };
