@@ -33,8 +33,11 @@ class VLDaemonSyncProxy {
     // setBoolResult:error: an error means that there is no result.
     void setBoolResult(bool result, NSErrorPtr error) SKEIN_EXCLUDES(_mutex) {
       static_assert(std::same_as<Result, bool>);
-      const auto answer = error ? std::nullopt : std::optional(result);
-      setObjResult(answer, std::move(error));
+      if (error) {
+        setObjResult(std::nullopt, std::move(error));
+      } else {
+        setObjResult(result, nullptr);
+      }
     }
 
    private:
