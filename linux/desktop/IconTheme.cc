@@ -1,7 +1,5 @@
 #include "linux/desktop/IconTheme.h"
 
-#include <gio/gio.h>
-
 #include <algorithm>
 #include <climits>
 #include <filesystem>
@@ -78,19 +76,19 @@ std::optional<std::string> iconIn(const std::string& folder, const std::string& 
   return std::nullopt;
 }
 
-// The theme that the desktop's settings name.
+// The theme that the user's toolkit settings name; else the usual one. The desktop's own
+// settings service is not asked: it would bring its modules and a connection to the session
+// bus into this process.
 std::string chosenTheme() {
-  constexpr char kSchema[] = "org.gnome.desktop.interface";
-  GSettingsSchemaSource* source = g_settings_schema_source_get_default();
-  if (source == nullptr) return kLastTheme;
-  const std::unique_ptr<GSettingsSchema, decltype(&g_settings_schema_unref)> schema(
-      g_settings_schema_source_lookup(source, kSchema, TRUE), g_settings_schema_unref);
-  if (!schema || !g_settings_schema_has_key(schema.get(), "icon-theme")) return kLastTheme;
-  const std::unique_ptr<GSettings, decltype(&g_object_unref)> settings(g_settings_new(kSchema),
-                                                                       g_object_unref);
-  const std::unique_ptr<char, decltype(&g_free)> name(
-      g_settings_get_string(settings.get(), "icon-theme"), g_free);
-  return name ? name.get() : kLastTheme;
+  for (const char* toolkit : {"gtk-4.0", "gtk-3.0"}) {
+    const std::string path = std::string(g_get_user_config_dir()) + '/' + toolkit + "/settings.ini";
+    const KeyFile file(g_key_file_new(), g_key_file_unref);
+    if (!g_key_file_load_from_file(file.get(), path.c_str(), G_KEY_FILE_NONE, nullptr)) continue;
+    const std::unique_ptr<char, decltype(&g_free)> name(
+        g_key_file_get_string(file.get(), "Settings", "gtk-icon-theme-name", nullptr), g_free);
+    if (name) return name.get();
+  }
+  return "Adwaita";
 }
 
 }  // namespace

@@ -47,6 +47,11 @@ class Files : public testing::Test {
     }
     return true;
   }
+  // Another program writes a document, and the drive knows it.
+  void writeAndSee(const std::string& path, const std::string& text) {
+    drive.write(path, text);
+    EXPECT_TRUE(comesTrue([&] { return drive.run({"id", path}).code == 0; })) << path;
+  }
   bool isUploaded(const std::string& path) {
     return comesTrue([&] { return stat(path).value("uploaded", false); });
   }
@@ -102,7 +107,11 @@ TEST_F(Files, ImportBringsInFilesTreesAndStandardInput) {
 TEST_F(Files, AnInterruptedImportLeavesNothing) {
   skein({"ls", "/"});
   fs::create_directory(drive.home() + "/big");
-  for (int i = 0; i < 2000; ++i) writeHome("big/" + std::to_string(i), std::string(4096, 'x'));
+  writeHome("one", std::string(4096, 'x'));
+  // So many that the interrupt surely comes before the last.
+  for (int i = 0; i < 10'000; ++i) {
+    fs::create_hard_link(drive.home() + "/one", drive.home() + "/big/" + std::to_string(i));
+  }
   const auto import = drive.start({"import", drive.home() + "/big", "/"});
   ASSERT_TRUE(comesTrue([&] { return isImporting(); }));
   sendSignal(import->pid(), SIGINT);
@@ -177,7 +186,7 @@ TEST_F(Files, FoldersMovesAndAliasesGoWherePeopleExpect) {
   EXPECT_EQ(id("/x/y/d.txt"), identifier);
   skein({"mv", identifier, "/b.txt", "/x"});
   EXPECT_EQ(drive.list("/x"), (Lines{"b.txt", "d.txt", "y"}));
-  drive.write("/b.txt", "another");
+  writeAndSee("/b.txt", "another");
   EXPECT_EQ(fails({"mv", "/b.txt", "/x"}), 6);
   EXPECT_EQ(fails({"mv", "/b.txt", "/x/d.txt"}), 6);
   EXPECT_EQ(fails({"mv", "/x/d.txt", "/b.txt", "/new"}), 3);
@@ -270,8 +279,7 @@ TEST_F(Files, WhyTellsWhoseRequestItWas) {
   EXPECT_NE(why[1].find("/a.txt -> /b.txt"), std::string::npos) << why[1];
   EXPECT_EQ(Json::parse(skein({"why", "--json", "/b.txt"}).at(0))["origin"], process);
 
-  drive.write("/c.txt", "c");
-  ASSERT_TRUE(comesTrue([&] { return drive.run({"id", "/c.txt"}).code == 0; }));
+  writeAndSee("/c.txt", "c");
   EXPECT_EQ(skein({"why", "/c.txt"}), (Lines{"no request of the drive changed it"}));
   EXPECT_EQ(fails({"why", "/never"}), 3);
 }

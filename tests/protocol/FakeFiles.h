@@ -29,7 +29,9 @@ class FakeFiles final : public LocalFiles {
     URLReply reply;
   };
   Inbox<Transfer> transfers;
-  Inbox<int> cancellations;
+  // Kept by what counts in it, which may come when the fake is gone.
+  const std::shared_ptr<Inbox<int>> cancelled = std::make_shared<Inbox<int>>();
+  Inbox<int>& cancellations = *cancelled;
   // What was asked, as text, in order.
   Inbox<std::string> asked;
 
@@ -139,7 +141,7 @@ class FakeFiles final : public LocalFiles {
   }
   std::shared_ptr<NSProgress> begin(URLReply reply) {
     auto progress = NSProgress::progressWithTotalUnitCount(0);
-    progress->setCancellationHandler([this] { cancellations.add(1); });
+    progress->setCancellationHandler([counter = cancelled] { counter->add(1); });
     transfers.add({progress, std::move(reply)});
     return progress;
   }

@@ -22,7 +22,9 @@ class FakeRecords final : public LocalRecords {
     RecordsReply reply;
   };
   Inbox<Fetch> fetches;
-  Inbox<int> cancellations;
+  // Kept by what counts in it, which may come when the fake is gone.
+  const std::shared_ptr<Inbox<int>> cancelled = std::make_shared<Inbox<int>>();
+  Inbox<int>& cancellations = *cancelled;
   Inbox<std::vector<VLFileObjectID>> resolutions;
 
   void resolveFileObjectIDsToContentRecordIDs(
@@ -33,7 +35,7 @@ class FakeRecords final : public LocalRecords {
   }
   std::shared_ptr<NSProgress> fetchRecords(RecordQuery query, RecordsReply reply) override {
     auto progress = NSProgress::progressWithTotalUnitCount(0);
-    progress->setCancellationHandler([this] { cancellations.add(1); });
+    progress->setCancellationHandler([counter = cancelled] { counter->add(1); });
     fetches.add({std::move(query), std::move(reply)});
     return progress;
   }

@@ -27,7 +27,9 @@ class FakeShares final : public LocalShares {
 
   std::atomic<bool> holds{false};
   Inbox<Task> held;  // runs the answer
-  Inbox<int> cancellations;
+  // Kept by what counts in it, which may come when the fake is gone.
+  const std::shared_ptr<Inbox<int>> cancelled = std::make_shared<Inbox<int>>();
+  Inbox<int>& cancellations = *cancelled;
   // What was asked, as text, in order.
   Inbox<std::string> asked;
   Inbox<CKShare> given;
@@ -98,7 +100,7 @@ class FakeShares final : public LocalShares {
   static std::string path(const NSURLPtr& what) { return what ? what->path() : "nil"; }
   std::shared_ptr<NSProgress> begin(std::string text, Task answer) {
     auto progress = NSProgress::progressWithTotalUnitCount(1);
-    progress->setCancellationHandler([this] { cancellations.add(1); });
+    progress->setCancellationHandler([counter = cancelled] { counter->add(1); });
     asked.add(std::move(text));
     if (holds) {
       held.add(std::move(answer));
