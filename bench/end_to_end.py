@@ -236,10 +236,13 @@ def import_files(drive: Drive, options):
             copy.append(seconds(lambda: subprocess.run(
                 ["sh", "-c", 'cp -r "$0" "$1" && sync -f "$1"', str(source), str(target)],
                 check=True)))
-            subprocess.run(["rm", "-r", str(target)], check=True)
             drive.command("mkdir", f"/{source.name} {number}")
             took.append(seconds(lambda: drive.command("import", str(source),
                                                       f"/{source.name} {number}")))
+        # Not in between: for some seconds after a removal ext4 looks for inodes that were not
+        # just used, and whoever comes next pays for it.
+        for number in range(rounds):
+            subprocess.run(["rm", "-r", str(top / f"copy {number}")], check=True)
             drive.command("rm", "-rf", f"/{source.name} {number}")
         grown = ", ".join(f"{name} {peak(pid):.0f} MB (+{peak(pid) - before[name]:.0f})"
                           for name, pid in processes.items())
