@@ -1,5 +1,7 @@
 #include "linux/desktop/IconTheme.h"
 
+#include <glib.h>
+
 #include <algorithm>
 #include <climits>
 #include <filesystem>

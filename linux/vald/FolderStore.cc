@@ -176,7 +176,7 @@ Page FolderStore::list(const FolderRow& folder, SortOrder order, std::uint64_t o
       const ItemRow& last = items.back().row;
       _places.remember(folder.number, order, page.nextOffset, changes,
                        {order == SortOrder::Date ? difference(0, last.state.modified) : 0,
-                        last.name, last.rank});
+                        last.name, last.id.rawID()});
     }
   }
   page.items.reserve(items.size());

@@ -97,6 +97,19 @@ TEST_F(StoreListing, AListingUnderWaySkipsNothingWhenItemsBeforeItGo) {
   EXPECT_EQ(second.items[0]->filename(), "c");
 }
 
+TEST_F(StoreListing, AnItemThatChangesBetweenTwoPagesIsListedOnce) {
+  for (const char* name : {"a", "b", "c", "d"}) write(name);
+  open();
+  Page page = store->listFolder(std::nullopt, SortOrder::Name, 0, 2, nullptr);
+  // As an upload does: the item is told of anew, at its place in the folder.
+  store->tellAnew(page.items.back()->fileObjectID(), false);
+  settle();
+  page = store->listFolder(std::nullopt, SortOrder::Name, page.nextOffset, 2, nullptr);
+  ASSERT_EQ(page.items.size(), 2U);
+  EXPECT_EQ(page.items[0]->filename(), "c");
+  EXPECT_EQ(page.items[1]->filename(), "d");
+}
+
 TEST_F(StoreListing, OnlyFilesFoldersAndAliasesAndNothingBehindAnAlias) {
   makeFolder("folder");
   makeFolder(".Trash-1000/files");

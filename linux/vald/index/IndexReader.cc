@@ -50,25 +50,25 @@ IndexReader::IndexReader(std::unique_ptr<SqliteDatabase> database)
                        "SELECT rank, id, kind, holder FROM tombstone WHERE rank>? ORDER BY rank "
                        "LIMIT ?"),
       _byName(*_database,
-              SKEIN_FOUND "WHERE item.parent=? ORDER BY item.name, item.rank LIMIT ? OFFSET ?"),
+              SKEIN_FOUND "WHERE item.parent=? ORDER BY item.name, item.id LIMIT ? OFFSET ?"),
       _byAge(*_database, SKEIN_FOUND
-             "WHERE item.parent=? ORDER BY item.age, item.name, item.rank LIMIT ? OFFSET ?"),
+             "WHERE item.parent=? ORDER BY item.age, item.name, item.id LIMIT ? OFFSET ?"),
       _byNameAfter(*_database, SKEIN_FOUND
-                   "WHERE item.parent=? AND (item.name, item.rank) > (?, ?) "
-                   "ORDER BY item.name, item.rank LIMIT ?"),
+                   "WHERE item.parent=? AND (item.name, item.id) > (?, ?) "
+                   "ORDER BY item.name, item.id LIMIT ?"),
       _byAgeAfter(*_database, SKEIN_FOUND
-                  "WHERE item.parent=? AND (item.age, item.name, item.rank) > (?, ?, ?) "
-                  "ORDER BY item.age, item.name, item.rank LIMIT ?"),
+                  "WHERE item.parent=? AND (item.age, item.name, item.id) > (?, ?, ?) "
+                  "ORDER BY item.age, item.name, item.id LIMIT ?"),
       _allByName(*_database,
-                 SKEIN_FOUND "WHERE item.kind=1 ORDER BY item.name, item.rank LIMIT ? OFFSET ?"),
+                 SKEIN_FOUND "WHERE item.kind=1 ORDER BY item.name, item.id LIMIT ? OFFSET ?"),
       _allByAge(*_database, SKEIN_FOUND
-                "WHERE item.kind=1 ORDER BY item.age, item.name, item.rank LIMIT ? OFFSET ?"),
+                "WHERE item.kind=1 ORDER BY item.age, item.name, item.id LIMIT ? OFFSET ?"),
       _allByNameAfter(*_database, SKEIN_FOUND
-                      "WHERE item.kind=1 AND (item.name, item.rank) > (?, ?) "
-                      "ORDER BY item.name, item.rank LIMIT ?"),
+                      "WHERE item.kind=1 AND (item.name, item.id) > (?, ?) "
+                      "ORDER BY item.name, item.id LIMIT ?"),
       _allByAgeAfter(*_database, SKEIN_FOUND
-                     "WHERE item.kind=1 AND (item.age, item.name, item.rank) > (?, ?, ?) "
-                     "ORDER BY item.age, item.name, item.rank LIMIT ?") {}
+                     "WHERE item.kind=1 AND (item.age, item.name, item.id) > (?, ?, ?) "
+                     "ORDER BY item.age, item.name, item.id LIMIT ?") {}
 
 FoundItem IndexReader::found(SqliteStatement& statement) {
   FoundItem found{itemFromRow(statement),
@@ -212,12 +212,12 @@ std::vector<FoundItem> IndexReader::page(FolderKey folder, SortOrder order,
   const bool isByName = order == SortOrder::Name;
   if (folder == kNoFolder) {
     if (!place) return all((isByName ? _allByName : _allByAge).start(limit, offset));
-    if (isByName) return all(_allByNameAfter.start(place->name, place->rank, limit));
-    return all(_allByAgeAfter.start(place->age, place->name, place->rank, limit));
+    if (isByName) return all(_allByNameAfter.start(place->name, place->rawID, limit));
+    return all(_allByAgeAfter.start(place->age, place->name, place->rawID, limit));
   }
   if (!place) return all((isByName ? _byName : _byAge).start(folder, limit, offset));
-  if (isByName) return all(_byNameAfter.start(folder, place->name, place->rank, limit));
-  return all(_byAgeAfter.start(folder, place->age, place->name, place->rank, limit));
+  if (isByName) return all(_byNameAfter.start(folder, place->name, place->rawID, limit));
+  return all(_byAgeAfter.start(folder, place->age, place->name, place->rawID, limit));
 }
 
 std::vector<FoundItem> IndexReader::itemsAfter(std::uint64_t rank, std::uint64_t limit) {

@@ -17,7 +17,9 @@ namespace skein::vald {
 struct ListingPlace {
   std::int64_t age = 0;  // for listings by date
   std::string name;
-  std::uint64_t rank = 0;
+  // Of several items with one name. Not the rank: that changes with the item, which would
+  // then come once more.
+  std::uint64_t rawID = 0;
 
   friend auto operator<=>(const ListingPlace&, const ListingPlace&) = default;
 };
