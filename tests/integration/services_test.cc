@@ -125,7 +125,7 @@ TEST_F(ServicesOfDrive, ClientsThatDieAtAnyTimeLeaveNothingBehind) {
     sendSignal(client->pid(), SIGKILL);
   }
   const Result after = drive.run({"share", "info", "/letter.txt"});
-    EXPECT_EQ(after.code, 0) << after.errors;
+  EXPECT_EQ(after.code, 0) << after.errors;
   EXPECT_EQ(drive.host(), host);
   EXPECT_TRUE(becomesTrue([&] { return descriptorsOf(host) <= before; }))
       << descriptorsOf(host) << " descriptors, " << before << " before";
