@@ -96,11 +96,7 @@ int runEvict(HostService& host, const EvictOptions& options) {
       const auto start = [&](auto reply) { host.files().evict(targetOf(item), std::move(reply)); };
       error = std::get<0>(awaitOnce<>(start));
     }
-    if (error) {
-      report.failed(item, error);
-    } else {
-      report.done(item);
-    }
+    report.ended(item, error);
   }
   return report.code();
 }

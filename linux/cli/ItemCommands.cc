@@ -10,14 +10,6 @@
 namespace skein::cli {
 namespace {
 
-void writeField(Output& output, std::string_view name, std::string_view value) {
-  std::string label(name);
-  label.resize(12, ' ');
-  output.write(label);
-  output.writeName(value);
-  output.write("\n");
-}
-
 std::string stateOf(const NSFileProviderItem& item) {
   std::string state = item.isDownloaded() ? "downloaded" : "not downloaded";
   if (item.isUploaded()) state += ", uploaded";
@@ -28,24 +20,24 @@ std::string stateOf(const NSFileProviderItem& item) {
 
 void writeItem(Output& output, const HostItem& found) {
   const NSFileProviderItem& item = *found.item;
-  writeField(output, "name", item.filename());
-  if (!found.path.empty()) writeField(output, "path", found.path);
-  writeField(output, "identifier", item.itemIdentifier());
-  writeField(output, "parent", item.parentItemIdentifier());
-  writeField(output, "url", found.url);
-  writeField(output, "kind", kindOf(item));
-  writeField(output, "type", item.typeIdentifier().value_or("-"));
-  if (const auto size = item.documentSize()) writeField(output, "size", std::to_string(*size));
+  output.writeField("name", item.filename());
+  if (!found.path.empty()) output.writeField("path", found.path);
+  output.writeField("identifier", item.itemIdentifier());
+  output.writeField("parent", item.parentItemIdentifier());
+  output.writeField("url", found.url);
+  output.writeField("kind", kindOf(item));
+  output.writeField("type", item.typeIdentifier().value_or("-"));
+  if (const auto size = item.documentSize()) output.writeField("size", std::to_string(*size));
   if (const auto count = item.childItemCount()) {
-    writeField(output, "children", std::to_string(*count));
+    output.writeField("children", std::to_string(*count));
   }
-  writeField(output, "modified", localDate(item.contentModificationDate()));
-  writeField(output, "created", localDate(item.creationDate()));
-  if (item.lastUsedDate()) writeField(output, "last used", localDate(item.lastUsedDate()));
-  writeField(output, "state", stateOf(item));
-  if (const std::string tags = tagText(item); !tags.empty()) writeField(output, "tags", tags);
+  output.writeField("modified", localDate(item.contentModificationDate()));
+  output.writeField("created", localDate(item.creationDate()));
+  if (item.lastUsedDate()) output.writeField("last used", localDate(item.lastUsedDate()));
+  output.writeField("state", stateOf(item));
+  if (const std::string tags = tagText(item); !tags.empty()) output.writeField("tags", tags);
   if (const auto rank = item.favoriteRank()) {
-    writeField(output, "favorite", "rank " + std::to_string(*rank));
+    output.writeField("favorite", "rank " + std::to_string(*rank));
   }
 }
 

@@ -57,6 +57,10 @@ class Report {
   void done(const std::string& given, std::string_view text = {});
   void done(const std::string& given, const HostItem& item, std::string_view text = {});
   void failed(const std::string& given, const NSErrorPtr& error);
+  // Done, or failed with an error.
+  void ended(const std::string& given, const NSErrorPtr& error) {
+    error ? failed(given, error) : done(given);
+  }
 
   Output& output() { return _output; }
   // That of the first failure.

@@ -98,6 +98,15 @@ void Output::writeName(std::string_view name, bool folder) {
   if (folder && _hasColours) write("\x1b[0m");
 }
 
+void Output::writeField(std::string_view name, std::string_view value) {
+  constexpr std::size_t kLabel = 12;
+  std::string label(name);
+  label.resize(std::max(label.size() + 1, kLabel), ' ');
+  write(label);
+  writeName(value);
+  write("\n");
+}
+
 void Output::flush() {
   std::string_view rest = _buffer;
   while (!rest.empty()) {

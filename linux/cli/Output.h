@@ -28,6 +28,8 @@ class Output {
   void write(std::string_view text);
   // A name or path, as said above; `folder` ones are coloured.
   void writeName(std::string_view name, bool folder = false);
+  // A line of its own: what the value is, and the value.
+  void writeField(std::string_view name, std::string_view value);
   void flush();
 
  private:

@@ -84,14 +84,6 @@ std::string jsonOf(const CKShare& share) {
   return text + "]}\n";
 }
 
-void writeField(Output& output, std::string_view name, std::string_view value) {
-  std::string label(name);
-  label.resize(12, ' ');
-  output.write(label);
-  output.writeName(value);
-  output.write("\n");
-}
-
 void writeShare(Output& output, const CKShare& share, bool json) {
   if (json) {
     output.write(jsonOf(share));
@@ -101,12 +93,12 @@ void writeShare(Output& output, const CKShare& share, bool json) {
     output.write("not shared\n");
     return;
   }
-  writeField(output, "type", valueOf(share, CKShareTypeKey));
+  output.writeField("type", valueOf(share, CKShareTypeKey));
   if (const std::string title = valueOf(share, CKShareTitleKey); !title.empty()) {
-    writeField(output, "title", title);
+    output.writeField("title", title);
   }
-  if (share.url) writeField(output, "url", share.url->absoluteString());
-  writeField(output, "public", nameOf(share.publicPermission));
+  if (share.url) output.writeField("url", share.url->absoluteString());
+  output.writeField("public", nameOf(share.publicPermission));
   for (const CKShareParticipant& one : share.participants) {
     output.write(one.role == CKShareParticipantRole::Owner ? "owner       " : "with        ");
     output.writeName(one.name);
@@ -159,9 +151,9 @@ int runInfo(ServiceSession& session, const ShareOptions& options) {
     output.write(text + "]}\n");
     return kSuccess;
   }
-  writeField(output, "shared", shared ? "yes" : "no");
-  for (const std::string& name : names) writeField(output, "service", name);
-  if (names.empty()) writeField(output, "service", "none: this cannot be shared");
+  output.writeField("shared", shared ? "yes" : "no");
+  for (const std::string& name : names) output.writeField("service", name);
+  if (names.empty()) output.writeField("service", "none: this cannot be shared");
   return kSuccess;
 }
 

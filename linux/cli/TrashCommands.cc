@@ -167,11 +167,7 @@ int runRemove(HostService& host, const RemoveOptions& options) {
       };
       error = std::get<0>(awaitOnce<>(start));
     }
-    if (error) {
-      report.failed(item, error);
-    } else {
-      report.done(item);
-    }
+    report.ended(item, error);
   }
   return report.code();
 }

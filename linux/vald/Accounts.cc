@@ -8,7 +8,7 @@
 #include <string_view>
 #include <utility>
 
-#include "platform/foundation/uuid.h"
+#include "linux/vald/RandomToken.h"
 #include "vellum/VLErrors.h"
 
 namespace skein::vald {
@@ -27,18 +27,6 @@ bool isPlainText(std::string_view text) {
            const auto byte = static_cast<unsigned char>(c);
            return byte < 0x20 || byte == 0x7F;
          });
-}
-
-std::string randomIdentifier() {
-  uuid_t uuid{};
-  uuid_generate(uuid);
-  constexpr std::string_view kDigits = "0123456789abcdef";
-  std::string text;
-  for (const std::uint8_t byte : uuid) {
-    text += kDigits[byte >> 4];
-    text += kDigits[byte & 15];
-  }
-  return text;
 }
 
 // "out", or "in", the name, and the identifier when there is one; a line each.
@@ -74,7 +62,7 @@ Accounts::Accounts(Store& store, std::string firstName, Log& log) : _store(store
   const std::optional<std::string> setting = store.setting(kSetting);
   std::optional<LocalAccount> account;
   if (!setting) {
-    account = LocalAccount{std::move(firstName), randomIdentifier()};
+    account = LocalAccount{std::move(firstName), randomToken()};
     store.setSetting(kSetting, encoded(account));
   } else if (!decode(*setting, account)) {
     VL_ERROR(log, "[ERROR] the kept account cannot be read, nobody is logged in: %@", *setting);

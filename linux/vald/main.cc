@@ -133,9 +133,8 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
   };
   const auto faults = std::make_shared<FaultInjector>(mayFail);
   SystemCloudClock clock;
-  RecordFetches recordFetches(
-      {executor, drive->cloud().records(), drive->cloud().conditions(), clock, *faults,
-       [&shares](VLFileObjectID document) { return shares->attachedZoneOf(document); }});
+  RecordFetches recordFetches({executor, drive->cloud().records(), drive->cloud().conditions(),
+                               clock, *faults, [&shares] { return shares->attachedZoneFinder(); }});
   auto daemon = std::make_shared<Daemon>(DaemonParts{
       executor, slowExecutor, store, senders, accounts, containers, subscribers, drive->files(),
       recordFetches, *shares, drive->cloud(), *faults, log, paths.store, stop,

@@ -1,5 +1,6 @@
 #include <unistd.h>
 
+#include "linux/vald/RandomToken.h"
 #include "tests/vald/SharesRig.h"
 
 namespace skein::vald {
@@ -200,7 +201,7 @@ TEST_F(SharesTest, WhatACrashKeptFromBeingToldIsToldAtTheNextStart) {
   ShareRecord record;
   record.item = id("A.txt");
   record.share.url = drawShareURL();
-  record.shareToken = drawToken();
+  record.shareToken = randomToken();
   ASSERT_FALSE(records->put(record));
   told();
   reopen();
@@ -220,8 +221,8 @@ TEST_F(SharesTest, BothOwnersHaveItems) {
   reopen();
   EXPECT_TRUE(isShared("From ann/Deep/A.txt"));
   EXPECT_FALSE(isShared("Mine.txt"));
-  EXPECT_EQ((*shares->attachedZoneOf(id("From ann/Deep/A.txt")))->ownerName, "ann");
-  EXPECT_FALSE(*shares->attachedZoneOf(id("Mine.txt")));
+  EXPECT_EQ((*shares->attachedZoneFinder())(id("From ann/Deep/A.txt"))->ownerName, "ann");
+  EXPECT_FALSE((*shares->attachedZoneFinder())(id("Mine.txt")));
   const auto [zones, _] = call<std::vector<AttachedZone>, NSErrorPtr>(
       [](auto& to, auto reply) { to.attachedZones(std::move(reply)); });
   ASSERT_EQ(zones.size(), 1U);
@@ -239,7 +240,7 @@ TEST_F(SharesTest, BothOwnersHaveItems) {
 
   ASSERT_FALSE(detach("From ann"));
   EXPECT_FALSE(isShared("From ann/Deep/A.txt"));
-  EXPECT_FALSE(*shares->attachedZoneOf(id("From ann")));
+  EXPECT_FALSE((*shares->attachedZoneFinder())(id("From ann")));
   EXPECT_EQ(codeOf(detach("From ann")), "VLVellumErrorDomain 15");
 }
 

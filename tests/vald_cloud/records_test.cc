@@ -54,12 +54,14 @@ struct FetchingRecords : testing::Test {
   FaultInjector faults{true};
   std::shared_ptr<Executor> executor = std::make_shared<ThreadPool>(1, "records");
   std::map<VLFileObjectID, CKRecordZoneID> attached;  // the zones that documents are in
+  const RecordFetches::ZoneFinder zoneFinder =
+      [this](VLFileObjectID document) -> std::optional<CKRecordZoneID> {
+    const auto zone = attached.find(document);
+    if (zone == attached.end()) return std::nullopt;
+    return zone->second;
+  };
   RecordFetches fetches{{executor, *rig.records, rig.conditions, rig.clock, faults,
-                         [this](VLFileObjectID document) -> std::optional<CKRecordZoneID> {
-                           const auto zone = attached.find(document);
-                           if (zone == attached.end()) return std::nullopt;
-                           return zone->second;
-                         }}};
+                         [this] { return Outcome<RecordFetches::ZoneFinder>(zoneFinder); }}};
   const CKRecordZoneID own{kDocumentsZone, CKCurrentUserDefaultName};
   const CKRecordZoneID others{"trip", "ada"};
   const std::string one = documentNumber(1).asString();

@@ -45,11 +45,11 @@ std::map<std::string, CKRecord::Value> fieldsOf(const CloudRecord& record,
 Outcome<std::vector<CloudRecord>> RecordFetches::recordsOf(
     const std::vector<VLFileObjectID>& documents) {
   auto found = _parts.records.records(documents);
-  if (!found || !_parts.attachedZoneOf) return found;
+  if (!found || !_parts.attachedZones) return found;
+  const auto attachedZoneOf = _parts.attachedZones();
+  if (!attachedZoneOf) return attachedZoneOf.error();
   for (CloudRecord& record : *found) {
-    const auto zone = _parts.attachedZoneOf(record.document);
-    if (!zone) return zone.error();
-    if (*zone) record.zone = **zone;
+    if (const auto zone = (*attachedZoneOf)(record.document)) record.zone = *zone;
   }
   return found;
 }

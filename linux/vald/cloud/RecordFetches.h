@@ -23,6 +23,8 @@ namespace skein::vald {
 // for its zone under "fetchRecords ZONE:OWNER". While it waits it can be cancelled.
 class RecordFetches final : public LocalRecords {
  public:
+  using ZoneFinder = std::function<std::optional<CKRecordZoneID>(VLFileObjectID)>;
+
   // All outlive this object and what it posted.
   struct Parts {
     std::shared_ptr<Executor> executor;
@@ -30,9 +32,9 @@ class RecordFetches final : public LocalRecords {
     CloudConditions& conditions;
     CloudClock& clock;
     CallFaults& faults;
-    // The zone of somebody else's that a document is in, whatever zone its record was put
-    // into; nil for one's own. May be empty, and may block.
-    std::function<Outcome<std::optional<CKRecordZoneID>>(VLFileObjectID)> attachedZoneOf = {};
+    // Asked once for a request: what tells the zone of somebody else's that a document is in,
+    // whatever zone its record was put into; nil for one's own. May be empty, and may block.
+    std::function<Outcome<ZoneFinder>()> attachedZones = {};
   };
 
   explicit RecordFetches(Parts parts) : _parts(std::move(parts)) {}

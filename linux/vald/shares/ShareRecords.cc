@@ -3,7 +3,7 @@
 #include <string_view>
 #include <utility>
 
-#include "platform/foundation/uuid.h"
+#include "linux/vald/RandomToken.h"
 #include "vellum/VLErrors.h"
 
 namespace skein::vald {
@@ -41,18 +41,6 @@ Code code(std::int64_t number, Code last) {
 }
 
 }  // namespace
-
-std::string drawToken() {
-  uuid_t uuid{};
-  uuid_generate(uuid);
-  constexpr std::string_view kDigits = "0123456789abcdef";
-  std::string text;
-  for (const std::uint8_t byte : uuid) {
-    text += kDigits[byte >> 4];
-    text += kDigits[byte & 15];
-  }
-  return text;
-}
 
 Outcome<std::unique_ptr<ShareRecords>> ShareRecords::open(const std::string& path) {
   auto database = CloudDatabase::open(path, {kSchema1});
@@ -193,7 +181,7 @@ Outcome<std::string> ShareRecords::baseToken(VLFileObjectID item) {
   const bool found = row->bind(1, std::string_view(key)).step();
   if (NSErrorPtr error = row->error()) return error;
   if (found) return row->text(0);
-  std::string token = drawToken();
+  std::string token = randomToken();
   NSErrorPtr error = _database->prepare("INSERT INTO base_tokens VALUES(?, ?)")
                          ->bind(1, std::string_view(key))
                          .bind(2, std::string_view(token))

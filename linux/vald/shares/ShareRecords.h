@@ -74,7 +74,4 @@ class ShareRecords {
   const std::unique_ptr<CloudDatabase> _database SKEIN_PT_GUARDED_BY(_mutex);
 };
 
-// 32 hexadecimal digits that nobody can guess.
-std::string drawToken();
-
 }  // namespace skein::vald

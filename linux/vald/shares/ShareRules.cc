@@ -8,6 +8,7 @@
 #include <string_view>
 #include <utility>
 
+#include "linux/vald/RandomToken.h"
 #include "platform/cloudkit/CKError.h"
 #include "vellum/VLErrors.h"
 
@@ -79,7 +80,7 @@ bool isPlainText(std::string_view text) {
          });
 }
 
-NSURLPtr drawShareURL() { return NSURL::URLWithString("skein://share/" + drawToken()); }
+NSURLPtr drawShareURL() { return NSURL::URLWithString("skein://share/" + randomToken()); }
 
 NSErrorPtr noShareError(const std::string& name) {
   return NSError::errorWithDomain(VLVellumErrorDomain, VLVellumErrorUnknownShare,

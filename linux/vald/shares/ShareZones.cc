@@ -3,6 +3,7 @@
 #include <string_view>
 #include <utility>
 
+#include "linux/vald/RandomToken.h"
 #include "linux/vald/Replies.h"
 #include "linux/vald/WatchScope.h"
 #include "linux/vald/shares/Shares.h"
@@ -49,7 +50,7 @@ NSErrorPtr Shares::attach(const SharePlace& place, const CKRecordZoneID& zone,
   ShareRecord record;
   record.item = place.item->fileObjectID();
   record.ownerName = zone.ownerName;
-  record.shareToken = drawToken();
+  record.shareToken = randomToken();
   record.share.url = drawShareURL();
   record.share.values[CKShareTitleKey] = place.item->filename();
   record.share.participants = {{account ? account->name : "", CKShareParticipantRole::PrivateUser,
@@ -98,17 +99,24 @@ void Shares::attachedZones(Reply<std::vector<AttachedZone>, NSErrorPtr> reply) {
   });
 }
 
-Outcome<std::optional<CKRecordZoneID>> Shares::attachedZoneOf(VLFileObjectID item) {
+Outcome<Shares::ZoneFinder> Shares::attachedZoneFinder() {
   const auto zones = _parts.records.zones();
   if (!zones) return zones.error();
-  std::optional<CKRecordZoneID> zoneOfItem;
-  const auto path = zones->empty() ? std::nullopt : _parts.store.pathForID(item, nullptr);
-  if (!path) return zoneOfItem;
+  std::vector<std::pair<std::string, CKRecordZoneID>> folders;
   for (const ZoneRecord& zone : *zones) {
-    const auto folder = _parts.store.pathForID(zone.folder, nullptr);
-    if (folder && pathIsWithin(*path, *folder)) zoneOfItem = zone.zone;
+    if (const auto folder = _parts.store.pathForID(zone.folder, nullptr)) {
+      folders.emplace_back(*folder, zone.zone);
+    }
   }
-  return zoneOfItem;
+  return ZoneFinder([&store = _parts.store, folders = std::move(folders)](VLFileObjectID item) {
+    std::optional<CKRecordZoneID> zoneOfItem;
+    const auto path = folders.empty() ? std::nullopt : store.pathForID(item, nullptr);
+    if (!path) return zoneOfItem;
+    for (const auto& [folder, zone] : folders) {
+      if (pathIsWithin(*path, folder)) zoneOfItem = zone;
+    }
+    return zoneOfItem;
+  });
 }
 
 // ---- questions

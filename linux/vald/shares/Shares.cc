@@ -4,6 +4,7 @@
 #include <utility>
 
 #include "linux/vald/DrivePath.h"
+#include "linux/vald/RandomToken.h"
 #include "linux/vald/WatchScope.h"
 #include "platform/cloudkit/CKError.h"
 #include "vellum/VLErrors.h"
@@ -167,7 +168,7 @@ Outcome<ShareRecord> Shares::keep(CKShare share, const SharePlace& place) {
     ownerName = ownerOf(record);
   } else {
     record.item = place.item->fileObjectID();
-    record.shareToken = drawToken();
+    record.shareToken = randomToken();
     record.share.url = drawShareURL();
     if (const auto account = _parts.accounts.current()) ownerName = account->name;
   }

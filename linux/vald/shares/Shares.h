@@ -75,9 +75,11 @@ class Shares final : public LocalShares, public std::enable_shared_from_this<Sha
   void shareOptions(NSFileProviderItemIdentifier item,
                     Reply<ShareOptions, NSErrorPtr> reply) override;
 
-  // The zone of somebody else's that the item is in; nil for one's own items and for one that
-  // is gone. Any thread.
-  Outcome<std::optional<CKRecordZoneID>> attachedZoneOf(VLFileObjectID item);
+  // Tells the zone of somebody else's that an item is in; nil for one's own items and for one
+  // that is gone. Any thread; not after the shares.
+  using ZoneFinder = std::function<std::optional<CKRecordZoneID>(VLFileObjectID)>;
+  // By the zones that are attached at the moment: for one request, however many items it names.
+  Outcome<ZoneFinder> attachedZoneFinder();
 
   // A folder that was moved into or out of a shared one: has the store tell of what it holds.
   // Any thread; returns at once.
