@@ -7,26 +7,29 @@
 #include <cerrno>
 
 namespace skein {
-namespace {
 
 // All there is from the file's start on, `expected` bytes as a first guess.
-std::optional<std::vector<std::uint8_t>> readToEnd(int file, std::size_t expected) {
+std::optional<NSData> NSData::dataWithRestOfFile(int file, std::size_t expected) {
   // One more, so that a file that is as long as it said ends in one read.
-  std::vector<std::uint8_t> bytes(expected + 1);
-  std::size_t length = 0;
+  std::size_t room = expected + 1;
+  auto bytes = std::make_shared_for_overwrite<std::uint8_t[]>(room);
+  NSData data;
   for (;;) {
-    if (length == bytes.size()) bytes.resize(bytes.size() * 2);
-    const ssize_t got = read(file, bytes.data() + length, bytes.size() - length);
+    if (data._length == room) {
+      auto larger = std::make_shared_for_overwrite<std::uint8_t[]>(room * 2);
+      std::memcpy(larger.get(), bytes.get(), room);
+      bytes = std::move(larger);
+      room *= 2;
+    }
+    const ssize_t got = read(file, bytes.get() + data._length, room - data._length);
     if (got < 0 && errno == EINTR) continue;
     if (got < 0) return std::nullopt;
     if (got == 0) break;
-    length += static_cast<std::size_t>(got);
+    data._length += static_cast<std::size_t>(got);
   }
-  bytes.resize(length);
-  return bytes;
+  if (data._length > 0) data._bytes = std::move(bytes);
+  return data;
 }
-
-}  // namespace
 
 std::optional<NSData> NSData::dataWithContentsOfURL(const NSURLPtr& url) {
   if (!url) return std::nullopt;
@@ -34,11 +37,9 @@ std::optional<NSData> NSData::dataWithContentsOfURL(const NSURLPtr& url) {
   if (file < 0) return std::nullopt;
   struct stat status {};
   const bool isFile = fstat(file, &status) == 0 && S_ISREG(status.st_mode);
-  auto bytes = isFile ? readToEnd(file, static_cast<std::size_t>(status.st_size)) : std::nullopt;
+  auto data =
+      isFile ? dataWithRestOfFile(file, static_cast<std::size_t>(status.st_size)) : std::nullopt;
   close(file);
-  if (!bytes) return std::nullopt;
-  NSData data;
-  data._bytes = std::move(*bytes);
   return data;
 }
 
