@@ -1,5 +1,6 @@
 #include "linux/framework/DocumentURLScope.h"
 
+#include <algorithm>
 #include <cstddef>
 #include <utility>
 
@@ -8,20 +9,19 @@
 namespace skein {
 namespace {
 
-// What vald answers, until the last answer or failure has come.
-struct Answers {
-  explicit Answers(std::size_t questions) : missing(questions) {}
-
-  void add(const VLFileObjectID& document, NSURLPtr url) SKEIN_EXCLUDES(mutex) {
+// vald's answer, or that there is none.
+struct Answer {
+  void set(std::vector<NSURLPtr> found) SKEIN_EXCLUDES(mutex) {
     MutexLock lock(mutex);
-    if (url) urls.emplace(document, std::move(url));
-    if (--missing == 0) came.notifyAll();
+    urls = std::move(found);
+    isThere = true;
+    came.notifyAll();
   }
 
   Mutex mutex;
   CondVar came;
-  std::size_t missing SKEIN_GUARDED_BY(mutex);
-  std::unordered_map<VLFileObjectID, NSURLPtr> urls SKEIN_GUARDED_BY(mutex);
+  bool isThere SKEIN_GUARDED_BY(mutex) = false;
+  std::vector<NSURLPtr> urls SKEIN_GUARDED_BY(mutex);
 };
 
 const DocumentURLScope*& scopeOfThread() {
@@ -33,19 +33,21 @@ const DocumentURLScope*& scopeOfThread() {
 
 DocumentURLScope::DocumentURLScope(const Proxies& daemon, Executor& executor,
                                    const std::vector<VLFileObjectID>& documents) {
-  const auto answers = std::make_shared<Answers>(documents.size());
-  for (const VLFileObjectID& document : documents) {
-    daemon([answers, document](const NSErrorPtr&) {
-      answers->add(document, nullptr);
-    })->URLForFileObjectID(document, [answers, document](NSURLPtr url, const NSErrorPtr&) {
-      answers->add(document, std::move(url));
-    });
-  }
+  const auto answer = std::make_shared<Answer>();
+  daemon([answer](const NSErrorPtr&) {
+    answer->set({});
+  })->URLsForFileObjectIDs(documents, [answer](std::vector<NSURLPtr> urls, const NSErrorPtr&) {
+    answer->set(std::move(urls));
+  });
   {
     ScopedWait wait(executor);
-    MutexLock lock(answers->mutex);
-    while (answers->missing > 0) answers->came.wait(answers->mutex);
-    _urls = std::move(answers->urls);
+    MutexLock lock(answer->mutex);
+    while (!answer->isThere) answer->came.wait(answer->mutex);
+    const std::size_t known = std::min(documents.size(), answer->urls.size());
+    _urls.reserve(known);
+    for (std::size_t at = 0; at < known; ++at) {
+      if (answer->urls[at]) _urls.emplace(documents[at], std::move(answer->urls[at]));
+    }
   }
   scopeOfThread() = this;
 }

@@ -20,7 +20,7 @@ class DocumentURLScope {
   using Proxies =
       std::function<std::shared_ptr<LocalDaemon>(std::function<void(NSErrorPtr)> errorHandler)>;
 
-  // Asks for all of them at once and waits for the answers; `executor` learns of the wait.
+  // Asks for all of them in one message and waits for the answer; `executor` learns of the wait.
   // What vald cannot tell is asked for again when the extension asks.
   DocumentURLScope(const Proxies& daemon, Executor& executor,
                    const std::vector<VLFileObjectID>& documents);

@@ -202,6 +202,27 @@ class DaemonProxy final : public LocalDaemon {
         });
   }
 
+  void URLsForFileObjectIDs(std::vector<VLFileObjectID> fileObjectIDs,
+                            Reply<std::vector<NSURLPtr>, NSErrorPtr> reply) override {
+    call(
+        [ids = std::move(fileObjectIDs)](wire::Daemon::Client& daemon) {
+          auto request = daemon.urlsForFileObjectIDsRequest();
+          codec::encode(request.initFileObjectIDs(static_cast<unsigned>(ids.size())), ids);
+          return request.send();
+        },
+        [reply = std::move(reply)](const auto& results) mutable -> Task {
+          std::vector<NSURLPtr> urls;
+          urls.reserve(results.getUrls().size());
+          for (const auto url : results.getUrls()) {
+            urls.push_back(url.size() > 0 ? NSURL::fileURLWithPath(codec::text(url)) : nullptr);
+          }
+          return [reply = std::move(reply), urls = std::move(urls),
+                  error = codec::errorOf(results)]() mutable {
+            reply(std::move(urls), std::move(error));
+          };
+        });
+  }
+
   void queryItemForURL(NSURLPtr url, bool scanFirst,
                        Reply<VLQueryItemPtr, NSErrorPtr> reply) override {
     call(

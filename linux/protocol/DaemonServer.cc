@@ -173,6 +173,21 @@ class DaemonObject : public wire::Daemon::Server,
         });
   }
 
+  kj::Promise<void> urlsForFileObjectIDs(UrlsForFileObjectIDsContext context) override {
+    std::vector<VLFileObjectID> ids;
+    for (const auto id : context.getParams().getFileObjectIDs()) ids.push_back(codec::decode(id));
+    return answer(
+        _service, context,
+        [&](auto reply) { daemon().URLsForFileObjectIDs(std::move(ids), std::move(reply)); },
+        [](auto results, const std::vector<NSURLPtr>& urls, const NSErrorPtr& error) {
+          auto list = results.initUrls(static_cast<unsigned>(urls.size()));
+          for (unsigned at = 0; at < urls.size(); ++at) {
+            if (urls[at]) list.set(at, codec::bytes(urls[at]->path()));
+          }
+          codec::setError(results, error);
+        });
+  }
+
   kj::Promise<void> queryItemForURL(QueryItemForURLContext context) override {
     const auto params = context.getParams();
     NSURLPtr url = urlFromClient(params.getUrl());

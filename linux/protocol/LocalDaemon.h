@@ -111,6 +111,10 @@ class LocalDaemon : public VLDaemon {
   // Null URL and an error for an identifier that names nothing.
   virtual void URLForFileObjectID(VLFileObjectID fileObjectID,
                                   Reply<NSURLPtr, NSErrorPtr> reply) = 0;
+  // The same of many in one message: as many URLs in their order, null for what names
+  // nothing. An error when none could be looked up.
+  virtual void URLsForFileObjectIDs(std::vector<VLFileObjectID> fileObjectIDs,
+                                    Reply<std::vector<NSURLPtr>, NSErrorPtr> reply) = 0;
 
   // The item at an absolute path inside the store. `scanFirst`: look at the file before
   // answering. Null item and NSCocoaErrorDomain 4 when there is none.

@@ -85,6 +85,9 @@ interface Daemon extends(Cloud.Cloud, Files.Files, Records.Records, Shares.Share
   stop @15 () -> (error :Types.Error);
   getContainerURLForID @16 (containerID :Data, recreateDocumentsIfNeeded :Bool)
       -> (url :Data, displayName :Data, recreated :Bool, error :Types.Error);
+  # One for each, in that order; null for an identifier that names nothing.
+  urlsForFileObjectIDs @17 (fileObjectIDs :List(Types.ObjectID))
+      -> (urls :List(Data), error :Types.Error);
 }
 
 # vald's end of one watch; vald lets go of it with the last reference.

@@ -176,6 +176,19 @@ void Daemon::URLForFileObjectID(VLFileObjectID fileObjectID, Reply<NSURLPtr, NSE
   });
 }
 
+void Daemon::URLsForFileObjectIDs(std::vector<VLFileObjectID> fileObjectIDs,
+                                  Reply<std::vector<NSURLPtr>, NSErrorPtr> reply) {
+  answer(std::move(reply), [ids = std::move(fileObjectIDs)](Daemon& self, auto& answered) {
+    NSErrorPtr error;
+    std::vector<NSURLPtr> urls;
+    urls.reserve(ids.size());
+    for (const auto& path : self._parts.store.pathsForIDs(ids, &error)) {
+      urls.push_back(path ? NSURL::fileURLWithPath(*path) : nullptr);
+    }
+    answered(std::move(urls), error);
+  });
+}
+
 void Daemon::queryItemForURL(NSURLPtr url, bool scanFirst,
                              Reply<VLQueryItemPtr, NSErrorPtr> reply) {
   answer(std::move(reply), [url = std::move(url), scanFirst](Daemon& self, auto& answered) {

@@ -70,6 +70,8 @@ class Daemon final : public LocalDaemon, public std::enable_shared_from_this<Dae
       Reply<NSURLPtr, std::optional<std::string>, bool, NSErrorPtr> reply) override;
 
   void URLForFileObjectID(VLFileObjectID fileObjectID, Reply<NSURLPtr, NSErrorPtr> reply) override;
+  void URLsForFileObjectIDs(std::vector<VLFileObjectID> fileObjectIDs,
+                            Reply<std::vector<NSURLPtr>, NSErrorPtr> reply) override;
   void queryItemForURL(NSURLPtr url, bool scanFirst,
                        Reply<VLQueryItemPtr, NSErrorPtr> reply) override;
   void account(Reply<std::optional<LocalAccount>, NSErrorPtr> reply) override;

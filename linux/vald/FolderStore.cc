@@ -5,6 +5,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
+#include <unordered_map>
 
 #include "linux/vald/files/FileNames.h"
 #include "linux/vald/index/IndexFile.h"
@@ -321,18 +322,37 @@ std::optional<std::string> FolderStore::pathOfFolder(IndexReader& reader, Folder
 }
 
 std::optional<std::string> FolderStore::pathForID(VLFileObjectID id, NSErrorOut error) {
+  const auto paths = pathsForIDs({id}, error);
+  if (paths.empty()) return std::nullopt;
+  if (!paths.front()) error.store(noSuchFile("There is no item " + id.asString() + "."));
+  return paths.front();
+}
+
+std::vector<std::optional<std::string>> FolderStore::pathsForIDs(
+    const std::vector<VLFileObjectID>& ids, NSErrorOut error) {
   auto reader = _readers.lease();
-  if (storeFailure(reader, error)) return std::nullopt;
-  std::optional<std::string> path;
-  if (const auto folder = reader->folderWithID(id)) {
-    path = pathOfFolder(*reader.get(), folder->number);
-  } else if (const auto found = reader->itemWithID(id)) {
-    path = pathOfFolder(*reader.get(), found->row.parent);
-    if (path) *path += '/' + found->row.name;
+  if (storeFailure(reader, error)) return {};
+  // Most of a batch lie in few folders.
+  std::unordered_map<FolderKey, std::optional<std::string>> folders;
+  const auto pathOf = [&](FolderKey folder) {
+    const auto [known, isNew] = folders.try_emplace(folder);
+    if (isNew) known->second = pathOfFolder(*reader.get(), folder);
+    return known->second;
+  };
+  std::vector<std::optional<std::string>> paths;
+  paths.reserve(ids.size());
+  for (const VLFileObjectID& id : ids) {
+    std::optional<std::string> path;
+    if (const auto folder = reader->folderWithID(id)) {
+      path = pathOf(folder->number);
+    } else if (const auto name = reader->nameWithID(id)) {
+      path = pathOf(name->folder);
+      if (path) *path += '/' + name->name;
+    }
+    paths.push_back(std::move(path));
   }
-  if (storeFailure(reader, error)) return std::nullopt;
-  if (!path) error.store(noSuchFile("There is no item " + id.asString() + "."));
-  return path;
+  if (storeFailure(reader, error)) return {};
+  return paths;
 }
 
 // ---- the journal

@@ -29,6 +29,8 @@ class FolderStore final : public Store {
   VLQueryItemPtr itemWithID(VLFileObjectID id, NSErrorOut error) override;
   VLQueryItemPtr itemAtPath(const std::string& path, bool scanFirst, NSErrorOut error) override;
   std::optional<std::string> pathForID(VLFileObjectID id, NSErrorOut error) override;
+  std::vector<std::optional<std::string>> pathsForIDs(const std::vector<VLFileObjectID>& ids,
+                                                      NSErrorOut error) override;
   std::uint64_t currentRank() override { return _writer->rank(); }
   ChangePage changesSince(std::uint64_t rank, std::uint64_t limit, NSErrorOut error) override
       SKEIN_EXCLUDES(_mutex);

@@ -89,6 +89,10 @@ class Store {
   virtual VLQueryItemPtr itemWithID(VLFileObjectID id, NSErrorOut error) = 0;
   virtual VLQueryItemPtr itemAtPath(const std::string& path, bool scanFirst, NSErrorOut error) = 0;
   virtual std::optional<std::string> pathForID(VLFileObjectID id, NSErrorOut error) = 0;
+  // The same of many, of one moment: as many, in their order, nullopt for what is not there.
+  // None, with an error, when the index cannot be read.
+  virtual std::vector<std::optional<std::string>> pathsForIDs(
+      const std::vector<VLFileObjectID>& ids, NSErrorOut error) = 0;
 
   virtual std::uint64_t currentRank() = 0;
   // At most `limit` changes after `rank`; 0 is the start of the history and never expires.

@@ -72,6 +72,7 @@ class FakeDaemon final : public LocalDaemon {
   std::vector<VLFileObjectID> deletions;
   std::optional<NSData> token;
   NSURLPtr url;
+  std::vector<NSURLPtr> urls;
   VLQueryItemPtr item;
   NSErrorPtr error;
   LocalDaemonStatus statusNow;
@@ -139,6 +140,11 @@ class FakeDaemon final : public LocalDaemon {
   void URLForFileObjectID(VLFileObjectID fileObjectID, Reply<NSURLPtr, NSErrorPtr> reply) override {
     asked.add("url " + fileObjectID.asString());
     reply(url, error);
+  }
+  void URLsForFileObjectIDs(std::vector<VLFileObjectID> fileObjectIDs,
+                            Reply<std::vector<NSURLPtr>, NSErrorPtr> reply) override {
+    asked.add(std::to_string(fileObjectIDs.size()) + " urls");
+    reply(urls, error);
   }
   void queryItemForURL(NSURLPtr queried, bool scanFirst,
                        Reply<VLQueryItemPtr, NSErrorPtr> reply) override {

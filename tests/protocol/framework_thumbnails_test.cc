@@ -132,7 +132,7 @@ TEST_F(CloudKit, ALostConnectionEndsIt) {
 }
 
 TEST_F(CloudKit, ManyDocumentsAreFoundAtOnceAndOnThisThreadAlone) {
-  daemon->url = NSURL::fileURLWithPath("/s/a");
+  daemon->urls = {nullptr, NSURL::fileURLWithPath("/s/a")};
   const auto id = VLFileObjectID::documentWithRawID;
   const auto proxies = [this](auto handler) {
     return client->remoteObjectProxyWithErrorHandler(std::move(handler));
@@ -140,7 +140,9 @@ TEST_F(CloudKit, ManyDocumentsAreFoundAtOnceAndOnThisThreadAlone) {
   {
     const DocumentURLScope scope(proxies, *executor, {id(1), id(2)});
     EXPECT_EQ(DocumentURLScope::find(id(2))->path(), "/s/a");
+    EXPECT_FALSE(DocumentURLScope::find(id(1)));
     EXPECT_FALSE(DocumentURLScope::find(id(3)));
+    EXPECT_EQ(daemon->asked.take(), "2 urls");
   }
   EXPECT_FALSE(DocumentURLScope::find(id(2)));
   // A vald that is gone: nothing is known, and nothing hangs.

@@ -156,6 +156,19 @@ TEST_F(RoundTrip, LookupsAnswerNilWithAndWithoutAnError) {
   EXPECT_EQ(std::get<0>(lookUp("/s", false))->properties(), everythingSet());
   EXPECT_EQ(*std::get<0>(urlOf(kFolder)), *daemon->url);
 
+  const auto urlsOf = [&](std::vector<VLFileObjectID> ids) {
+    return std::get<0>(
+        ask<std::vector<NSURLPtr>, NSErrorPtr>(*client, [&](LocalDaemon& proxy, auto reply) {
+          proxy.URLsForFileObjectIDs(std::move(ids), std::move(reply));
+        }));
+  };
+  EXPECT_TRUE(urlsOf({}).empty());
+  daemon->urls = {nullptr, daemon->url, nullptr};
+  const auto urls = urlsOf({kFolder, kDocument, kFolder});
+  ASSERT_EQ(urls.size(), 3U);
+  EXPECT_FALSE(urls[0] || urls[2]);
+  EXPECT_EQ(*urls[1], *daemon->url);
+
   // Paths that are none are refused before vald sees them.
   for (const char* path : {"", "relative", "/s/../etc", "/s/."}) {
     const auto [found, error] = lookUp(path, false);

@@ -141,6 +141,13 @@ std::optional<std::string> FakeStore::pathForID(VLFileObjectID id, NSErrorOut er
   return *parent + '/' + found->second.item.filename;
 }
 
+std::vector<std::optional<std::string>> FakeStore::pathsForIDs(
+    const std::vector<VLFileObjectID>& ids, NSErrorOut) {
+  std::vector<std::optional<std::string>> paths;
+  for (const VLFileObjectID& id : ids) paths.push_back(pathForID(id, nullptr));
+  return paths;
+}
+
 ChangePage FakeStore::changesSince(std::uint64_t rank, std::uint64_t limit, NSErrorOut) {
   lastLimit = limit;
   ChangePage page;

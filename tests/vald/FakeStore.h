@@ -37,6 +37,8 @@ class FakeStore final : public Store {
   VLQueryItemPtr itemWithID(VLFileObjectID id, NSErrorOut error) override;
   VLQueryItemPtr itemAtPath(const std::string& path, bool scanFirst, NSErrorOut error) override;
   std::optional<std::string> pathForID(VLFileObjectID id, NSErrorOut error) override;
+  std::vector<std::optional<std::string>> pathsForIDs(const std::vector<VLFileObjectID>& ids,
+                                                      NSErrorOut error) override;
   std::uint64_t currentRank() override { return _journal.size(); }
   ChangePage changesSince(std::uint64_t rank, std::uint64_t limit, NSErrorOut error) override;
   std::string journalID() override { return journal; }

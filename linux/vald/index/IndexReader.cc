@@ -44,6 +44,7 @@ IndexReader::IndexReader(std::unique_ptr<SqliteDatabase> database)
       _folder(*_database, SKEIN_FOLDER "WHERE key=?"),
       _folderWithID(*_database, SKEIN_FOLDER "WHERE id=?"),
       _itemWithID(*_database, SKEIN_FOUND "WHERE item.id=? AND (item.kind=0)=?"),
+      _nameWithID(*_database, "SELECT parent, name FROM item WHERE id=? AND (kind=0)=?"),
       _itemNamed(*_database, SKEIN_FOUND "WHERE item.parent=? AND item.name=?"),
       _itemsAfter(*_database, SKEIN_FOUND "WHERE item.rank>? ORDER BY item.rank LIMIT ?"),
       _tombstonesAfter(*_database,
@@ -186,6 +187,14 @@ std::optional<FoundItem> IndexReader::itemWithID(VLFileObjectID id) {
   auto items = all(_itemWithID.start(id.rawID(), id.isFolderOrAliasID() ? 0 : 1));
   if (items.empty()) return std::nullopt;
   return std::move(items.front());
+}
+
+std::optional<IndexReader::Name> IndexReader::nameWithID(VLFileObjectID id) {
+  std::optional<Name> name;
+  _nameWithID.start(id.rawID(), id.isFolderOrAliasID() ? 0 : 1);
+  if (_nameWithID.step()) name = {_nameWithID.integer(0), std::string(_nameWithID.bytes(1))};
+  _nameWithID.reset();
+  return name;
 }
 
 std::optional<FoundItem> IndexReader::itemNamed(FolderKey folder, std::string_view name) {

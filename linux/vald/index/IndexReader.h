@@ -49,6 +49,12 @@ class IndexReader {
   bool isTrashed(FolderKey folder);
 
   std::optional<FoundItem> itemWithID(VLFileObjectID id);
+  // Where an item is, without the rest of it.
+  struct Name {
+    FolderKey folder = kNoFolder;
+    std::string name;
+  };
+  std::optional<Name> nameWithID(VLFileObjectID id);
   std::optional<FoundItem> itemNamed(FolderKey folder, std::string_view name);
   std::vector<ItemRow> children(FolderKey folder);
 
@@ -75,7 +81,8 @@ class IndexReader {
   std::unique_ptr<SqliteDatabase> _database;
   // Of this moment; forgotten at its end.
   std::unordered_map<FolderKey, bool> _trashed;
-  SqliteStatement _folder, _folderWithID, _itemWithID, _itemNamed, _itemsAfter, _tombstonesAfter;
+  SqliteStatement _folder, _folderWithID, _itemWithID, _nameWithID, _itemNamed, _itemsAfter,
+      _tombstonesAfter;
   SqliteStatement _byName, _byAge, _byNameAfter, _byAgeAfter;
   SqliteStatement _allByName, _allByAge, _allByNameAfter, _allByAgeAfter;
 };

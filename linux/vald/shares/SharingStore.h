@@ -57,6 +57,10 @@ class SharingStore final : public Store {
   std::optional<std::string> pathForID(VLFileObjectID id, NSErrorOut error) override {
     return _store.pathForID(id, error);
   }
+  std::vector<std::optional<std::string>> pathsForIDs(const std::vector<VLFileObjectID>& ids,
+                                                      NSErrorOut error) override {
+    return _store.pathsForIDs(ids, error);
+  }
   std::uint64_t currentRank() override { return _store.currentRank(); }
   std::string journalID() override { return _store.journalID(); }
   void retainFolderWatch(VLFileObjectID folder) override { _store.retainFolderWatch(folder); }
