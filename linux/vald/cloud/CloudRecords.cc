@@ -138,11 +138,16 @@ Outcome<std::vector<CloudRecord>> CloudRecords::records(
   MutexLock lock(_mutex);
   std::vector<CloudRecord> found;
   const auto row = _database->prepare(std::string(kColumns) + "WHERE document = ?");
-  for (const VLFileObjectID& document : documents) {
-    if (row->bind(1, key(document)).step()) found.push_back(recordOf(*row));
-    if (NSErrorPtr error = row->error()) return error;
-    row->reset();
-  }
+  // One transaction: the file is locked once, and not for each of many.
+  NSErrorPtr error = _database->transact([&]() -> NSErrorPtr {
+    for (const VLFileObjectID& document : documents) {
+      if (row->bind(1, key(document)).step()) found.push_back(recordOf(*row));
+      if (NSErrorPtr failed = row->error()) return failed;
+      row->reset();
+    }
+    return nullptr;
+  });
+  if (error) return error;
   return found;
 }
 
