@@ -21,6 +21,7 @@
 #include "linux/framework/LocalFramework.h"
 #include "linux/host/LocalListeners.h"
 #include "linux/host/ThumbnailRequests.h"
+#include "linux/host/ThumbnailStream.h"
 #include "linux/protocol/DaemonServer.h"
 #include "linux/vald/Daemon.h"
 #include "linux/vald/Drive.h"
@@ -302,6 +303,7 @@ double cancelInTheMiddle(Host& host, const std::vector<std::string>& identifiers
 }
 
 int run() {
+  ThumbnailStream::keepMemoryForPictures();  // as skein-host does
   const Folder folder;
   Vald vald(folder.path);
   Host host(vald.socket());

@@ -1,5 +1,7 @@
 #include "linux/host/ThumbnailStream.h"
 
+#include <malloc.h>
+
 #include <algorithm>
 #include <utility>
 
@@ -31,6 +33,8 @@ HostThumbnail::Kind kindOf(const NSFileProviderItemIdentifier& identifier, bool 
 
 ThumbnailStream::ThumbnailStream(const HostTools& tools, std::size_t targets)
     : _executor(tools.executor), _targets(targets), _queue("thumbnails", tools.executor) {}
+
+void ThumbnailStream::keepMemoryForPictures() { mallopt(M_TRIM_THRESHOLD, kMostBytes); }
 
 void ThumbnailStream::expect(std::uint32_t index, const NSFileProviderItemIdentifier& identifier) {
   _queue.async([self = shared_from_this(), index, identifier] {

@@ -27,6 +27,10 @@ class ThumbnailStream final : public std::enable_shared_from_this<ThumbnailStrea
  public:
   ThumbnailStream(const HostTools& tools, std::size_t targets);
 
+  // Once, when the process starts: the memory that a batch's pictures were in stays for those
+  // that follow. Given back to the system picture by picture, it costs more than reading them.
+  static void keepMemoryForPictures();
+
   // Target `index` is the item `identifier`: before its thumbnail comes.
   void expect(std::uint32_t index, const NSFileProviderItemIdentifier& identifier);
   void fail(std::uint32_t index, NSErrorPtr error);

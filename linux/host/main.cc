@@ -23,6 +23,7 @@
 #include "linux/host/LocalListeners.h"
 #include "linux/host/NSExtensionMain.h"
 #include "linux/host/ServiceRequests.h"
+#include "linux/host/ThumbnailStream.h"
 #include "linux/protocol/HostServer.h"
 #include "linux/protocol/LogFile.h"
 #include "linux/protocol/ProcessLauncher.h"
@@ -261,6 +262,7 @@ int main(int argc, char** argv) {
     std::fputs(kHelp, stdout);
     return 0;
   }
+  ThumbnailStream::keepMemoryForPictures();
   // Before there are threads: they inherit it, so that main alone takes these.
   std::signal(SIGPIPE, SIG_IGN);
   sigset_t endSignals;
