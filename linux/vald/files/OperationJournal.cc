@@ -54,6 +54,12 @@ int posixOf(sqlite3* database, int code) {
   }
 }
 
+// Recovery has nothing to finish of these.
+bool isOneStep(OperationKind kind) {
+  return kind == OperationKind::CreateFolder || kind == OperationKind::Rename ||
+         kind == OperationKind::Move || kind == OperationKind::MakeAlias;
+}
+
 }  // namespace
 
 const char* operationName(OperationKind kind) {
@@ -89,7 +95,9 @@ std::unique_ptr<OperationJournal> OperationJournal::open(const std::string& data
 
   MutexLock lock(journal->_mutex);
   int version = 0;
-  int code = journal->run("PRAGMA journal_mode = WAL");
+  // Nobody else reads it: without locks an entry costs half as much. The lock that keeps others
+  // out is taken with the first access.
+  int code = journal->run("PRAGMA locking_mode = EXCLUSIVE; PRAGMA journal_mode = WAL");
   if (code == SQLITE_OK) {
     sqlite3_stmt* statement = nullptr;
     code = sqlite3_prepare_v2(database, "PRAGMA user_version", -1, &statement, nullptr);
@@ -129,6 +137,13 @@ OperationJournal::~OperationJournal() {
 
 int OperationJournal::run(const std::string& sql) {
   return sqlite3_exec(_database, sql.c_str(), nullptr, nullptr, nullptr);
+}
+
+int OperationJournal::setDurable(bool isDurable) {
+  if (isDurable == _isDurable) return SQLITE_OK;
+  const int code = run(isDurable ? "PRAGMA synchronous = FULL" : "PRAGMA synchronous = NORMAL");
+  if (code == SQLITE_OK) _isDurable = isDurable;
+  return code;
 }
 
 int OperationJournal::run(sqlite3_stmt* statement) {
@@ -180,7 +195,7 @@ NSErrorPtr OperationJournal::begin(OperationEntry& entry) {
   }
   entry.when = std::chrono::time_point_cast<NSDate::duration>(std::chrono::system_clock::now());
   MutexLock lock(_mutex);
-  int code = run("PRAGMA synchronous = FULL");
+  int code = setDurable(!isOneStep(entry.kind));
   if (code == SQLITE_OK) code = run(_beginTransaction);
   if (code == SQLITE_OK) {
     for (const End& end : _unwritten) {
@@ -205,7 +220,7 @@ NSErrorPtr OperationJournal::begin(OperationEntry& entry) {
 void OperationJournal::finish(End end) {
   const int fault = _files.step(FileStep::JournalEnd, {});
   MutexLock lock(_mutex);
-  if (fault == 0 && run("PRAGMA synchronous = NORMAL") == SQLITE_OK && write(end) == SQLITE_OK) {
+  if (fault == 0 && setDurable(false) == SQLITE_OK && write(end) == SQLITE_OK) {
     return;
   }
   _unwritten.insert(end);

@@ -47,8 +47,9 @@ struct OperationEntry {
 
 // The durable journal of file operations: an SQLite database of its own in the drive's
 // state folder, beside the index, which may be thrown away and made again while this may
-// not. An entry is written and on the disk before anything is changed; its end is
-// written after the change, without waiting for the disk, since an end that a power cut
+// not. An entry is written before anything is changed, and on the disk by then if the change
+// takes several steps: what a power cut leaves of one step is whole without an entry. Its end
+// is written after the change, without waiting for the disk, since an end that a power cut
 // loses is found again by looking at the files. Ended entries stay as the provenance of
 // what went and moved, the newest `retention` of them. Any thread.
 class OperationJournal {
@@ -85,6 +86,8 @@ class OperationJournal {
     friend auto operator<=>(const End&, const End&) = default;
   };
   void finish(End end);
+  // Whether commits wait for the disk from here on. 0 or SQLite's code.
+  int setDurable(bool isDurable) SKEIN_REQUIRES(_mutex);
   // 0 or SQLite's code.
   int run(const std::string& sql) SKEIN_REQUIRES(_mutex);
   int run(sqlite3_stmt* statement) SKEIN_REQUIRES(_mutex);
@@ -104,6 +107,7 @@ class OperationJournal {
   sqlite3_stmt* _commit SKEIN_GUARDED_BY(_mutex) = nullptr;
   sqlite3_stmt* _insert SKEIN_GUARDED_BY(_mutex) = nullptr;
   sqlite3_stmt* _setState SKEIN_GUARDED_BY(_mutex) = nullptr;
+  bool _isDurable SKEIN_GUARDED_BY(_mutex) = true;  // SQLite's own beginning
   std::set<End> _unwritten SKEIN_GUARDED_BY(_mutex);
 };
 
