@@ -112,7 +112,9 @@ class Files final : public LocalFiles {
   // Null, or why no marker can stand for a document of this name.
   NSErrorPtr refusalOfMarkerName(const Subject& subject, const std::string& name) const;
 
-  // Changes what the index alone keeps, and notes on the file which document it is.
+  // Notes on the file of an item that is there which document it is. Whether that changed it.
+  bool writeHint(const Subject& subject);
+  // Changes what the index alone keeps, and writes the hint.
   NSErrorPtr changeDetails(const std::string& path, std::function<void(ItemDetails&)> change);
   void startDownload(const std::string& path, const std::shared_ptr<NSProgress>& progress,
                      Reply<NSErrorPtr> reply);

@@ -24,27 +24,32 @@ std::optional<std::int64_t> nanoseconds(const std::optional<NSDate>& date) {
 
 }  // namespace
 
+bool Files::writeHint(const Subject& subject) {
+  const VLFileObjectID id = subject.item->fileObjectID();
+  return !id.isFolderOrAliasID() && _parts.operations.writeHint(subject.place.physical, id.rawID());
+}
+
 NSErrorPtr Files::changeDetails(const std::string& path, std::function<void(ItemDetails&)> change) {
   const Subject subject = subjectAt(path);
   if (!subject.item) return fileError(ENOENT, "can't find", path);
   const VLFileObjectID id = subject.item->fileObjectID();
   if (NSErrorPtr error = _parts.store.changeDetails(id, std::move(change))) return error;
-  if (id.isFolderOrAliasID()) return nullptr;
-  _parts.operations.writeHint(subject.place.physical, id.rawID());
-  _parts.store.lookAtPaths({subject.place.path});
+  if (writeHint(subject)) _parts.store.lookAtPaths({subject.place.path});
   return nullptr;
 }
 
 void Files::setTagNames(NSURLPtr url, std::vector<std::string> names, Reply<NSErrorPtr> reply) {
   answer("url", url, std::move(reply), [=, this](Reply<NSErrorPtr>& answered) {
-    const DocumentPlace place = findDocument(_parts.operations.roots(), url->path());
-    const TagResult result = _parts.operations.setTags(place.physical, names);
+    const Subject subject = subjectAt(url->path());
+    // Before the tags, so that one look at the file sees both.
+    if (subject.item) writeHint(subject);
+    const TagResult result = _parts.operations.setTags(subject.place.physical, names);
     if (result.storage == TagStorage::Failed) return answered(result.error);
-    if (result.storage == TagStorage::Kept) _parts.store.lookAtPaths({place.path});
+    if (result.storage == TagStorage::Kept) _parts.store.lookAtPaths({subject.place.path});
     // Also where the file has them: an index that was told is not behind.
     const bool isOnFile = result.storage == TagStorage::Kept;
     const std::string tags = joinTags(names);
-    answered(changeDetails(place.path, [tags, isOnFile](ItemDetails& details) {
+    answered(changeDetails(subject.place.path, [tags, isOnFile](ItemDetails& details) {
       details.tags = tags;
       details.tagsAreOnFile = isOnFile && !tags.empty();
     }));

@@ -76,7 +76,7 @@ NSErrorPtr FileOperations::waitFor(const std::string& path) {
   return take(path, {path}, place, hold);
 }
 
-void FileOperations::writeHint(const std::string& path, std::uint64_t document) {
+bool FileOperations::writeHint(const std::string& path, std::uint64_t document) {
   FileCoordinator::Claim held;
   StorePlace place;
   FileDescriptor entry;
@@ -84,7 +84,7 @@ void FileOperations::writeHint(const std::string& path, std::uint64_t document) 
   if (claim({path}, deadline(), held) || _roots.locate(path, place) || place.isRoot() ||
       place.folder.status(place.name, status) != 0 || !S_ISREG(status.st_mode) ||
       place.folder.openEntry(place.name, entry) != 0) {
-    return;
+    return false;
   }
   DocumentHint hint{document, status.st_ino, 0};
   int generation = 0;
@@ -98,10 +98,12 @@ void FileOperations::writeHint(const std::string& path, std::uint64_t document) 
   const std::string text = hint.asText();
   char known[128];
   const ssize_t size = ::getxattr(own.c_str(), kHintAttribute, known, sizeof known);
-  if (size >= 0 && text == std::string_view(known, static_cast<std::size_t>(size))) return;
+  if (size >= 0 && text == std::string_view(known, static_cast<std::size_t>(size))) return false;
   if (const int failure = _files.setAttribute(own, kHintAttribute, text)) {
     VL_DEBUG(_log, "[DEBUG] %@ has no hint: %@", path, std::generic_category().message(failure));
+    return false;
   }
+  return true;
 }
 
 NSErrorPtr FileOperations::take(const std::string& path, std::vector<std::string> paths,

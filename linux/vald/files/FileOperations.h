@@ -112,8 +112,9 @@ class FileOperations {
   NSErrorPtr waitFor(const std::string& path);
 
   // Notes on a document's file which document it is (see DocumentHint.h). Nothing depends on
-  // it while the index lives, so a file that cannot have it is none of an error's.
-  void writeHint(const std::string& path, std::uint64_t document);
+  // it while the index lives, so a file that cannot have it is none of an error's. Whether the
+  // file was changed.
+  bool writeHint(const std::string& path, std::uint64_t document);
 
   TagResult tags(const std::string& path) const;
   TagResult setTags(const std::string& path, const std::vector<std::string>& names);

@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <string_view>
 
 #include "linux/vald/files/FileErrors.h"
 
@@ -26,6 +27,14 @@ TagResult failed(int number, const char* doing, const std::string& path) {
                                path)};
   }
   return {TagStorage::Failed, {}, fileError(number, doing, path)};
+}
+
+// Whether the file has exactly these, and nothing is to be written.
+bool hasTags(const std::string& file, const std::string& value) {
+  std::string known(value.size() + 1, '\0');
+  const ssize_t size = ::getxattr(file.c_str(), kTagsAttribute, known.data(), known.size());
+  if (size < 0) return errno == ENODATA && value.empty();
+  return !value.empty() && value == std::string_view(known.data(), static_cast<std::size_t>(size));
 }
 
 }  // namespace
@@ -109,6 +118,7 @@ TagResult writeTags(FileLayer& files, const DirectoryHandle& folder, const std::
   }
   const std::string own = descriptorPath(entry.get());
   const std::string value = joinTags(names);
+  if (hasTags(own, value)) return {TagStorage::Kept, splitTags(value), nullptr};
   int failure = value.empty() ? files.removeAttribute(own, kTagsAttribute)
                               : files.setAttribute(own, kTagsAttribute, value);
   if (failure == ENODATA) failure = 0;
