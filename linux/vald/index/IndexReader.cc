@@ -50,6 +50,8 @@ IndexReader::IndexReader(std::unique_ptr<SqliteDatabase> database)
       _tombstonesAfter(*_database,
                        "SELECT rank, id, kind, holder FROM tombstone WHERE rank>? ORDER BY rank "
                        "LIMIT ?"),
+      _rootRows(*_database, "SELECT folder, container, path, inode, generation FROM root"),
+      _setting(*_database, "SELECT value FROM setting WHERE name=?"),
       _byName(*_database,
               SKEIN_FOUND "WHERE item.parent=? ORDER BY item.name, item.id LIMIT ? OFFSET ?"),
       _byAge(*_database, SKEIN_FOUND
@@ -100,17 +102,17 @@ std::optional<FolderRow> IndexReader::folderWithID(VLFileObjectID id) {
   return oneFolder(_folderWithID.start(id.rawID()));
 }
 
-std::vector<RootRow> IndexReader::roots() {
-  std::vector<RootRow> roots;
-  SqliteStatement statement(*_database,
-                            "SELECT folder, container, path, inode, generation FROM root");
-  while (statement.step()) {
+const std::vector<RootRow>& IndexReader::roots() {
+  if (_roots) return *_roots;
+  std::vector<RootRow>& roots = _roots.emplace();
+  _rootRows.start();
+  while (_rootRows.step()) {
     RootRow root;
-    root.folder = statement.integer(0);
-    if (!statement.isNull(1)) root.containerID = statement.bytes(1);
-    root.path = statement.bytes(2);
-    root.key.inode = statement.number(3);
-    root.key.generation = static_cast<std::uint32_t>(statement.integer(4));
+    root.folder = _rootRows.integer(0);
+    if (!_rootRows.isNull(1)) root.containerID = _rootRows.bytes(1);
+    root.path = _rootRows.bytes(2);
+    root.key.inode = _rootRows.number(3);
+    root.key.generation = static_cast<std::uint32_t>(_rootRows.integer(4));
     roots.push_back(std::move(root));
   }
   return roots;
@@ -177,8 +179,8 @@ std::vector<std::pair<std::string, std::uint64_t>> IndexReader::tags() {
 }
 
 std::optional<RootRow> IndexReader::root(FolderKey folder) {
-  for (RootRow& root : roots()) {
-    if (root.folder == folder) return std::move(root);
+  for (const RootRow& root : roots()) {
+    if (root.folder == folder) return root;
   }
   return std::nullopt;
 }
@@ -252,10 +254,11 @@ std::uint64_t IndexReader::number(const char* sql) {
 }
 
 std::optional<std::string> IndexReader::setting(const std::string& name) {
-  SqliteStatement statement(*_database, "SELECT value FROM setting WHERE name=?");
-  statement.start(name);
-  if (!statement.step()) return std::nullopt;
-  return std::string(statement.bytes(0));
+  std::optional<std::string> value;
+  _setting.start(name);
+  if (_setting.step()) value = std::string(_setting.bytes(0));
+  _setting.reset();
+  return value;
 }
 
 IndexReaders::Lease::Lease(IndexReaders& readers, std::unique_ptr<IndexReader> reader)

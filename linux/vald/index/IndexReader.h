@@ -33,16 +33,20 @@ class IndexReader {
   // What is read until end() is of one moment.
   void begin() {
     _trashed.clear();
-    _database->execute("BEGIN");
+    _roots.reset();
+    _database->beginReading();
   }
-  void end() { _database->rollback(); }
+  void end() {
+    if (!_database->failed()) _database->commit();
+    _database->rollback();
+  }
   bool failed() const { return _database->failed(); }
   const std::string& message() const { return _database->message(); }
 
   std::optional<FolderRow> folder(FolderKey key);
   std::optional<FolderRow> folderWithID(VLFileObjectID id);
   std::optional<RootRow> root(FolderKey folder);
-  std::vector<RootRow> roots();
+  const std::vector<RootRow>& roots();
   // The roots' trash folders.
   std::vector<FolderRow> trashes();
   // Whether the folder is a trash, or lies in one.
@@ -81,8 +85,10 @@ class IndexReader {
   std::unique_ptr<SqliteDatabase> _database;
   // Of this moment; forgotten at its end.
   std::unordered_map<FolderKey, bool> _trashed;
+  std::optional<std::vector<RootRow>> _roots;
   SqliteStatement _folder, _folderWithID, _itemWithID, _nameWithID, _itemNamed, _itemsAfter,
       _tombstonesAfter;
+  SqliteStatement _rootRows, _setting;
   SqliteStatement _byName, _byAge, _byNameAfter, _byAgeAfter;
   SqliteStatement _allByName, _allByAge, _allByNameAfter, _allByAgeAfter;
 };

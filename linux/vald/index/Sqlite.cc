@@ -20,7 +20,10 @@ std::unique_ptr<SqliteDatabase> SqliteDatabase::open(const std::string& path, bo
   return std::unique_ptr<SqliteDatabase>(new SqliteDatabase(handle));
 }
 
-SqliteDatabase::~SqliteDatabase() { sqlite3_close_v2(_handle); }
+SqliteDatabase::~SqliteDatabase() {
+  for (sqlite3_stmt* statement : {_begin, _beginReading, _commit}) sqlite3_finalize(statement);
+  sqlite3_close_v2(_handle);
+}
 
 bool SqliteDatabase::execute(const char* sql) {
   if (failed()) return false;
@@ -33,8 +36,20 @@ std::int64_t SqliteDatabase::integer(const char* sql) {
   return statement.step() ? statement.integer(0) : 0;
 }
 
+bool SqliteDatabase::run(sqlite3_stmt*& statement, const char* sql) {
+  if (failed()) return false;
+  if (statement == nullptr && sqlite3_prepare_v3(_handle, sql, -1, SQLITE_PREPARE_PERSISTENT,
+                                                 &statement, nullptr) != SQLITE_OK) {
+    latchFailure();
+    return false;
+  }
+  if (sqlite3_step(statement) != SQLITE_DONE) latchFailure();
+  sqlite3_reset(statement);
+  return !failed();
+}
+
 bool SqliteDatabase::commit() {
-  if (execute("COMMIT")) return true;
+  if (run(_commit, "COMMIT")) return true;
   rollback();
   return false;
 }

@@ -28,9 +28,14 @@ class SqliteDatabase {
   // The first column of the first row; 0 without one.
   std::int64_t integer(const char* sql);
 
-  bool begin() { return execute("BEGIN IMMEDIATE"); }
+  // A transaction that writes; and one that only reads, of one moment.
+  bool begin() { return run(_begin, "BEGIN IMMEDIATE"); }
+  bool beginReading() { return run(_beginReading, "BEGIN"); }
   bool commit();
   void rollback();
+
+  // How many rows this connection has written so far.
+  std::int64_t written() const { return sqlite3_total_changes64(_handle); }
 
   bool failed() const { return _code != SQLITE_OK; }
   int code() const { return _code; }
@@ -42,8 +47,13 @@ class SqliteDatabase {
 
  private:
   explicit SqliteDatabase(sqlite3* handle) : _handle(handle) {}
+  // Runs what is run again and again; prepared when it is first.
+  bool run(sqlite3_stmt*& statement, const char* sql);
 
   sqlite3* _handle;
+  sqlite3_stmt* _begin = nullptr;
+  sqlite3_stmt* _beginReading = nullptr;
+  sqlite3_stmt* _commit = nullptr;
   int _code = SQLITE_OK;
   std::string _message;
 };
