@@ -20,6 +20,7 @@ constexpr std::uint32_t kEvents = IN_CREATE | IN_DELETE | IN_MOVED_FROM | IN_MOV
 
 // Beyond this, reading the folder is cheaper than asking name by name.
 constexpr std::size_t kMostNames = 2000;
+constexpr int kPause = 10;  // ms
 
 std::uint64_t systemBudget() {
   std::uint64_t most = 8192;
@@ -155,6 +156,8 @@ void Watcher::run() {
       wake = drainLocked();
     }
     if (wake) _wake();
+    // What follows at once is read together: the writer waits a while for it anyway.
+    ::poll(descriptors, 1, kPause);
   }
 }
 
