@@ -212,6 +212,7 @@ void StoreWriter::finishRound() {
 }
 
 void StoreWriter::enqueue(const std::vector<FolderKey>& folders) {
+  if (folders.empty()) return;
   std::vector<ScanJob> jobs;
   for (const FolderKey key : folders) {
     Folder* folder = _folders.find(key);
@@ -404,7 +405,7 @@ Look StoreWriter::lookAtNames(const std::vector<Place>& places) {
     if (look == Look::Seen) _reconciler.addName(folder, name, state);
     if (look == Look::Gone) _reconciler.addName(folder, name, std::nullopt);
   }
-  _reconciler.decide(false);
+  _reconciler.decide(false, [this](FolderKey folder) { return _watcher.isWatched(folder); });
   afterDecisions();
   commit();
   return look;

@@ -86,7 +86,7 @@ void Reconciler::compare(const ItemRow& row, const FileState& state) {
 
 // ---- deciding
 
-void Reconciler::decide(bool inRound) {
+void Reconciler::decide(bool inRound, const IsFollowed& isFollowed) {
   _now = _clock();
   std::erase_if(_departures, [&](const auto& d) { return d.second.when + _grace < _now; });
   // A decision may free a name that holds something else by now.
@@ -95,7 +95,7 @@ void Reconciler::decide(bool inRound) {
     decideOnce(inRound);
     if (_appeared.empty() && _replaced.empty() && _vanished.empty()) break;
   }
-  refreshSelves();
+  refreshSelves(isFollowed);
   _disk.forget();
 }
 
@@ -257,9 +257,10 @@ void Reconciler::buryTree(const ItemRow& row) {
   }
 }
 
-void Reconciler::refreshSelves() {
+void Reconciler::refreshSelves(const IsFollowed& isFollowed) {
   const auto selves = std::exchange(_selves, {});
   for (const FolderKey key : selves) {
+    if (isFollowed && isFollowed(key)) continue;
     const Folder* folder = _folders.find(key);
     if (folder == nullptr) continue;
     int descriptor = -1;

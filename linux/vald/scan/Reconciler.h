@@ -58,7 +58,10 @@ class Reconciler {
 
   // Decides what was gathered. While a round goes over the whole store, what vanished or
   // was replaced waits for its end: the file may yet turn up in a folder still to be read.
-  void decide(bool inRound);
+  // The own rows of folders that `isFollowed` are left to the watcher, which tells of such a
+  // folder shortly, and once for many changes in it.
+  using IsFollowed = std::function<bool(FolderKey)>;
+  void decide(bool inRound, const IsFollowed& isFollowed = nullptr);
   void endRound();
 
   // Removes a folder's item and everything below it.
@@ -90,7 +93,7 @@ class Reconciler {
   void appeared(const Difference& difference);
   void replaced(const Difference& difference);
   void vanished(const ItemRow& seen);
-  void refreshSelves();
+  void refreshSelves(const IsFollowed& isFollowed);
 
   bool handBack(const Place& place, const FileState& state, const std::optional<ItemRow>& mover);
   bool returned(const Place& place, const FileState& state);
