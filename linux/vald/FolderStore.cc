@@ -7,10 +7,10 @@
 #include <cstring>
 #include <unordered_map>
 
+#include "linux/vald/RandomToken.h"
 #include "linux/vald/files/FileNames.h"
 #include "linux/vald/index/IndexFile.h"
 #include "linux/vald/scan/StoreNames.h"
-#include "platform/foundation/uuid.h"
 #include "vellum/VLErrors.h"
 
 namespace skein::vald {
@@ -56,18 +56,6 @@ std::unique_ptr<SqliteDatabase> openIndexOf(const RootFolder& drive, const std::
   return openIndexFile(path, log, error);
 }
 
-std::string drawJournalID() {
-  uuid_t uuid;
-  uuid_generate(uuid);
-  static constexpr char kDigits[] = "0123456789abcdef";
-  std::string text;
-  for (const unsigned char byte : uuid) {
-    text += kDigits[byte >> 4];
-    text += kDigits[byte & 15];
-  }
-  return text;
-}
-
 }  // namespace
 
 std::unique_ptr<Store> Store::open(StoreOptions options, StoreListener& listener, Log& log,
@@ -88,8 +76,14 @@ std::unique_ptr<FolderStore> FolderStore::openFolder(StoreOptions options, Store
   if (!database) return nullptr;
   IndexWriter index(*database);
   auto journalID = index.setting(kJournalID);
-  if (!journalID) {
-    journalID = drawJournalID();
+  const bool mayLackCommits = markIndexOpen(*database);
+  if (mayLackCommits) {
+    VL_NOTICE(log,
+              "[NOTICE] the machine went down while the index was open; whoever follows changes "
+              "lists afresh");
+  }
+  if (!journalID || mayLackCommits) {
+    journalID = randomToken();
     index.setSetting(kJournalID, journalID);
   }
   if (database->failed()) {

@@ -97,7 +97,8 @@ class Store {
   virtual std::uint64_t currentRank() = 0;
   // At most `limit` changes after `rank`; 0 is the start of the history and never expires.
   virtual ChangePage changesSince(std::uint64_t rank, std::uint64_t limit, NSErrorOut error) = 0;
-  // Drawn when the index was made: tokens of another index are expired.
+  // Drawn when the index was made, and when it may lack changes that were told, after a power
+  // cut: tokens of another journal are expired.
   virtual std::string journalID() = 0;
 
   // Prefers a watch on this folder when the budget does not cover all of them.

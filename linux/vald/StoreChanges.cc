@@ -135,18 +135,16 @@ bool StoreWriter::changeDetails(VLFileObjectID id,
                                 const std::function<void(ItemDetails&)>& change) {
   if (_isBulk) endBulkLoad();
   if (!commit()) return false;
-  begin(true);
   std::optional<ItemRow> row = _index.rowWithID(id);
-  if (row) {
-    const ItemDetails before = row->hasDetails ? _index.details(id) : ItemDetails();
-    ItemDetails details = before;
-    change(details);
-    if (details != before) {
-      _details.put(*row, details);
-      _journal.updateDetails(*row);
-    }
-  }
-  return commit() && row;
+  if (!row) return false;
+  const ItemDetails before = row->hasDetails ? _index.details(id) : ItemDetails();
+  ItemDetails details = before;
+  change(details);
+  if (details == before) return true;
+  begin(Durability::Now);
+  _details.put(*row, details);
+  _journal.updateDetails(*row);
+  return commit();
 }
 
 void StoreWriter::noteUploads(const std::vector<UploadedFile>& files) {

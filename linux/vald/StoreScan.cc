@@ -17,6 +17,8 @@ constexpr char kAttributesRead[] = "attributes read";
 constexpr char kAttributesUntil[] = "attributes until";
 // A bulk load tells so many items one by one; a small folder is all there is to many.
 constexpr std::uint64_t kMostToldInBulk = 5000;
+constexpr int kPages = 1000;
+constexpr int kPagesOfBulk = 8000;
 
 bool isSameRoot(const FileKey& a, const FileKey& b) {
   return a.inode == b.inode && a.generation == b.generation;
@@ -42,6 +44,7 @@ void StoreWriter::load() {
   _lastSlowRound = now;
   _bulkStart = now;
   _isBulk = _folders.size() == 0;
+  checkpointAfter(_isBulk ? kPagesOfBulk : kPages);
   if (!_isBulk && !hasSecondaryIndexes(*_database)) buildSecondaryIndexes(*_database);
 
   begin();
@@ -358,6 +361,7 @@ void StoreWriter::endBulkLoad() {
   if (!_isBulk) return;
   if (!commit()) return;
   _isBulk = false;
+  checkpointAfter(kPages);
   _bulkIDs.clear();
   _attributesUntil = _index.rank();
   _isReadingAttributes = _attributesAt < _attributesUntil;

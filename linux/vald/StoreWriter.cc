@@ -19,6 +19,7 @@ constexpr auto kSlowRound = 30s;
 constexpr auto kLongestBulkWait = 10s;
 // Beyond this, receivers list afresh rather than hear of every item.
 constexpr std::size_t kMostTold = 20'000;
+constexpr char kOnDisk[] = "on disk";
 
 std::int64_t millisecondsNow() {
   return std::chrono::duration_cast<std::chrono::milliseconds>(
@@ -138,6 +139,7 @@ void StoreWriter::run() {
     tick();
   }
   if (_inTransaction) commit();
+  if (!_database->failed()) markIndexClosed(*_database);
   std::vector<Task> unserved;
   {
     MutexLock lock(_mutex);
@@ -226,6 +228,7 @@ void StoreWriter::answerSettled() {
   if (_inRound || _isBulk || _inTransaction || !_later.empty() || _scanner.pending() != 0) return;
   {
     MutexLock lock(_mutex);
+    if (_settling.empty()) return;
     for (auto waiter = _settling.begin(); waiter != _settling.end();) {
       if ((*waiter)->isSeen) {
         (*waiter)->isDone = true;
@@ -249,6 +252,11 @@ void StoreWriter::tick() {
     load();
     return;
   }
+  if (!_isOnDisk && !_isBulk && !_inTransaction && !_isBroken) {
+    begin(Durability::Now);
+    _index.setSetting(kOnDisk, std::to_string(_index.rank()));
+    commit();
+  }
   checkRoots();
   if (now - _lastSlowRound >= kSlowRound) {
     _lastSlowRound = now;
@@ -264,23 +272,21 @@ void StoreWriter::tick() {
 
 // ---- transactions
 
-// Identities and ranks wait for the disk; what a bulk load read can be read again.
-void StoreWriter::setDurability(bool isFull) {
-  if (isFull == _isFull) return;
-  _isFull = isFull;
-  _database->execute(isFull ? "PRAGMA synchronous = FULL; PRAGMA wal_autocheckpoint = 1000"
-                            : "PRAGMA synchronous = NORMAL; PRAGMA wal_autocheckpoint = 8000");
-}
-
-void StoreWriter::begin() { begin(!_isBulk); }
-
-void StoreWriter::begin(bool isFull) {
+void StoreWriter::begin(Durability durability) {
   if (_inTransaction) return;
-  setDurability(isFull);
+  if (durability != _durability) {
+    _durability = durability;
+    _database->execute(durability == Durability::Now ? "PRAGMA synchronous = FULL"
+                                                     : "PRAGMA synchronous = NORMAL");
+  }
   _database->begin();
   _inTransaction = true;
   _transactionStart = std::chrono::steady_clock::now();
   _rankAtBegin = _index.rank();
+}
+
+void StoreWriter::checkpointAfter(int pages) {
+  _database->execute(("PRAGMA wal_autocheckpoint = " + std::to_string(pages)).c_str());
 }
 
 bool StoreWriter::commit() {
@@ -291,6 +297,8 @@ bool StoreWriter::commit() {
     fail();
     return false;
   }
+  _isOnDisk = _durability == Durability::Now || (_isOnDisk && _database->written() == _written);
+  _written = _database->written();
   publish();
   const auto changes = _journal.takeChanges();
   if (changes.size() > kMostTold) {
@@ -386,7 +394,7 @@ std::string StoreWriter::failure() const {
 bool StoreWriter::setSetting(const std::string& key, const std::optional<std::string>& value) {
   // Durability cannot change inside a transaction, so a bulk load's ends first.
   if (!commit()) return false;
-  begin(true);
+  begin(Durability::Now);
   _index.setSetting("value " + key, value);
   return commit();
 }

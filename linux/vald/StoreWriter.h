@@ -119,9 +119,13 @@ class StoreWriter {
   void readSomeAttributes();
 
   // Transactions.
-  void begin();
-  void begin(bool isFull);
-  void setDurability(bool isFull);
+  enum class Durability {
+    Soon,  // within two seconds: what the disk tells as well, and a round finds again
+    Now,   // the commit waits for the disk: what the index alone knows
+  };
+  void begin(Durability durability = Durability::Soon);
+  // How much is written beside the index before it is taken over into it.
+  void checkpointAfter(int pages);
   void note(std::string failure) SKEIN_EXCLUDES(_mutex);
   bool commit();
   void fail();
@@ -163,8 +167,10 @@ class StoreWriter {
   Instant _lastTick;
   Instant _lastSlowRound;
   bool _isBroken = false;  // the index is damaged: nothing is written any more
-  bool _isFull = false;    // commits wait for the disk
-  bool _reload = false;    // a transaction failed: begin anew at the next tick
+  Durability _durability = Durability::Soon;
+  bool _isOnDisk = false;  // everything that was committed
+  std::int64_t _written = 0;
+  bool _reload = false;  // a transaction failed: begin anew at the next tick
 
   // Shared.
   mutable Mutex _mutex;

@@ -6,8 +6,11 @@
 #include <cerrno>
 #include <cstdio>
 #include <ctime>
+#include <fstream>
+#include <string_view>
 
 #include "linux/protocol/FileDescriptor.h"
+#include "linux/vald/RandomToken.h"
 #include "vellum/VLErrors.h"
 
 namespace skein::vald {
@@ -15,6 +18,7 @@ namespace {
 
 constexpr int kApplicationID = 0x534b4e49;  // "SKNI"
 constexpr int kVersion = 2;
+constexpr std::string_view kOpenMark = "open since";
 constexpr const char* kParts[] = {"", "-wal", "-shm"};
 
 constexpr char kTables[] = R"(
@@ -126,6 +130,20 @@ Verdict judge(SqliteDatabase& database) {
 
 std::string damageMark(const std::string& path) { return path + ".damaged"; }
 
+// Another after each start of the machine.
+std::string startOfMachine() {
+  std::string start;
+  std::getline(std::ifstream("/proc/sys/kernel/random/boot_id"), start);
+  // Where it cannot be read, no two openings are of the same.
+  return start.empty() ? randomToken() : start;
+}
+
+void runDurably(SqliteDatabase& database, SqliteStatement& statement) {
+  database.execute("PRAGMA synchronous = FULL");
+  statement.run();
+  database.execute("PRAGMA synchronous = NORMAL");
+}
+
 }  // namespace
 
 bool setIndexFileAside(const std::string& path, const std::string& suffix) {
@@ -206,6 +224,24 @@ std::unique_ptr<SqliteDatabase> openIndexFile(const std::string& path, Log& log,
   }
   error.store(vl_errorWithPOSIXCode(EIO, "The index " + path + " could not be made anew."));
   return nullptr;
+}
+
+bool markIndexOpen(SqliteDatabase& database) {
+  const std::string start = startOfMachine();
+  std::string found;
+  {
+    SqliteStatement mark(database, "SELECT value FROM setting WHERE name=?");
+    if (mark.start(kOpenMark).step()) found = mark.bytes(0);
+  }
+  if (found == start) return false;
+  SqliteStatement put(database, "INSERT OR REPLACE INTO setting(name, value) VALUES(?,?)");
+  runDurably(database, put.start(kOpenMark, start));
+  return !found.empty();
+}
+
+void markIndexClosed(SqliteDatabase& database) {
+  SqliteStatement drop(database, "DELETE FROM setting WHERE name=?");
+  runDurably(database, drop.start(kOpenMark));
 }
 
 bool hasSecondaryIndexes(SqliteDatabase& database) {

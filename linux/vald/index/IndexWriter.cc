@@ -57,8 +57,12 @@ IndexWriter::IndexWriter(SqliteDatabase& database)
                    "ORDER BY rank DESC LIMIT 1"),
       _dropTombstone(database, "DELETE FROM tombstone WHERE rank=?"),
       _putFolder(database,
-                 "INSERT OR REPLACE INTO folder(key, id, parent, name, scanned, children, changes, "
-                 "inode, generation, born) VALUES(?,?,?,?,?,?,?,?,?,?)"),
+                 // A folder's identifier stays, and with it what stands in the index of them.
+                 "INSERT INTO folder(key, id, parent, name, scanned, children, changes, inode, "
+                 "generation, born) VALUES(?,?,?,?,?,?,?,?,?,?) ON CONFLICT(key) DO UPDATE SET "
+                 "parent=excluded.parent, name=excluded.name, scanned=excluded.scanned, "
+                 "children=excluded.children, changes=excluded.changes, inode=excluded.inode, "
+                 "generation=excluded.generation, born=excluded.born"),
       _eraseFolder(database, "DELETE FROM folder WHERE key=?"),
       _setFlags(database, "UPDATE item SET flags=? WHERE rank=?"),
       _details(database,
@@ -71,10 +75,11 @@ IndexWriter::IndexWriter(SqliteDatabase& database)
 
 void IndexWriter::load() {
   _counts = {};
-  std::istringstream(setting(kCounts).value_or("")) >> _counts.documents >> _counts.folders >>
-      _counts.aliases;
+  _stored.counts = setting(kCounts).value_or("");
+  std::istringstream(_stored.counts) >> _counts.documents >> _counts.folders >> _counts.aliases;
   _oldestRank = 0;
   std::istringstream(setting(kOldestRank).value_or("")) >> _oldestRank;
+  _stored.oldestRank = _oldestRank;
   const auto rankOf = [&](const char* sql) {
     return static_cast<std::uint64_t>(_database.integer(sql));
   };
@@ -86,8 +91,15 @@ void IndexWriter::load() {
 void IndexWriter::store() {
   std::ostringstream counts;
   counts << _counts.documents << ' ' << _counts.folders << ' ' << _counts.aliases;
-  setSetting(kCounts, counts.str());
-  setSetting(kOldestRank, std::to_string(_oldestRank));
+  // Most changes leave both as they are.
+  if (_stored.counts != counts.str()) {
+    _stored.counts = counts.str();
+    setSetting(kCounts, _stored.counts);
+  }
+  if (_stored.oldestRank != _oldestRank) {
+    _stored.oldestRank = _oldestRank;
+    setSetting(kOldestRank, std::to_string(_oldestRank));
+  }
 }
 
 void IndexWriter::insert(ItemRow& row) {

@@ -103,6 +103,11 @@ class IndexWriter {
   SqliteDatabase& _database;
   std::uint64_t _rank = 0;
   std::uint64_t _oldestRank = 0;
+  // What the settings say.
+  struct {
+    std::string counts;
+    std::uint64_t oldestRank = 0;
+  } _stored;
   std::uint64_t _tombstones = 0;
   ItemCounts _counts;
 
