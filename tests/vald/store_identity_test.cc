@@ -140,6 +140,18 @@ TEST_F(StoreIdentity, ACopyAndASecondLinkAreNewDocuments) {
   EXPECT_EQ(listed().size(), 3U);
   reopen();
   EXPECT_EQ(id("doc.txt"), doc);
+  // The second link goes again: the first one stays who it is, young as it may be.
+  write("young.txt");
+  settle();
+  const std::string young = id("young.txt");
+  link("young.txt", "second.txt");
+  settle();
+  remove("second.txt");
+  settle();
+  EXPECT_EQ(id("young.txt"), young);
+  rename("young.txt", "second.txt");
+  settle();
+  EXPECT_EQ(id("second.txt"), young);
 }
 
 TEST_F(StoreIdentity, AFolderThatMovedWhileClosedKeepsEverythingInIt) {

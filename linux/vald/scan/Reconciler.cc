@@ -235,6 +235,8 @@ void Reconciler::vanished(const ItemRow& seen) {
           !other.state.key.names(row->state.key)) {
         continue;
       }
+      // The younger of the two links goes: the other is who it was.
+      if (row->seen > other.seen) continue;
       if (whereabouts(other, there) != Whereabouts::StillThere) continue;
       _journal.bury(other, _now);
       recordDeparture(*row, {other.parent, other.name});
@@ -373,6 +375,8 @@ bool Reconciler::handBack(const Place& place, const FileState& state,
   }
   const auto tombstone = _index.tombstoneAt(place.folder, place.name, _now - _grace);
   if (!tombstone || _index.rowWithID(tombstone->id)) return false;
+  // What died there was another link to the mover's own file: nothing was saved.
+  if (mover && tombstone->key.names(state.key)) return false;
   // The very file of another document that died comes back as that one.
   for (const Tombstone& other : _index.tombstonesWithInode(state.key.inode)) {
     if (other.id != tombstone->id && other.kind == state.kind && other.key.names(state.key)) {

@@ -17,7 +17,7 @@
 //     name within it takes the number up. The deletion is journalled at once all the same.
 //     So does a document that left its name for a backup's within the window.
 //  6. Two hard links are two documents. When the first goes while the second is young, the
-//     number goes with it: that was a rename.
+//     number goes with it: that was a rename. When the second goes, the first stays.
 //  7. A file that comes back (its tombstone is still kept) takes its number up again.
 //  8. A marker is its document, not present: evicting and downloading are rule 2. A marker,
 //     or a file with a hint, that nothing is known of is the document that it names, unless
