@@ -1,5 +1,6 @@
 #pragma once
 
+#include <algorithm>
 #include <functional>
 
 #include "base/Mutex.h"
@@ -7,21 +8,24 @@
 
 namespace skein::vald {
 
-// Hands what the store tells to the update senders, and then says that something changed.
-// Made before the store and outlives it.
+// Hands what the store tells to the update senders, and then says that folders changed. Made
+// before the store and outlives it.
 class DriveListener final : public StoreListener {
  public:
   explicit DriveListener(StoreListener& senders) : _senders(senders) {}
 
-  // `afterChange` runs on the store's writer thread and returns at once.
-  void setAfterChange(std::function<void()> afterChange) SKEIN_EXCLUDES(_mutex) {
+  // `afterFolderChange` runs on the store's writer thread and returns at once.
+  void setAfterFolderChange(std::function<void()> afterFolderChange) SKEIN_EXCLUDES(_mutex) {
     MutexLock lock(_mutex);
-    _afterChange = std::move(afterChange);
+    _afterFolderChange = std::move(afterFolderChange);
   }
 
   void storeDidChange(const std::vector<StoreChange>& changes) override SKEIN_EXCLUDES(_mutex) {
     _senders.storeDidChange(changes);
-    tell();
+    const bool isOfFolder = std::any_of(changes.begin(), changes.end(), [](const auto& change) {
+      return change.item->fileObjectID().isFolderOrAliasID();
+    });
+    if (isOfFolder) tell();
   }
   void storeDidOverflow(std::optional<VLFileObjectID> folder) override SKEIN_EXCLUDES(_mutex) {
     _senders.storeDidOverflow(folder);
@@ -30,17 +34,17 @@ class DriveListener final : public StoreListener {
 
  private:
   void tell() SKEIN_EXCLUDES(_mutex) {
-    std::function<void()> afterChange;
+    std::function<void()> afterFolderChange;
     {
       MutexLock lock(_mutex);
-      afterChange = _afterChange;
+      afterFolderChange = _afterFolderChange;
     }
-    if (afterChange) afterChange();
+    if (afterFolderChange) afterFolderChange();
   }
 
   StoreListener& _senders;
   Mutex _mutex;
-  std::function<void()> _afterChange SKEIN_GUARDED_BY(_mutex);
+  std::function<void()> _afterFolderChange SKEIN_GUARDED_BY(_mutex);
 };
 
 }  // namespace skein::vald

@@ -139,7 +139,7 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
       executor, slowExecutor, store, senders, accounts, containers, subscribers, drive->files(),
       recordFetches, *shares, drive->cloud(), *faults, log, paths.store, stop,
       [&drive](const std::vector<StoreRoot>& roots) { drive->containersWillChange(roots); }});
-  listener.setAfterChange([weak = std::weak_ptr<Daemon>(daemon)] {
+  listener.setAfterFolderChange([weak = std::weak_ptr<Daemon>(daemon)] {
     if (const auto changed = weak.lock()) changed->refreshDriveFolders();
   });
 
