@@ -16,6 +16,7 @@ constexpr std::size_t kAtOnce = 64;
 constexpr std::size_t kMostPending = 128;
 constexpr std::size_t kMostRemembered = 10'000;
 constexpr auto kPause = 500ms;
+constexpr auto kGatherWindow = 20ms;
 // What died may come back under its number: in a save, or in the trash.
 constexpr auto kMourning = 10s;
 
@@ -126,6 +127,15 @@ void UploadFeed::run() {
     tellStore();
     forgetDead();
     tellUploader();
+    // What comes in quick succession is told together.
+    pause(kGatherWindow);
+  }
+}
+
+void UploadFeed::pause(std::chrono::milliseconds time) {
+  MutexLock lock(_mutex);
+  const auto until = std::chrono::steady_clock::now() + time;
+  while (!_stop && _changed.waitUntil(_mutex, until)) {
   }
 }
 
@@ -183,11 +193,8 @@ void UploadFeed::tellUploader() {
   LocalDaemonStatus status;
   _parts.store.status(status);
   if (status.scan != LocalDaemonStatus::Scan::Idle) {
-    MutexLock lock(_mutex);
-    const auto until = std::chrono::steady_clock::now() + kPause;
-    while (!_stop && _changed.waitUntil(_mutex, until)) {
-    }
-    _poked = true;
+    pause(kPause);
+    poke();
     return;
   }
   for (;;) {

@@ -54,6 +54,7 @@ class UploadFeed final : public UploadListener {
 
   void run();
   void poke() SKEIN_EXCLUDES(_mutex);
+  void pause(std::chrono::milliseconds time) SKEIN_EXCLUDES(_mutex);
   void tellStore() SKEIN_EXCLUDES(_mutex);
   void forgetDead() SKEIN_EXCLUDES(_mutex);
   // Whether there is more to tell when some of it is done.
