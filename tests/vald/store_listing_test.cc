@@ -1,9 +1,11 @@
 // What is listed, how, and under which names; containers; the index itself.
 #include <fcntl.h>
 #include <sys/stat.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
+#include <csignal>
 #include <filesystem>
 #include <fstream>
 
@@ -199,6 +201,64 @@ TEST_F(StoreListing, AnIndexGoesWithItsFolder) {
   open();
   EXPECT_EQ(store->journalID(), journal);
   EXPECT_EQ(id("doc"), doc);
+}
+
+TEST_F(StoreListing, APowerCutEndsTheJournalAndAKillDoesNot) {
+  write("doc");
+  open();
+  const std::string doc = id("doc");
+  const std::string journal = store->journalID();
+  reopen();
+  EXPECT_EQ(store->journalID(), journal);
+  close();
+  const pid_t child = fork();
+  if (child == 0) {
+    open();
+    raise(SIGKILL);
+  }
+  int status = 0;
+  ASSERT_EQ(waitpid(child, &status, 0), child);
+  ASSERT_TRUE(WIFSIGNALED(status));
+  open();
+  EXPECT_EQ(store->journalID(), journal);
+  close();
+  // As if the machine had gone down and was started again.
+  int code = 0;
+  std::string message;
+  const auto index = SqliteDatabase::open(options.databasePath, true, code, message);
+  ASSERT_NE(index, nullptr) << message;
+  ASSERT_TRUE(
+      index->execute("INSERT INTO setting(name, value) "
+                     "VALUES(CAST('open since' AS BLOB), CAST('an earlier start' AS BLOB))"))
+      << index->message();
+  open();
+  const std::string next = store->journalID();
+  EXPECT_NE(next, journal);
+  EXPECT_TRUE(log.holds("went down"));
+  EXPECT_EQ(id("doc"), doc);
+  reopen();
+  EXPECT_EQ(store->journalID(), next);
+}
+
+TEST_F(StoreListing, PathsOfManyAtOnce) {
+  makeFolder("folder");
+  makeFolder("folder/below");
+  write("folder/below/doc");
+  write("folder/other");
+  open();
+  const auto of = [&](const std::string& path) { return item(path)->fileObjectID(); };
+  const std::vector<VLFileObjectID> ids = {
+      of("folder/below/doc"), VLFileObjectID::documentWithRawID(1), of("folder/below"),
+      of("folder/other"), VLFileObjectID::folderOrAliasWithRawID(1)};
+  NSErrorPtr error;
+  const auto paths = store->pathsForIDs(ids, &error);
+  EXPECT_EQ(error, nullptr);
+  EXPECT_EQ(paths, (std::vector<std::optional<std::string>>{at("folder/below/doc"), std::nullopt,
+                                                            at("folder/below"), at("folder/other"),
+                                                            std::nullopt}));
+  EXPECT_EQ(store->pathForID(ids[1], &error), std::nullopt);
+  ASSERT_NE(error, nullptr);
+  EXPECT_EQ(error->code(), NSFileNoSuchFileError);
 }
 
 TEST_F(StoreListing, SettingsSurviveARestart) {

@@ -69,7 +69,9 @@ IndexWriter::IndexWriter(SqliteDatabase& database)
                "SELECT " SKEIN_DETAIL_COLUMNS " FROM detail WHERE id=? AND is_document=?"),
       _putDetails(database,
                   "INSERT OR REPLACE INTO detail(id, is_document, tags, on_file, created, used, "
-                  "favorite) VALUES(?,?,?,?,?,?,?)") {
+                  "favorite) VALUES(?,?,?,?,?,?,?)"),
+      _dropTag(database, "DELETE FROM tag WHERE name=? AND id=? AND is_document=?"),
+      _putTag(database, "INSERT INTO tag(name, id, is_document) VALUES(?,?,?)") {
   load();
 }
 
@@ -138,9 +140,8 @@ ItemDetails IndexWriter::details(VLFileObjectID id) {
 
 void IndexWriter::putDetails(VLFileObjectID id, const ItemDetails& details) {
   const std::uint64_t rawID = id.rawID();
-  SqliteStatement forget(_database, "DELETE FROM tag WHERE name=? AND id=? AND is_document=?");
   for (const std::string& name : splitTags(this->details(id).tags)) {
-    forget.start(name, rawID, isDocument(id)).run();
+    _dropTag.start(name, rawID, isDocument(id)).run();
   }
   if (details.isEmpty()) {
     SqliteStatement erase(_database, "DELETE FROM detail WHERE id=? AND is_document=?");
@@ -151,9 +152,8 @@ void IndexWriter::putDetails(VLFileObjectID id, const ItemDetails& details) {
       .start(rawID, isDocument(id), details.tags, details.tagsAreOnFile ? 1 : 0, details.created,
              details.used, details.favorite)
       .run();
-  SqliteStatement tag(_database, "INSERT INTO tag(name, id, is_document) VALUES(?,?,?)");
   for (const std::string& name : splitTags(details.tags)) {
-    tag.start(name, rawID, isDocument(id)).run();
+    _putTag.start(name, rawID, isDocument(id)).run();
   }
 }
 

@@ -113,7 +113,7 @@ class IndexWriter {
 
   SqliteStatement _insert, _update, _erase, _children, _subfolders, _named, _withInode, _withID;
   SqliteStatement _bury, _tombstonesWithInode, _tombstoneAt, _dropTombstone;
-  SqliteStatement _putFolder, _eraseFolder, _setFlags, _details, _putDetails;
+  SqliteStatement _putFolder, _eraseFolder, _setFlags, _details, _putDetails, _dropTag, _putTag;
 };
 
 }  // namespace skein::vald
