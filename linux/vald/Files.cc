@@ -124,15 +124,33 @@ FileResult Files::moveEvicted(const Subject& subject, const std::string& folder,
   return result;
 }
 
+void Files::answerMove(URLReply& reply, const Subject& subject, RequestOrigin origin,
+                       const std::function<FileResult(const FileRequest&)>& move) {
+  std::vector<std::string> places{subject.place.path};
+  std::function<void()> waitForStore;
+  FileRequest asked = request(subject, std::move(origin));
+  asked.moved = [&](const std::string& path) {
+    places.push_back(documentPath(&_parts.operations.roots(), path));
+    waitForStore = _parts.store.beginLookAtPaths(places);
+  };
+  const FileResult result = move(asked);
+  if (waitForStore) {
+    waitForStore();
+    if (!result.error) return reply(urlOf(places.back()), nullptr);
+    // It was taken back.
+    _parts.store.lookAtPaths(places);
+  }
+  answerResult(reply, result, std::move(places));
+}
+
 void Files::rename(NSURLPtr url, std::string newName, RequestOrigin origin, URLReply reply) {
   answer("url", url, std::move(reply), [=, this](URLReply& answered) {
     const Subject subject = subjectAt(url->path());
-    const FileRequest asked = request(subject, origin);
-    answerResult(answered,
-                 subject.place.isEvicted()
-                     ? renameEvicted(subject, newName, asked)
-                     : _parts.operations.rename(subject.place.path, newName, asked),
-                 {subject.place.path});
+    answerMove(answered, subject, origin, [&](const FileRequest& asked) {
+      return subject.place.isEvicted()
+                 ? renameEvicted(subject, newName, asked)
+                 : _parts.operations.rename(subject.place.path, newName, asked);
+    });
   });
 }
 
@@ -140,13 +158,12 @@ void Files::move(NSURLPtr url, NSURLPtr folder, std::optional<std::string> newNa
                  RequestOrigin origin, URLReply reply) {
   answer("url", folder ? url : nullptr, std::move(reply), [=, this](URLReply& answered) {
     const Subject subject = subjectAt(url->path());
-    const FileRequest asked = request(subject, origin);
-    answerResult(
-        answered,
-        subject.place.isEvicted()
-            ? moveEvicted(subject, folder->path(), newName, bounce, asked)
-            : _parts.operations.move(subject.place.path, folder->path(), newName, bounce, asked),
-        {subject.place.path});
+    answerMove(answered, subject, origin, [&](const FileRequest& asked) {
+      return subject.place.isEvicted()
+                 ? moveEvicted(subject, folder->path(), newName, bounce, asked)
+                 : _parts.operations.move(subject.place.path, folder->path(), newName, bounce,
+                                          asked);
+    });
   });
 }
 

@@ -104,6 +104,10 @@ class Files final : public LocalFiles {
   // Lets the store look, and answers with the path that people know.
   void answerResult(URLReply& reply, const FileResult& result, std::vector<std::string> touched);
 
+  // Lets the store look while the disk is still written to, and answers after both.
+  void answerMove(URLReply& reply, const Subject& subject, RequestOrigin origin,
+                  const std::function<FileResult(const FileRequest&)>& move);
+
   FileResult renameEvicted(const Subject& subject, const std::string& newName,
                            const FileRequest& request);
   FileResult moveEvicted(const Subject& subject, const std::string& folder,
@@ -114,8 +118,10 @@ class Files final : public LocalFiles {
 
   // Notes on the file of an item that is there which document it is. Whether that changed it.
   bool writeHint(const Subject& subject);
-  // Changes what the index alone keeps, and writes the hint.
-  NSErrorPtr changeDetails(const std::string& path, std::function<void(ItemDetails&)> change);
+  // Changes what the index keeps; and does that for a reply, and writes the hint.
+  NSErrorPtr changeDetails(const Subject& subject, std::function<void(ItemDetails&)> change);
+  void answerDetails(const NSURLPtr& url, std::function<void(ItemDetails&)> change,
+                     Reply<NSErrorPtr> reply);
   void startDownload(const std::string& path, const std::shared_ptr<NSProgress>& progress,
                      Reply<NSErrorPtr> reply);
   std::optional<NSDate> dateOfTrashing(const std::string& path) const;

@@ -29,27 +29,38 @@ bool Files::writeHint(const Subject& subject) {
   return !id.isFolderOrAliasID() && _parts.operations.writeHint(subject.place.physical, id.rawID());
 }
 
-NSErrorPtr Files::changeDetails(const std::string& path, std::function<void(ItemDetails&)> change) {
-  const Subject subject = subjectAt(path);
-  if (!subject.item) return fileError(ENOENT, "can't find", path);
-  const VLFileObjectID id = subject.item->fileObjectID();
-  if (NSErrorPtr error = _parts.store.changeDetails(id, std::move(change))) return error;
-  if (writeHint(subject)) _parts.store.lookAtPaths({subject.place.path});
-  return nullptr;
+NSErrorPtr Files::changeDetails(const Subject& subject, std::function<void(ItemDetails&)> change) {
+  if (!subject.item) return fileError(ENOENT, "can't find", subject.place.path);
+  return _parts.store.changeDetails(subject.item->fileObjectID(), std::move(change));
+}
+
+void Files::answerDetails(const NSURLPtr& url, std::function<void(ItemDetails&)> change,
+                          Reply<NSErrorPtr> reply) {
+  answer("url", url, std::move(reply), [=, this](Reply<NSErrorPtr>& answered) {
+    const Subject subject = subjectAt(url->path());
+    NSErrorPtr error = changeDetails(subject, change);
+    if (!error && writeHint(subject)) _parts.store.lookAtPaths({subject.place.path});
+    answered(std::move(error));
+  });
 }
 
 void Files::setTagNames(NSURLPtr url, std::vector<std::string> names, Reply<NSErrorPtr> reply) {
   answer("url", url, std::move(reply), [=, this](Reply<NSErrorPtr>& answered) {
-    const Subject subject = subjectAt(url->path());
+    Subject subject = subjectAt(url->path());
     // Before the tags, so that one look at the file sees both.
     if (subject.item) writeHint(subject);
-    const TagResult result = _parts.operations.setTags(subject.place.physical, names);
+    // The store looks while the disk is still written to.
+    std::function<void()> waitForStore;
+    const TagResult result = _parts.operations.setTags(subject.place.physical, names, [&] {
+      waitForStore = _parts.store.beginLookAtPaths({subject.place.path});
+    });
+    if (waitForStore) waitForStore();
     if (result.storage == TagStorage::Failed) return answered(result.error);
-    if (result.storage == TagStorage::Kept) _parts.store.lookAtPaths({subject.place.path});
+    if (!subject.item) subject = subjectAt(subject.place.path);
     // Also where the file has them: an index that was told is not behind.
     const bool isOnFile = result.storage == TagStorage::Kept;
     const std::string tags = joinTags(names);
-    answered(changeDetails(subject.place.path, [tags, isOnFile](ItemDetails& details) {
+    answered(changeDetails(subject, [tags, isOnFile](ItemDetails& details) {
       details.tags = tags;
       details.tagsAreOnFile = isOnFile && !tags.empty();
     }));
@@ -57,17 +68,15 @@ void Files::setTagNames(NSURLPtr url, std::vector<std::string> names, Reply<NSEr
 }
 
 void Files::setLastOpenDate(NSURLPtr url, std::optional<NSDate> date, Reply<NSErrorPtr> reply) {
-  answer("url", url, std::move(reply), [=, this](Reply<NSErrorPtr>& answered) {
-    answered(changeDetails(
-        url->path(), [used = nanoseconds(date)](ItemDetails& details) { details.used = used; }));
-  });
+  answerDetails(
+      url, [used = nanoseconds(date)](ItemDetails& details) { details.used = used; },
+      std::move(reply));
 }
 
 void Files::setFavoriteRank(NSURLPtr url, std::optional<std::int64_t> rank,
                             Reply<NSErrorPtr> reply) {
-  answer("url", url, std::move(reply), [=, this](Reply<NSErrorPtr>& answered) {
-    answered(changeDetails(url->path(), [rank](ItemDetails& details) { details.favorite = rank; }));
-  });
+  answerDetails(
+      url, [rank](ItemDetails& details) { details.favorite = rank; }, std::move(reply));
 }
 
 void Files::tagsInUse(Reply<std::vector<TagUse>, NSErrorPtr> reply) {

@@ -49,7 +49,9 @@ class FolderStore final : public Store {
 
   // Looks at these absolute paths as at one change, so that an answer that follows tells of
   // them as they are now. Folders that were not read yet are left to their scan.
-  void lookAtPaths(const std::vector<std::string>& paths);
+  void lookAtPaths(const std::vector<std::string>& paths) { beginLookAtPaths(paths)(); }
+  // The same; what is answered waits for it, and is called before the store goes.
+  std::function<void()> beginLookAtPaths(const std::vector<std::string>& paths);
   // Changes what the index alone keeps of an item; durable when it returns.
   NSErrorPtr changeDetails(VLFileObjectID id, std::function<void(ItemDetails&)> change);
   ItemDetails details(VLFileObjectID id);

@@ -22,19 +22,30 @@ std::optional<StoreWriter::Place> FolderStore::placeOf(IndexReader& reader,
   return std::nullopt;
 }
 
-void FolderStore::lookAtPaths(const std::vector<std::string>& paths) {
+std::function<void()> FolderStore::beginLookAtPaths(const std::vector<std::string>& paths) {
   std::vector<StoreWriter::Place> places;
   {
     auto reader = _readers.lease();
-    if (!reader) return;
+    if (!reader) return [] {};
     for (const std::string& path : paths) {
       if (auto place = placeOf(*reader.get(), path)) places.push_back(std::move(*place));
     }
   }
-  _writer->perform([this, places = std::move(places)] { _writer->lookAtNames(places); });
+  auto posted = _writer->post([this, places = std::move(places)] { _writer->lookAtNames(places); });
+  return [this, posted = std::move(posted)] { _writer->wait(posted); };
 }
 
 NSErrorPtr FolderStore::changeDetails(VLFileObjectID id, std::function<void(ItemDetails&)> change) {
+  {
+    // What it has already is not written.
+    auto reader = _readers.lease();
+    const auto found = reader ? reader->itemWithID(id) : std::nullopt;
+    if (found) {
+      ItemDetails details = found->details;
+      change(details);
+      if (details == found->details) return nullptr;
+    }
+  }
   auto isChanged = std::make_shared<bool>(false);
   const bool isDone = _writer->perform([this, id, change = std::move(change), isChanged] {
     *isChanged = _writer->changeDetails(id, change);

@@ -73,21 +73,27 @@ void StoreWriter::wake() {
   _changed.notifyAll();
 }
 
-bool StoreWriter::perform(Task work, std::chrono::milliseconds deadline) {
-  const auto until = std::chrono::steady_clock::now() + deadline;
+std::shared_ptr<StoreWriter::Waiter> StoreWriter::post(Task work) {
   auto waiter = std::make_shared<Waiter>();
   MutexLock lock(_mutex);
-  if (_stop) return false;
+  if (_stop) return nullptr;
   _tasks.emplace_back([this, waiter, work = std::move(work)]() mutable {
     work();
     MutexLock done(_mutex);
     waiter->isDone = true;
   });
   _changed.notifyAll();
-  while (!waiter->isDone && !_ended) {
+  return waiter;
+}
+
+bool StoreWriter::wait(const std::shared_ptr<Waiter>& posted, std::chrono::milliseconds deadline) {
+  if (!posted) return false;
+  const auto until = std::chrono::steady_clock::now() + deadline;
+  MutexLock lock(_mutex);
+  while (!posted->isDone && !_ended) {
     if (!_changed.waitUntil(_mutex, until)) break;
   }
-  return waiter->isDone;
+  return posted->isDone;
 }
 
 bool StoreWriter::settle(std::chrono::milliseconds deadline) {

@@ -42,10 +42,17 @@ class StoreWriter {
               StoreListener& listener, Log& log);
   ~StoreWriter();
 
-  // Runs `work` on the writer thread, outside a transaction, and waits for it. False when
-  // the writer is ending, or `deadline` passed; then `work` may still run.
-  bool perform(Task work, std::chrono::milliseconds deadline = std::chrono::seconds(60))
-      SKEIN_EXCLUDES(_mutex);
+  struct Waiter;
+  // Has `work` run on the writer thread, outside a transaction. Null when the writer is ending.
+  std::shared_ptr<Waiter> post(Task work) SKEIN_EXCLUDES(_mutex);
+  // Waits for what was posted. False when the writer is ending, or `deadline` passed; then it
+  // may still run.
+  bool wait(const std::shared_ptr<Waiter>& posted,
+            std::chrono::milliseconds deadline = std::chrono::seconds(60)) SKEIN_EXCLUDES(_mutex);
+  // Both.
+  bool perform(Task work, std::chrono::milliseconds deadline = std::chrono::seconds(60)) {
+    return wait(post(std::move(work)), deadline);
+  }
   bool settle(std::chrono::milliseconds deadline) SKEIN_EXCLUDES(_mutex);
 
   // Inside perform().
@@ -78,7 +85,6 @@ class StoreWriter {
   bool isReadingAttributes() const { return _isReadingAttributes.load(); }
 
  private:
-  struct Waiter;
   using Instant = std::chrono::steady_clock::time_point;
 
   // Waiting and the turn of work.

@@ -1,6 +1,7 @@
 // What is done to documents, through a whole drive: nothing that a person gave a document is
 // lost on any way, and every answer is what the store says from then on.
 #include <fcntl.h>
+#include <sys/stat.h>
 #include <sys/wait.h>
 #include <sys/xattr.h>
 #include <unistd.h>
@@ -8,6 +9,7 @@
 #include <filesystem>
 #include <fstream>
 #include <functional>
+#include <tuple>
 
 #include "tests/vald/DriveFixture.h"
 
@@ -96,6 +98,16 @@ TEST_F(DriveTest, TagsFollowTheFileWhoeverSetsThem) {
   ASSERT_EQ(setxattr(at("folder/doc.txt").c_str(), kTagsAttribute, "Away", 4, 0), 0);
   open();
   EXPECT_EQ(tags("folder/doc.txt"), std::vector<std::string>{"Away"});
+  // What it has already is not written.
+  ASSERT_EQ(tagged("folder/doc.txt", {"Here"}), "");
+  struct stat first {};
+  ASSERT_EQ(stat(at("folder/doc.txt").c_str(), &first), 0);
+  EXPECT_EQ(tagged("folder/doc.txt", {"Here"}), "");
+  struct stat second {};
+  ASSERT_EQ(stat(at("folder/doc.txt").c_str(), &second), 0);
+  EXPECT_EQ(std::tie(first.st_ctim.tv_sec, first.st_ctim.tv_nsec),
+            std::tie(second.st_ctim.tv_sec, second.st_ctim.tv_nsec));
+  EXPECT_EQ(tags("folder/doc.txt"), std::vector<std::string>{"Here"});
   // A link has no attributes: the index keeps its tags.
   EXPECT_EQ(path([&](LocalFiles& files, auto reply) {
               files.makeAlias(url(""), "alias", at("folder"), "test", std::move(reply));
@@ -266,6 +278,43 @@ TEST_F(DriveTest, AKillAtAnyStepLeavesAnEvictedDocumentWholeAtOneOfItsPlaces) {
   }
   EXPECT_EQ(downloaded("doc.txt"), "");
   EXPECT_EQ(read("doc.txt"), "contents");
+}
+
+TEST_F(DriveTest, WhatTheDiskRefusesIsTakenBackWhereverItFails) {
+  options.cloud.policy.uploads = LocalCloudStatus::Uploads::Off;
+  std::filesystem::create_directory(at("folder"));
+  open();
+  const std::string before = makePrecious("doc.txt");
+  const auto change = [&](int kind) {
+    if (kind == 0) return renamed("doc.txt", "new.txt");
+    if (kind == 1) return moved("doc.txt", "folder");
+    return tagged("doc.txt", {"other"});
+  };
+  const std::string places[] = {"new.txt", "folder/doc.txt", "doc.txt"};
+  for (int kind = 0; kind < 3; ++kind) {
+    for (std::uint64_t step = 1;; ++step) {
+      ASSERT_LT(step, 100U);
+      SCOPED_TRACE(places[kind] + ", step " + std::to_string(step));
+      layer.failAt(step, EIO);
+      const std::string answer = change(kind);
+      const bool isMet = layer.met();
+      layer.failAt(0, 0);
+      // The store knows when the answer comes, either way.
+      const bool isRefused = answer.starts_with('!');
+      const std::string place = isRefused ? "doc.txt" : places[kind];
+      ASSERT_NE(item(place), nullptr);
+      if (kind < 2) EXPECT_EQ(item(isRefused ? places[kind] : "doc.txt"), nullptr);
+      if (kind < 2) EXPECT_EQ(portrait(place), before);
+      settle();
+      EXPECT_TRUE(differences().empty());
+      if (!isMet) break;
+      if (kind == 0 && !isRefused) ASSERT_EQ(renamed("new.txt", "doc.txt"), "doc.txt");
+      if (kind == 1 && !isRefused) ASSERT_EQ(moved("folder/doc.txt", ""), "doc.txt");
+    }
+    if (kind == 0) ASSERT_EQ(renamed("new.txt", "doc.txt"), "doc.txt");
+    if (kind == 1) ASSERT_EQ(moved("folder/doc.txt", ""), "doc.txt");
+  }
+  EXPECT_EQ(tags("doc.txt"), std::vector<std::string>{"other"});
 }
 
 TEST_F(DriveTest, WhatIsTrashedKeepsItsIdentifierWhoeverTrashesIt) {

@@ -138,7 +138,8 @@ TEST(Import, KeepsATreeAsItIsWithProgressAndCancelsWithoutATrace) {
   ASSERT_EQ(::utimensat(AT_FDCWD, (tree + "/empty").c_str(), times, 0), 0);
   DirectoryHandle outside;
   ASSERT_EQ(DirectoryHandle::openRoot(tree, outside), 0);
-  ASSERT_EQ(writeTags(drive.files, outside, "empty", "empty", {"red"}).storage, TagStorage::Kept);
+  ASSERT_EQ(writeTags(drive.files, outside, "empty", "empty", {"red"}, nullptr).storage,
+            TagStorage::Kept);
 
   FileRequest request = kRequest;
   std::uint64_t calls = 0;

@@ -167,6 +167,7 @@ NSErrorPtr FileOperations::moveOnce(const StorePlace& from, const StorePlace& to
     scope.discard();
     return fileError(EEXIST, doing, to.path());
   }
+  if (failure == 0 && request.moved) request.moved(to.path());
   if (failure == 0 && (failure = syncFolders(to.folder, &from.folder)) != 0) {
     if (_files.renameWithoutReplacing(to.folder.get(), to.name, from.folder.get(), from.name)) {
       scope.leaveOpen();

@@ -196,13 +196,14 @@ TagResult FileOperations::tags(const std::string& path) const {
   return readTags(place.folder, place.isRoot() ? "." : place.name, path);
 }
 
-TagResult FileOperations::setTags(const std::string& path, const std::vector<std::string>& names) {
+TagResult FileOperations::setTags(const std::string& path, const std::vector<std::string>& names,
+                                  const std::function<void()>& written) {
   FileCoordinator::Claim held;
   StorePlace place;
   NSErrorPtr error = claim({path}, deadline(), held);
   if (!error) error = _roots.locate(path, place);
   if (error) return {TagStorage::Failed, {}, error};
-  return writeTags(_files, place.folder, place.isRoot() ? "." : place.name, path, names);
+  return writeTags(_files, place.folder, place.isRoot() ? "." : place.name, path, names, written);
 }
 
 }  // namespace skein::vald

@@ -37,6 +37,9 @@ struct FileRequest {
   std::string origin;            // in words, such as "skein trash (process 4711)"
   std::string document;          // the item's persistent identifier, where it is known
   FileProgressHandler progress;  // importing alone
+  // Renaming and moving alone: called when the item is at `path`, while the disk is yet to be
+  // written; when that fails, it is taken back after this call.
+  std::function<void(const std::string& path)> moved = {};
 };
 
 // Where the item is now, or why it is where it was.
@@ -117,7 +120,10 @@ class FileOperations {
   bool writeHint(const std::string& path, std::uint64_t document);
 
   TagResult tags(const std::string& path) const;
-  TagResult setTags(const std::string& path, const std::vector<std::string>& names);
+  // `written` is called when the file has them, while the disk is yet to be written; that may
+  // fail after this call.
+  TagResult setTags(const std::string& path, const std::vector<std::string>& names,
+                    const std::function<void()>& written = nullptr);
 
  private:
   // What an operation holds while it runs.

@@ -109,7 +109,8 @@ TagResult readTags(const DirectoryHandle& folder, const std::string& name,
 }
 
 TagResult writeTags(FileLayer& files, const DirectoryHandle& folder, const std::string& name,
-                    const std::string& path, const std::vector<std::string>& names) {
+                    const std::string& path, const std::vector<std::string>& names,
+                    const std::function<void()>& written) {
   if (NSErrorPtr refusal = refusalOfTags(names)) return {TagStorage::Failed, {}, refusal};
   const char* const doing = "can't set the tags of";
   FileDescriptor entry;
@@ -123,6 +124,7 @@ TagResult writeTags(FileLayer& files, const DirectoryHandle& folder, const std::
                               : files.setAttribute(own, kTagsAttribute, value);
   if (failure == ENODATA) failure = 0;
   if (failure != 0) return failed(failure, doing, path);
+  if (written) written();
   // What may be written but not read cannot be opened to be synced; the system writes
   // it out in its own time.
   FileDescriptor file;
