@@ -222,34 +222,23 @@ TEST_F(DriveTest, AnEvictedDocumentIsTheSameOneOnAllItsWays) {
 TEST_F(DriveTest, AKillAtAnyStepLeavesAnEvictedDocumentWholeAtOneOfItsPlaces) {
   std::filesystem::create_directory(at("folder"));
   open();
-  const std::string before = makePrecious("doc.txt");
+  std::string before = makePrecious("doc.txt");
   ASSERT_TRUE(uploaded("doc.txt"));
   ASSERT_EQ(evicted("doc.txt"), "");
   const std::string inTrash = ".Trash-" + std::to_string(geteuid()) + "/files/doc.txt";
+
+  // Makes the request `go` on `from` with a kill at each of its steps. By then the document
+  // is as it was, or at `to` (nowhere when that is empty), with the portrait `after`. Then
+  // `back` undoes it.
   struct Way {
-    std::string from, to;
-    std::function<std::string()> go, back;
+    std::string from, to, after;
+    std::function<void()> go, back;
   };
-  const std::vector<Way> ways = {
-      {"doc.txt", "new.txt", [&] { return renamed("doc.txt", "new.txt"); },
-       [&] { return renamed("new.txt", "doc.txt"); }},
-      {"doc.txt", "folder/doc.txt", [&] { return moved("doc.txt", "folder"); },
-       [&] { return moved("folder/doc.txt", ""); }},
-      {"doc.txt", inTrash, [&] { return trashed("doc.txt"); }, [&] { return moved(inTrash, ""); }},
-      {"doc.txt", "doc.txt", [&] { return downloaded("doc.txt"); },
-       [&] {
-         if (item("doc.txt")->isDownloaded()) {
-           EXPECT_TRUE(uploaded("doc.txt"));
-           EXPECT_EQ(evicted("doc.txt"), "");
-         }
-         return std::string("doc.txt");
-       }},
-  };
-  for (const Way& way : ways) {
+  const auto kill = [&](const Way& way) {
     bool isDone = false;
     for (std::uint64_t step = 1; !isDone; ++step) {
       ASSERT_LT(step, 100U);
-      SCOPED_TRACE(way.to + ", step " + std::to_string(step));
+      SCOPED_TRACE(way.from + " to " + way.to + ", step " + std::to_string(step));
       close();
       const pid_t child = fork();
       if (child == 0) {
@@ -264,20 +253,63 @@ TEST_F(DriveTest, AKillAtAnyStepLeavesAnEvictedDocumentWholeAtOneOfItsPlaces) {
       isDone = WEXITSTATUS(status) == 0;
       ASSERT_TRUE(isDone || WEXITSTATUS(status) == FaultyFileLayer::kCrashStatus);
       open();
-      const bool isBefore = item(way.from) != nullptr;
-      EXPECT_TRUE(!isDone || !isBefore || way.from == way.to);
-      EXPECT_EQ(portrait(isBefore ? way.from : way.to), before);
-      if (way.from != way.to) {
-        EXPECT_EQ(item(way.to) != nullptr, !isBefore);
-      }
       EXPECT_TRUE(differences().empty());
-      if (!isBefore || way.from == way.to) {
-        ASSERT_EQ(way.back(), "doc.txt");
+      if (way.from == way.to) {
+        const std::string now = portrait(way.from);
+        EXPECT_TRUE(now == way.after || (!isDone && now == before)) << now;
+        way.back();
+        continue;
       }
+      const bool isBefore = item(way.from) != nullptr;
+      EXPECT_FALSE(isDone && isBefore);
+      if (!way.to.empty()) {
+        EXPECT_EQ(portrait(way.to), isBefore ? "none" : way.after);
+      }
+      if (!isBefore) way.back();
+      ASSERT_EQ(portrait(way.from), before);
     }
-  }
-  EXPECT_EQ(downloaded("doc.txt"), "");
-  EXPECT_EQ(read("doc.txt"), "contents");
+  };
+
+  kill({"doc.txt", "new.txt", before, [&] { renamed("doc.txt", "new.txt"); },
+        [&] { renamed("new.txt", "doc.txt"); }});
+  kill({"doc.txt", "folder/doc.txt", before, [&] { moved("doc.txt", "folder"); },
+        [&] { moved("folder/doc.txt", ""); }});
+  kill({"doc.txt", inTrash, before, [&] { trashed("doc.txt"); }, [&] { moved(inTrash, ""); }});
+  trashed("doc.txt");
+  kill({inTrash, "doc.txt", before, [&] { moved(inTrash, ""); }, [&] { trashed("doc.txt"); }});
+  ASSERT_EQ(moved(inTrash, ""), "doc.txt");
+  std::string blue = before;
+  blue.replace(blue.find("Red,Tax 2024"), 12, "Blue");
+  kill({"doc.txt", "doc.txt", blue, [&] { tagged("doc.txt", {"Blue"}); },
+        [&] {
+          tagged("doc.txt", {"Red", "Tax 2024"});
+        }});
+  const auto evict = [&] {
+    if (item("doc.txt")->isDownloaded()) {
+      EXPECT_TRUE(uploaded("doc.txt"));
+      EXPECT_EQ(evicted("doc.txt"), "");
+    }
+  };
+  kill({"doc.txt", "doc.txt", before, [&] { downloaded("doc.txt"); }, evict});
+  const auto download = [&] {
+    EXPECT_EQ(downloaded("doc.txt"), "");
+    EXPECT_EQ(read("doc.txt"), "contents");
+    EXPECT_TRUE(uploaded("doc.txt"));
+  };
+  download();
+  kill({"doc.txt", "doc.txt", before, [&] { evicted("doc.txt"); }, download});
+  evict();
+  kill({"doc.txt",
+        "",
+        {},
+        [&] { removed("doc.txt"); },
+        [&] {
+          EXPECT_TRUE(listed() == std::vector<std::string>{"folder"});
+          before = makePrecious("doc.txt");
+          EXPECT_TRUE(uploaded("doc.txt"));
+          EXPECT_EQ(evicted("doc.txt"), "");
+        }});
+  download();
 }
 
 TEST_F(DriveTest, WhatTheDiskRefusesIsTakenBackWhereverItFails) {
@@ -285,36 +317,44 @@ TEST_F(DriveTest, WhatTheDiskRefusesIsTakenBackWhereverItFails) {
   std::filesystem::create_directory(at("folder"));
   open();
   const std::string before = makePrecious("doc.txt");
-  const auto change = [&](int kind) {
-    if (kind == 0) return renamed("doc.txt", "new.txt");
-    if (kind == 1) return moved("doc.txt", "folder");
-    return tagged("doc.txt", {"other"});
+  struct Change {
+    std::string to;
+    std::function<std::string()> go, back;
   };
-  const std::string places[] = {"new.txt", "folder/doc.txt", "doc.txt"};
-  for (int kind = 0; kind < 3; ++kind) {
-    for (std::uint64_t step = 1;; ++step) {
+  const Change changes[] = {
+      {"new.txt", [&] { return renamed("doc.txt", "new.txt"); },
+       [&] { return renamed("new.txt", "doc.txt"); }},
+      {"folder/doc.txt", [&] { return moved("doc.txt", "folder"); },
+       [&] { return moved("folder/doc.txt", ""); }},
+      {"doc.txt", [&] { return tagged("doc.txt", {"Blue"}) + "doc.txt"; },
+       [&] {
+         return tagged("doc.txt", {"Red", "Tax 2024"}) + "doc.txt";
+       }},
+  };
+  for (const Change& change : changes) {
+    bool isMet = true;
+    for (std::uint64_t step = 1; isMet; ++step) {
       ASSERT_LT(step, 100U);
-      SCOPED_TRACE(places[kind] + ", step " + std::to_string(step));
+      SCOPED_TRACE(change.to + ", step " + std::to_string(step));
       layer.failAt(step, EIO);
-      const std::string answer = change(kind);
-      const bool isMet = layer.met();
+      const std::string answer = change.go();
+      isMet = layer.met();
       layer.failAt(0, 0);
-      // The store knows when the answer comes, either way.
+      // The store knows where it is when the answer comes, either way.
       const bool isRefused = answer.starts_with('!');
-      const std::string place = isRefused ? "doc.txt" : places[kind];
-      ASSERT_NE(item(place), nullptr);
-      if (kind < 2) EXPECT_EQ(item(isRefused ? places[kind] : "doc.txt"), nullptr);
-      if (kind < 2) EXPECT_EQ(portrait(place), before);
+      EXPECT_TRUE(isRefused || answer == change.to) << answer;
+      if (change.to != "doc.txt") {
+        EXPECT_EQ(portrait(isRefused ? "doc.txt" : change.to), before);
+        EXPECT_EQ(item(isRefused ? change.to : "doc.txt"), nullptr);
+      }
       settle();
       EXPECT_TRUE(differences().empty());
-      if (!isMet) break;
-      if (kind == 0 && !isRefused) ASSERT_EQ(renamed("new.txt", "doc.txt"), "doc.txt");
-      if (kind == 1 && !isRefused) ASSERT_EQ(moved("folder/doc.txt", ""), "doc.txt");
+      if (!isRefused || change.to == "doc.txt") {
+        ASSERT_EQ(change.back(), "doc.txt");
+      }
+      EXPECT_EQ(portrait("doc.txt"), before);
     }
-    if (kind == 0) ASSERT_EQ(renamed("new.txt", "doc.txt"), "doc.txt");
-    if (kind == 1) ASSERT_EQ(moved("folder/doc.txt", ""), "doc.txt");
   }
-  EXPECT_EQ(tags("doc.txt"), std::vector<std::string>{"other"});
 }
 
 TEST_F(DriveTest, WhatIsTrashedKeepsItsIdentifierWhoeverTrashesIt) {
