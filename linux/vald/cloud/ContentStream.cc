@@ -12,6 +12,8 @@
 namespace skein::vald {
 namespace {
 
+constexpr std::uint64_t kWriteBehind = std::uint64_t{8} << 20;
+
 // `write` answers an errno.
 template <class Write>
 Outcome<HashedContents> stream(int file, const std::string& name, StreamObserver& observer,
@@ -47,8 +49,16 @@ Outcome<HashedContents> hashContents(int file, const std::string& name, StreamOb
 
 Outcome<HashedContents> copyContents(FileLayer& files, int file, int target,
                                      const std::string& name, StreamObserver& observer) {
+  std::uint64_t written = 0;
+  std::uint64_t begun = 0;  // so far the disk was asked to write
   return stream(file, name, observer, [&](const char* data, std::size_t size) {
-    return files.write(target, {data, size});
+    const int failure = files.write(target, {data, size});
+    written += size;
+    if (failure == 0 && written - begun >= kWriteBehind) {
+      files.writeBehind(target, begun, written);
+      begun = written;
+    }
+    return failure;
   });
 }
 
