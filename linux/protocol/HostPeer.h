@@ -67,6 +67,9 @@ class StreamOwner {
 
   template <class Context, class Encode>
   kj::Promise<void> next(Context context, Encode encode) {
+    // Otherwise a call that waits for the next step would keep the stream of a client that is
+    // gone, and what it began would go on until then.
+    context.allowCancellation();
     return answerThrough([&](Task task) { _queue.async(std::move(task)); }, _peer, context,
                          [stream = _stream](auto reply) { stream->next(std::move(reply)); },
                          std::move(encode));

@@ -77,14 +77,17 @@ TEST_F(CloudTrial, DownloadsFailClearlyAndLeaveNothing) {
   EXPECT_EQ(fails({"get", "/letter.txt"}, "other contents"), 1);
   EXPECT_EQ(files(), 1u);
 
-  tryOut({"--bandwidth", "1K"});
-  EXPECT_EQ(cloud()["conditions"]["bytesPerSecond"], 1000);
+  // Interrupted among its bytes, and long before the first of them.
+  for (const Arguments& slowness : {Arguments{"--bandwidth", "1K"}, {"--delay", "60000"}}) {
+    tryOut(slowness);
+    const auto slow = drive.start({"get", "/letter.txt"});
+    ASSERT_TRUE(comesTrue([&] { return files() == 2; }));
+    sendSignal(slow->pid(), SIGINT);
+    EXPECT_EQ(slow->finish(10s), 130);
+    EXPECT_TRUE(comesTrue([&] { return files() == 1; })) << slowness[0];
+  }
+  EXPECT_EQ(cloud()["conditions"]["delayMilliseconds"], 60000);
   EXPECT_FALSE(cloud()["conditions"]["corrupt"]);
-  const auto slow = drive.start({"get", "/letter.txt"});
-  ASSERT_TRUE(comesTrue([&] { return files() == 2; }));
-  sendSignal(slow->pid(), SIGINT);
-  EXPECT_EQ(slow->finish(10s), 130);
-  EXPECT_TRUE(comesTrue([&] { return files() == 1; }));
 
   tryOut({"--failures", "1"});
   EXPECT_EQ(fails({"get", "/letter.txt"}, "cannot be reached"), 5);
