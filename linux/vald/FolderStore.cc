@@ -24,6 +24,11 @@ NSErrorPtr noSuchFile(const std::string& what) {
                                   {{NSLocalizedDescriptionKey, what}});
 }
 
+bool isOnDisk(const std::string& path) {
+  struct stat status {};
+  return lstat(path.c_str(), &status) == 0;
+}
+
 std::string suffixOfRoot(std::uint64_t inode, std::uint32_t generation) {
   return ".of-" + std::to_string(inode) + "-" + std::to_string(generation);
 }
@@ -280,21 +285,36 @@ VLQueryItemPtr FolderStore::itemAtPath(const std::string& path, bool scanFirst, 
     if (storeFailure(reader, error)) return nullptr;
   }
   const NSErrorPtr missing = noSuchFile("There is no item at " + path + ".");
+  bool hasFailed = false;
   for (std::size_t start = 0; folder;) {
     const std::size_t end = std::min(rest.find('/', start), rest.size());
     const std::string name = rest.substr(start, end - start);
     if (name.empty() || name == "." || name == "..") break;
     const bool isLast = end == rest.size();
     if (!ensureRead(*folder, false, error)) return nullptr;
-    if (isLast && scanFirst) {
+    const auto look = [&] {
       _writer->perform([this, key = folder->number, name] { _writer->lookAtName(key, name); });
+    };
+    const auto find = [&] {
+      auto reader = _readers.lease();
+      auto found = reader ? reader->itemNamed(folder->number, name) : std::nullopt;
+      if (!storeFailure(reader, error)) return found;
+      hasFailed = true;
+      return std::optional<FoundItem>();
+    };
+    if (isLast && scanFirst) look();
+    std::optional<FoundItem> found = find();
+    if (!found && !hasFailed && isOnDisk(path.substr(0, path.size() - rest.size() + end))) {
+      // It came a moment ago, and what the watcher tells of it still gathers.
+      look();
+      found = find();
     }
-    auto reader = _readers.lease();
-    const auto found = reader ? reader->itemNamed(folder->number, name) : std::nullopt;
-    if (storeFailure(reader, error)) return nullptr;
+    if (hasFailed) return nullptr;
     // A container is at its own path, not where it is shown.
     if (!found || found->row.containerID) break;
     if (isLast) return found->item();
+    auto reader = _readers.lease();
+    if (storeFailure(reader, error)) return nullptr;
     folder = reader->folder(found->row.folder);
     start = end + 1;
   }

@@ -87,6 +87,7 @@ class Store {
 
   // Null, with NSCocoaErrorDomain 4, when there is none.
   virtual VLQueryItemPtr itemWithID(VLFileObjectID id, NSErrorOut error) = 0;
+  // What came a moment ago is there. `scanFirst`: what is there is looked at first.
   virtual VLQueryItemPtr itemAtPath(const std::string& path, bool scanFirst, NSErrorOut error) = 0;
   virtual std::optional<std::string> pathForID(VLFileObjectID id, NSErrorOut error) = 0;
   // The same of many, of one moment: as many, in their order, nullopt for what is not there.

@@ -261,6 +261,22 @@ TEST_F(StoreListing, PathsOfManyAtOnce) {
   EXPECT_EQ(error->code(), NSFileNoSuchFileError);
 }
 
+TEST_F(StoreListing, WhatCameAMomentAgoIsThereAtItsPath) {
+  makeFolder("old");
+  open();
+  store->listFolder(item("old")->fileObjectID(), SortOrder::Name, 0, 1, nullptr);
+  settle();
+  makeFolder("old/new");
+  makeFolder("old/new/below");
+  write("old/new/below/doc");
+  const std::string doc = id("old/new/below/doc");
+  EXPECT_NE(doc, "");
+  EXPECT_EQ(id("old/new/below/none"), "");
+  settle();
+  EXPECT_EQ(id("old/new/below/doc"), doc);
+  EXPECT_TRUE(store->check(1).empty());
+}
+
 TEST_F(StoreListing, SettingsSurviveARestart) {
   open();
   store->setSetting("account", "anna");
