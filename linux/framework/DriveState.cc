@@ -88,7 +88,7 @@ std::shared_ptr<const VLAccount> DriveState::account(NSErrorOut error) {
   return vellumAccount(_account);
 }
 
-VLContainersByID DriveState::containers() {
+std::shared_ptr<const VLContainersByID> DriveState::containers() {
   {
     MutexLock lock(_mutex);
     if (_knowsContainers) return _containers;
@@ -99,7 +99,7 @@ VLContainersByID DriveState::containers() {
   if (problem) {
     MutexLock lock(_mutex);
     _containersWereMissed = true;
-    return {};
+    return std::make_shared<const VLContainersByID>();
   }
   setContainers(containers, number);
   MutexLock lock(_mutex);
@@ -153,9 +153,9 @@ void DriveState::setContainers(const Containers& containers, std::uint64_t numbe
     MutexLock lock(_mutex);
     if (number < std::exchange(_lastAnswered, std::max(number, _lastAnswered))) return;
     const bool missed = std::exchange(_containersWereMissed, false);
-    const bool changed = missed || (_knowsContainers && !sameContainers(_containers, table));
+    const bool changed = missed || (_knowsContainers && !sameContainers(*_containers, table));
     _knowsContainers = true;
-    _containers = std::move(table);
+    _containers = std::make_shared<const VLContainersByID>(std::move(table));
     if (!changed || !_postsContainerChanges) return;
   }
   postSoon(VLContainerListDidChangeNotification);

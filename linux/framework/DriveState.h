@@ -30,8 +30,8 @@ class DriveState final : public LocalDaemonEvents, public std::enable_shared_fro
   // Null: nobody is logged in. Waits for vald the first time; an error when vald cannot
   // be asked.
   std::shared_ptr<const VLAccount> account(NSErrorOut error) SKEIN_EXCLUDES(_mutex);
-  // Waits for vald the first time; empty when it cannot be asked.
-  VLContainersByID containers() SKEIN_EXCLUDES(_mutex);
+  // Waits for vald the first time; empty when it cannot be asked. Never null.
+  std::shared_ptr<const VLContainersByID> containers() SKEIN_EXCLUDES(_mutex);
 
   // From now on the notification is posted.
   void postAccountChanges() SKEIN_EXCLUDES(_mutex);
@@ -68,7 +68,9 @@ class DriveState final : public LocalDaemonEvents, public std::enable_shared_fro
   Account _account SKEIN_GUARDED_BY(_mutex);
   std::uint64_t _accountPushes SKEIN_GUARDED_BY(_mutex) = 0;
   bool _knowsContainers SKEIN_GUARDED_BY(_mutex) = false;
-  VLContainersByID _containers SKEIN_GUARDED_BY(_mutex);
+  // Replaced as a whole, since it is asked for with every URL.
+  std::shared_ptr<const VLContainersByID> _containers SKEIN_GUARDED_BY(_mutex) =
+      std::make_shared<const VLContainersByID>();
   std::uint64_t _lastQuestion SKEIN_GUARDED_BY(_mutex) = 0;
   std::uint64_t _lastAnswered SKEIN_GUARDED_BY(_mutex) = 0;
   bool _postsAccountChanges SKEIN_GUARDED_BY(_mutex) = false;

@@ -49,7 +49,8 @@ NSURLPtr LocalDocuments::vl_documentURLFromFileObjectID(const VLFileObjectID& fi
 
 bool LocalDocuments::vl_isInSyncedLocation(const NSURLPtr& url) {
   if (!url || leadsElsewhere(url->path())) return false;
-  for (const auto& [id, container] : _state->containers()) {
+  const auto containers = _state->containers();
+  for (const auto& [id, container] : *containers) {
     const NSURLPtr& folder = container->documentsURL();
     if (folder && isAtOrBelow(url->path(), folder->path())) return true;
   }
@@ -80,7 +81,8 @@ void LocalDocuments::vl_addPhysicalProperty(const NSURLPtr& url) {
 std::optional<std::string> LocalDocuments::vl_containerIDIfIsDocumentsContainerURL(
     const NSURLPtr& url) {
   if (!url) return std::nullopt;
-  for (const auto& [id, container] : _state->containers()) {
+  const auto containers = _state->containers();
+  for (const auto& [id, container] : *containers) {
     // The default container's folder is the drive's root, a folder like any other.
     if (id != VLUbiquitousDefaultContainerID && isEqualURL(container->documentsURL(), url)) {
       return id;

@@ -136,7 +136,8 @@ bool LocalFileOperations::vl_isPromiseURL(const NSURLPtr& url) { return physical
 std::shared_ptr<const VLContainer> LocalFileOperations::vl_vellumContainer(const NSURLPtr& url) {
   std::shared_ptr<const VLContainer> innermost;
   if (!url) return innermost;
-  for (const auto& [id, container] : _state->containers()) {
+  const auto containers = _state->containers();
+  for (const auto& [id, container] : *containers) {
     const NSURLPtr& folder = container->documentsURL();
     if (!folder || !isAtOrBelow(url->path(), folder->path())) continue;
     if (!innermost || folder->path().size() > innermost->documentsURL()->path().size()) {

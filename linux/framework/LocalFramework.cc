@@ -37,10 +37,10 @@ class LocalContainers final : public VLContainers {
  public:
   explicit LocalContainers(std::shared_ptr<DriveState> state) : _state(std::move(state)) {}
 
-  VLContainersByID allContainersByContainerID() override { return _state->containers(); }
+  VLContainersByID allContainersByContainerID() override { return *_state->containers(); }
   VLContainersByID allContainers() override {
     _state->postContainerChanges();
-    return _state->containers();
+    return *_state->containers();
   }
 
  private:
