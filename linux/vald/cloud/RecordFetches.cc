@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <chrono>
 #include <map>
+#include <unordered_map>
 #include <utility>
 
 #include "linux/vald/cloud/CloudErrors.h"
@@ -10,6 +11,9 @@
 
 namespace skein::vald {
 namespace {
+
+// No document has this number: what a name that is no identifier stands for.
+const VLFileObjectID kNobody = VLFileObjectID::documentWithRawID(0);
 
 NSErrorPtr cloudKitError(std::int64_t code, std::string text) {
   return NSError::errorWithDomain(CKErrorDomain, code,
@@ -113,24 +117,23 @@ Outcome<std::vector<FetchedRecord>> RecordFetches::fetch(const RecordQuery& quer
   if (NSErrorPtr error = meetConditions(query.zone, cancellation)) return error;
 
   std::vector<VLFileObjectID> documents;
+  documents.reserve(query.recordNames.size());
   for (const std::string& name : query.recordNames) {
-    if (const auto document = VLFileObjectID::fileObjectIDWithString(name)) {
-      documents.push_back(*document);
-    }
+    documents.push_back(VLFileObjectID::fileObjectIDWithString(name).value_or(kNobody));
   }
   auto found = recordsOf(documents);
   if (!found) return found.error();
-  std::map<std::string, const CloudRecord*> byName;
+  std::unordered_map<VLFileObjectID, const CloudRecord*> byDocument;
   for (const CloudRecord& record : *found) {
     // A record's name is known in its own zone alone.
-    if (record.zone == query.zone) byName.emplace(record.recordID().recordName, &record);
+    if (record.zone == query.zone) byDocument.emplace(record.document, &record);
   }
 
   std::vector<FetchedRecord> records;
   records.reserve(query.recordNames.size());
-  for (const std::string& name : query.recordNames) {
-    FetchedRecord fetched{{name, query.zone}, nullptr, nullptr};
-    if (const auto record = byName.find(name); record != byName.end()) {
+  for (std::size_t at = 0; at < documents.size(); ++at) {
+    FetchedRecord fetched{{query.recordNames[at], query.zone}, nullptr, nullptr};
+    if (const auto record = byDocument.find(documents[at]); record != byDocument.end()) {
       fetched.record = std::make_shared<const CKRecord>(
           fetched.recordID, fieldsOf(*record->second, query.desiredKeys));
     } else {
