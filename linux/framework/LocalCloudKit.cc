@@ -14,7 +14,7 @@ namespace skein {
 namespace {
 
 // How many records of one operation are handed out at a time.
-constexpr std::size_t kMostAtATime = 4;
+constexpr std::size_t kMostAtATime = 2;
 
 enum class Scope : std::uint8_t { Private, Shared };
 

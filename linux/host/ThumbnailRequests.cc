@@ -26,10 +26,11 @@ void begin(const DriveRequests& drive, const std::vector<HostTarget>& targets, N
            const std::shared_ptr<ThumbnailStream>& stream) {
   std::vector<NSFileProviderItemIdentifier> identifiers;
   std::vector<VLFileObjectID> documents;
+  ThumbnailStream::Targets expected;
   for (std::uint32_t index = 0; index < targets.size(); ++index) {
     NSErrorPtr error;
     if (auto identifier = drive.resolve(targets[index], &error)) {
-      stream->expect(index, *identifier);
+      expected.emplace(*identifier, index);
       if (const auto id = VLFileObjectID::fileObjectIDWithString(*identifier)) {
         documents.push_back(*id);
       }
@@ -38,6 +39,7 @@ void begin(const DriveRequests& drive, const std::vector<HostTarget>& targets, N
       stream->fail(index, error);
     }
   }
+  stream->expect(std::move(expected));
   const DocumentURLScope urls(drive.daemon(), *drive.tools().executor, documents);
   stream->setProgress(drive.extension().fetchThumbnailsForItemIdentifiersWithType(
       identifiers, size,

@@ -10,9 +10,9 @@
 namespace skein {
 namespace {
 
-constexpr std::size_t kMostBytes = 16 << 20;
+constexpr std::size_t kMostBytes = 8 << 20;
 // What crosses the socket at once, but for a single picture that is larger.
-constexpr std::size_t kStepBytes = 1 << 20;
+constexpr std::size_t kStepBytes = 4 << 20;
 constexpr std::size_t kStepThumbnails = 200;
 
 std::size_t bytesOf(const HostThumbnail& thumbnail) {
@@ -36,18 +36,18 @@ ThumbnailStream::ThumbnailStream(const HostTools& tools, std::size_t targets)
 
 void ThumbnailStream::keepMemoryForPictures() { mallopt(M_TRIM_THRESHOLD, kMostBytes); }
 
-void ThumbnailStream::expect(std::uint32_t index, const NSFileProviderItemIdentifier& identifier) {
-  _queue.async([self = shared_from_this(), index, identifier] {
-    self->_queue.assumeCurrent();
-    self->_expected.emplace(identifier, index);
-  });
+void ThumbnailStream::expect(Targets targets) {
+  MutexLock lock(_mutex);
+  _expected = std::move(targets);
 }
 
 void ThumbnailStream::fail(std::uint32_t index, NSErrorPtr error) {
-  _queue.async([self = shared_from_this(), index, error = std::move(error)]() mutable {
-    self->_queue.assumeCurrent();
-    self->tell({index, HostThumbnail::Kind::Error, std::nullopt, std::nullopt, std::move(error)});
-  });
+  {
+    MutexLock lock(_mutex);
+    _ready.push_back(
+        {index, HostThumbnail::Kind::Error, std::nullopt, std::nullopt, std::move(error)});
+  }
+  handOutSoon();
 }
 
 void ThumbnailStream::thumbnailDidCome(const NSFileProviderItemIdentifier& identifier,
@@ -56,29 +56,30 @@ void ThumbnailStream::thumbnailDidCome(const NSFileProviderItemIdentifier& ident
   if (data) waitForRoom(data->length());
   HostThumbnail thumbnail{0, kindOf(identifier, data.has_value(), error != nullptr),
                           std::move(data), std::move(type), std::move(error)};
-  _queue.async([self = shared_from_this(), identifier, thumbnail = std::move(thumbnail)]() mutable {
-    self->_queue.assumeCurrent();
+  {
+    MutexLock lock(_mutex);
     // An item that was named twice is told of twice, of one picture.
-    const auto [first, last] = self->_expected.equal_range(identifier);
+    const auto [first, last] = _expected.equal_range(identifier);
     for (auto one = first; one != last; ++one) {
       thumbnail.index = one->second;
-      self->tell(thumbnail);
+      _ready.push_back(thumbnail);
     }
-    self->_expected.erase(first, last);
-  });
+    _expected.erase(first, last);
+  }
+  handOutSoon();
 }
 
 void ThumbnailStream::batchDidEnd(NSErrorPtr error) {
-  _queue.async([self = shared_from_this(), error = std::move(error)]() mutable {
-    self->_queue.assumeCurrent();
+  {
+    MutexLock lock(_mutex);
     const auto kind = error ? HostThumbnail::Kind::Error : HostThumbnail::Kind::Missing;
-    self->_hasEnded = true;
-    self->_error = std::move(error);
-    for (const auto& [identifier, index] : std::exchange(self->_expected, {})) {
-      self->_ready.push_back({index, kind, std::nullopt, std::nullopt, self->_error});
+    _hasEnded = true;
+    _error = std::move(error);
+    for (const auto& [identifier, index] : std::exchange(_expected, {})) {
+      _ready.push_back({index, kind, std::nullopt, std::nullopt, _error});
     }
-    self->handOut();
-  });
+  }
+  handOutSoon();
 }
 
 void ThumbnailStream::setProgress(std::shared_ptr<NSProgress> progress) {
@@ -91,11 +92,11 @@ void ThumbnailStream::setProgress(std::shared_ptr<NSProgress> progress) {
 }
 
 void ThumbnailStream::next(Reply<HostThumbnailStep, NSErrorPtr> reply) {
-  _queue.async([self = shared_from_this(), reply = std::move(reply)]() mutable {
-    self->_queue.assumeCurrent();
-    self->_waiting.push_back(std::move(reply));
-    self->handOut();
-  });
+  {
+    MutexLock lock(_mutex);
+    _waiting.push_back(std::move(reply));
+  }
+  handOutSoon();
 }
 
 void ThumbnailStream::letGo() {
@@ -109,35 +110,47 @@ void ThumbnailStream::letGo() {
   if (progress) progress->cancel();
 }
 
-void ThumbnailStream::tell(HostThumbnail thumbnail) {
-  _ready.push_back(std::move(thumbnail));
-  handOut();
+void ThumbnailStream::handOutSoon() {
+  {
+    MutexLock lock(_mutex);
+    const bool isThereSomething = !_ready.empty() || _hasEnded;
+    if (_waiting.empty() || !isThereSomething || std::exchange(_willHandOut, true)) return;
+  }
+  _queue.async([self = shared_from_this()] { self->handOut(); });
 }
 
 void ThumbnailStream::handOut() {
-  while (!_waiting.empty() && (!_ready.empty() || _hasEnded)) {
+  for (;;) {
     HostThumbnailStep step;
-    std::size_t bytes = 0;
-    while (!_ready.empty() && step.thumbnails.size() < kStepThumbnails &&
-           (step.thumbnails.empty() || bytes + bytesOf(_ready.front()) <= kStepBytes)) {
-      bytes += bytesOf(_ready.front());
-      step.thumbnails.push_back(std::move(_ready.front()));
-      _ready.pop_front();
-    }
-    _done += step.thumbnails.size();
-    step.done = _done;
-    step.total = _targets;
-    step.finished = _hasEnded && _ready.empty();
-    NSErrorPtr error = step.finished ? _error : nullptr;
-    auto reply = std::move(_waiting.front());
-    _waiting.pop_front();
+    NSErrorPtr error;
+    Reply<HostThumbnailStep, NSErrorPtr> reply;
     {
       MutexLock lock(_mutex);
-      _bytes -= std::min(bytes, _bytes);
-      _roomCame.notifyAll();
+      _willHandOut = false;
+      if (_waiting.empty() || (_ready.empty() && !_hasEnded)) return;
+      takeStep(step);
+      if (step.finished) error = _error;
+      reply = std::move(_waiting.front());
+      _waiting.pop_front();
     }
     reply(std::move(step), std::move(error));
   }
+}
+
+void ThumbnailStream::takeStep(HostThumbnailStep& step) {
+  std::size_t bytes = 0;
+  while (!_ready.empty() && step.thumbnails.size() < kStepThumbnails &&
+         (step.thumbnails.empty() || bytes + bytesOf(_ready.front()) <= kStepBytes)) {
+    bytes += bytesOf(_ready.front());
+    step.thumbnails.push_back(std::move(_ready.front()));
+    _ready.pop_front();
+  }
+  _done += step.thumbnails.size();
+  step.done = _done;
+  step.total = _targets;
+  step.finished = _hasEnded && _ready.empty();
+  _bytes -= std::min(bytes, _bytes);
+  if (_bytes <= kMostBytes / 2) _roomCame.notifyAll();
 }
 
 void ThumbnailStream::waitForRoom(std::size_t bytes) {
@@ -148,9 +161,10 @@ void ThumbnailStream::waitForRoom(std::size_t bytes) {
       return;
     }
   }
+  // Until there is room for many, or every picture that is taken would wake one that comes.
   ScopedWait wait(*_executor);
   MutexLock lock(_mutex);
-  while (_isWanted && _bytes > 0 && _bytes + bytes > kMostBytes) _roomCame.wait(_mutex);
+  while (_isWanted && _bytes > kMostBytes / 2) _roomCame.wait(_mutex);
   _bytes += bytes;
 }
 

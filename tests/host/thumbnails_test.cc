@@ -1,6 +1,11 @@
 // A batch of thumbnails between the extension and whoever takes it out.
 #include <gtest/gtest.h>
 
+#include <atomic>
+#include <future>
+#include <thread>
+
+#include "base/ThreadPool.h"
 #include "linux/host/ThumbnailStream.h"
 #include "tests/host/HostFixture.h"
 
@@ -35,10 +40,8 @@ struct Thumbnails : HostTest {
 
 TEST_F(Thumbnails, EachTargetIsToldOfOnceWhateverTheExtensionCalls) {
   stream->fail(0, expired());
-  stream->expect(1, idOf(1));
-  stream->expect(2, folder);
-  stream->expect(3, idOf(1));  // named twice
-  stream->expect(4, idOf(4));  // left out
+  // One is named twice, one will be left out.
+  stream->expect({{idOf(1), 1}, {folder, 2}, {idOf(1), 3}, {idOf(4), 4}});
   EXPECT_EQ(take(), (Words{"0 error -1002", "1/5"}));
   come(idOf(1), NSData("picture"));
   come(idOf(1), NSData("again"));
@@ -54,12 +57,37 @@ TEST_F(Thumbnails, EachTargetIsToldOfOnceWhateverTheExtensionCalls) {
 }
 
 TEST_F(Thumbnails, WhatIsLeftOutOfAFailedBatchFailsWithIt) {
-  stream->expect(0, idOf(1));
-  stream->expect(1, folder);
+  stream->expect({{idOf(1), 0}, {folder, 1}});
   come(folder, std::nullopt);
   stream->batchDidEnd(expired());
   run();
   EXPECT_EQ(take(), (Words{"1 none", "0 error -1002", "2/5 end with error"}));
+}
+
+TEST(ThumbnailsOfThreads, WhoBringsMoreThanFitsWaitsUntilItIsTakenOrNotWanted) {
+  const auto pool = std::make_shared<ThreadPool>(1, "thumbnails");
+  const auto stream = std::make_shared<ThumbnailStream>(HostTools{pool, nullptr}, 5);
+  stream->expect({{idOf(1), 1}, {idOf(2), 2}, {idOf(3), 3}, {idOf(4), 4}, {idOf(5), 5}});
+  const NSData large(std::string(5 << 20, 'p'));
+  std::atomic<std::size_t> brought{0};
+  std::thread bringer([&] {
+    for (std::uint64_t number = 1; number <= 5; ++number) {
+      stream->thumbnailDidCome(idOf(number), large, std::nullopt, nullptr);
+      ++brought;
+    }
+  });
+  for (std::size_t taken = 0; taken < 2;) {
+    std::promise<std::size_t> came;
+    stream->next([&](const HostThumbnailStep& step, const NSErrorPtr&) {
+      came.set_value(step.thumbnails.size());
+    });
+    taken += came.get_future().get();
+    // There is no room for two of them.
+    EXPECT_LE(brought, taken + 1);
+  }
+  stream->letGo();
+  bringer.join();
+  EXPECT_EQ(brought, 5U);
 }
 
 TEST_F(Thumbnails, LettingGoCancelsTheBatchAlsoBeforeItHasBegun) {
