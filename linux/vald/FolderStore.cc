@@ -81,7 +81,7 @@ std::unique_ptr<FolderStore> FolderStore::openFolder(StoreOptions options, Store
   if (!database) return nullptr;
   IndexWriter index(*database);
   auto journalID = index.setting(kJournalID);
-  const bool mayLackCommits = markIndexOpen(*database);
+  const bool mayLackCommits = mayIndexLackCommits(*database);
   if (mayLackCommits) {
     VL_NOTICE(log,
               "[NOTICE] the machine went down while the index was open; whoever follows changes "
@@ -91,6 +91,7 @@ std::unique_ptr<FolderStore> FolderStore::openFolder(StoreOptions options, Store
     journalID = randomToken();
     index.setSetting(kJournalID, journalID);
   }
+  markIndexOpen(*database);
   if (database->failed()) {
     error.store(vl_errorWithPOSIXCode(
         EIO, "The index " + options.databasePath + " cannot be used: " + database->message()));
@@ -285,7 +286,6 @@ VLQueryItemPtr FolderStore::itemAtPath(const std::string& path, bool scanFirst, 
     if (storeFailure(reader, error)) return nullptr;
   }
   const NSErrorPtr missing = noSuchFile("There is no item at " + path + ".");
-  bool hasFailed = false;
   for (std::size_t start = 0; folder;) {
     const std::size_t end = std::min(rest.find('/', start), rest.size());
     const std::string name = rest.substr(start, end - start);
@@ -295,27 +295,25 @@ VLQueryItemPtr FolderStore::itemAtPath(const std::string& path, bool scanFirst, 
     const auto look = [&] {
       _writer->perform([this, key = folder->number, name] { _writer->lookAtName(key, name); });
     };
+    std::optional<FoundItem> found;
+    std::optional<FolderRow> below;
     const auto find = [&] {
       auto reader = _readers.lease();
-      auto found = reader ? reader->itemNamed(folder->number, name) : std::nullopt;
-      if (!storeFailure(reader, error)) return found;
-      hasFailed = true;
-      return std::optional<FoundItem>();
+      found = reader ? reader->itemNamed(folder->number, name) : std::nullopt;
+      if (found && !isLast) below = reader->folder(found->row.folder);
+      return !storeFailure(reader, error);
     };
     if (isLast && scanFirst) look();
-    std::optional<FoundItem> found = find();
-    if (!found && !hasFailed && isOnDisk(path.substr(0, path.size() - rest.size() + end))) {
+    if (!find()) return nullptr;
+    if (!found && isOnDisk(path.substr(0, path.size() - rest.size() + end))) {
       // It came a moment ago, and what the watcher tells of it still gathers.
       look();
-      found = find();
+      if (!find()) return nullptr;
     }
-    if (hasFailed) return nullptr;
     // A container is at its own path, not where it is shown.
     if (!found || found->row.containerID) break;
     if (isLast) return found->item();
-    auto reader = _readers.lease();
-    if (storeFailure(reader, error)) return nullptr;
-    folder = reader->folder(found->row.folder);
+    folder = std::move(below);
     start = end + 1;
   }
   error.store(missing);

@@ -138,6 +138,11 @@ std::string startOfMachine() {
   return start.empty() ? randomToken() : start;
 }
 
+std::string openMark(SqliteDatabase& database) {
+  SqliteStatement mark(database, "SELECT value FROM setting WHERE name=?");
+  return mark.start(kOpenMark).step() ? std::string(mark.bytes(0)) : std::string();
+}
+
 void runDurably(SqliteDatabase& database, SqliteStatement& statement) {
   database.execute("PRAGMA synchronous = FULL");
   statement.run();
@@ -226,17 +231,16 @@ std::unique_ptr<SqliteDatabase> openIndexFile(const std::string& path, Log& log,
   return nullptr;
 }
 
-bool markIndexOpen(SqliteDatabase& database) {
+bool mayIndexLackCommits(SqliteDatabase& database) {
+  const std::string mark = openMark(database);
+  return !mark.empty() && mark != startOfMachine();
+}
+
+void markIndexOpen(SqliteDatabase& database) {
   const std::string start = startOfMachine();
-  std::string found;
-  {
-    SqliteStatement mark(database, "SELECT value FROM setting WHERE name=?");
-    if (mark.start(kOpenMark).step()) found = mark.bytes(0);
-  }
-  if (found == start) return false;
+  if (openMark(database) == start) return;
   SqliteStatement put(database, "INSERT OR REPLACE INTO setting(name, value) VALUES(?,?)");
   runDurably(database, put.start(kOpenMark, start));
-  return !found.empty();
 }
 
 void markIndexClosed(SqliteDatabase& database) {

@@ -38,9 +38,10 @@ bool takeIndexFileBack(const std::string& path, const std::string& suffix);
 
 // Most commits do not wait for the disk, which has what they write as well. A power cut may
 // take the newest of them along, and with them ranks that were told already. So an index is
-// marked while it is open, with the start of the machine: true when an earlier start's mark
-// is found, and the newest commits may be missing. Both wait for the disk.
-bool markIndexOpen(SqliteDatabase& database);
+// marked while it is open, with the start of the machine, and the newest commits may be
+// missing when the mark of an earlier start is found. Marking waits for the disk.
+bool mayIndexLackCommits(SqliteDatabase& database);
+void markIndexOpen(SqliteDatabase& database);
 void markIndexClosed(SqliteDatabase& database);
 
 // Whether the secondary indexes stand; and builds them, inside no transaction.
