@@ -150,7 +150,7 @@ class Bench {
       chainTurns.push_back(turn(chain));
     }
     const auto thousand = [](std::vector<double>& turns) {
-      std::nth_element(turns.begin(), turns.begin() + turns.size() / 2, turns.end());
+      std::sort(turns.begin(), turns.end());
       return turns[turns.size() / 2] * kCalls / kTurn;
     };
     const double all = thousand(chainTurns);

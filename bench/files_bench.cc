@@ -183,7 +183,7 @@ class Bench {
       turns.push_back(turn(ours));
     }
     const auto thousand = [](std::vector<double>& all) {
-      std::nth_element(all.begin(), all.begin() + all.size() / 2, all.end());
+      std::sort(all.begin(), all.end());
       return all[all.size() / 2] * kCalls / kTurn;
     };
     report(what, kBar, thousand(turns), thousand(plainTurns));

@@ -218,6 +218,7 @@ class Host {
 // The whole batch, as a client of the host takes it out; the bytes that came.
 std::size_t runBatch(Host& host, const std::vector<std::string>& identifiers) {
   std::vector<HostTarget> targets;
+  targets.reserve(identifiers.size());
   for (const std::string& id : identifiers) targets.push_back(HostTarget::identifier(id));
   std::promise<std::shared_ptr<HostThumbnailBatch>> begun;
   host.thumbnails->fetchThumbnails(

@@ -62,7 +62,7 @@ std::vector<std::pair<std::string, Sizes>> usualFolders() {
   for (const int size : {16, 22, 24, 32, 36, 48, 64, 72, 96, 128, 192, 256, 512}) {
     std::string folder = std::to_string(size);
     folder += "x" + folder + "/apps";
-    folders.push_back({std::move(folder), {size - 2, size + 2, 1}});
+    folders.emplace_back(std::move(folder), Sizes{size - 2, size + 2, 1});
   }
   folders.push_back({"scalable/apps", {1, 512, 1}});
   return folders;

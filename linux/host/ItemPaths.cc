@@ -70,7 +70,7 @@ NSURLPtr ItemPaths::urlForPath(const std::string& path, NSErrorOut error) const 
   const auto wanted = normalised(path, error);
   if (!wanted) return nullptr;
   if (const auto elsewhere = pathInContainer(*wanted)) return NSURL::fileURLWithPath(*elsewhere);
-  const NSURLPtr root =
+  NSURLPtr root =
       _extension.URLForItemWithPersistentIdentifier(NSFileProviderRootContainerItemIdentifier);
   if (!root) {
     error.store(errorForMissing(*wanted));

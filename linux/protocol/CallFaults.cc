@@ -68,6 +68,7 @@ std::vector<FaultableMethod> faultableMethods() {
   for (const auto& [key, method] : allMethods())
     byName.emplace(method.name, method.answersErrors());
   std::vector<FaultableMethod> methods;
+  methods.reserve(byName.size());
   for (const auto& [name, answersErrors] : byName) methods.push_back({name, answersErrors});
   return methods;
 }

@@ -155,6 +155,7 @@ std::vector<FileHistoryEntry> Files::historyOf(const std::string& path,
                             [](const auto& a, const auto& b) { return a.id == b.id; }),
                 entries.end());
   std::vector<FileHistoryEntry> history;
+  history.reserve(entries.size());
   for (const OperationEntry& entry : entries) {
     history.push_back({entry.when, operationName(entry.kind), entry.origin, entry.document,
                        documentPath(nullptr, entry.path), documentPath(nullptr, entry.destination),

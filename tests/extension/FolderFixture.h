@@ -37,7 +37,7 @@ struct FolderFixture : testing::Test {
     return sender;
   }
   // The error a setup ends with, in the transcript.
-  void setUp() {
+  void setUpReceiving() {
     enumerator->setupNotificationReceivingIfNeededWithCompletion(
         [this](const NSErrorPtr& error) { env.transcript.add("set up: " + brief(error)); });
     env.executor->runAll();

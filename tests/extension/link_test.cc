@@ -15,7 +15,7 @@ struct Link : FolderFixture {
 };
 
 TEST_F(Link, IsSetUpOnceWithoutWaitingForTheWatch) {
-  setUp();
+  setUpReceiving();
   EXPECT_EQ(env.run(), Lines{"daemon: sender"});
   const auto sender = daemon.makeSender();
   daemon.senders.next()->reply(sender, nullptr);
@@ -24,37 +24,37 @@ TEST_F(Link, IsSetUpOnceWithoutWaitingForTheWatch) {
   EXPECT_EQ(env.run(), (Lines{"sender 1 boostPriority", "sender 1 watch file:///store/f 19",
                               "set up: no error"}));
   EXPECT_EQ(sender->receiver(), enumerator);
-  setUp();
+  setUpReceiving();
   EXPECT_EQ(env.run(), Lines{"set up: no error"});
   sender->watches.next()->reply(nullptr);
   sender->boosts.next()->reply();
   EXPECT_EQ(env.run(), Lines{});
 
   enumerator = make(kFolder, /*recursive=*/true);
-  setUp();
+  setUpReceiving();
   daemon.senders.next()->reply(daemon.makeSender(), nullptr);
   EXPECT_EQ(env.run()[2], "sender 2 watch file:///store/f 23");
 }
 
 TEST_F(Link, AFailedSetupLeavesItUnlinkedAndTheNextTriesAgain) {
-  setUp();
+  setUpReceiving();
   daemon.senders.next()->reply(nullptr, kVellum9);
   EXPECT_EQ(env.run(), (Lines{"daemon: sender", "set up: VLVellumErrorDomain 9"}));
-  setUp();
+  setUpReceiving();
   daemon.senders.next()->fail(kCocoa14);
   // The connection's error ends it at once, on the reply thread.
   EXPECT_EQ(env.transcript.take(), (Lines{"daemon: sender", "set up: NSCocoaErrorDomain 14"}));
   // The daemon has no sender to give, and no error.
-  setUp();
+  setUpReceiving();
   daemon.senders.next()->reply(nullptr, nullptr);
   EXPECT_EQ(env.run(), (Lines{"daemon: sender", "set up: no error"}));
-  setUp();
+  setUpReceiving();
   EXPECT_EQ(env.run(), Lines{"daemon: sender"});
 }
 
 TEST_F(Link, OverlappingSetupsAreAFaultAndTheLastSenderStays) {
-  setUp();
-  setUp();
+  setUpReceiving();
+  setUpReceiving();
   EXPECT_EQ(env.run(),
             (Lines{"daemon: sender", "[CRIT] Assertion failed: !_isSettingUpNotificationReceiving",
                    "daemon: sender"}));
@@ -130,7 +130,7 @@ TEST_F(Link, TheContainersAreWatchedAtTheRootAlone) {
   EXPECT_EQ(env.run(), (Lines{"containers: all", "daemon: sender"}));
   // Registered once, however often it is set up.
   daemon.senders.next()->fail(kCocoa14);
-  setUp();
+  setUpReceiving();
   daemon.senders.next()->reply(daemon.makeSender(), nullptr);
   env.run();
   EXPECT_EQ(observers(VLContainerListDidChangeNotification), 1u);
@@ -163,7 +163,7 @@ TEST_F(Link, InvalidationEndsItAndAllObserving) {
 }
 
 TEST_F(Link, ASenderThatComesAfterInvalidationIsInvalidated) {
-  setUp();
+  setUpReceiving();
   enumerator->invalidate();
   env.run();
   daemon.senders.next()->reply(daemon.makeSender(), nullptr);

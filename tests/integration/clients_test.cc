@@ -9,6 +9,7 @@
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
+#include <iostream>
 #include <map>
 #include <nlohmann/json.hpp>
 #include <random>
@@ -336,10 +337,8 @@ TEST(Clients, AreAllAnsweredAndLoseNothingWhileValdFailsAndIsKilled) {
     }
     trouble.run();
   }
-  std::printf("%llu requests answered, %llu with an error; %llu faults, %d kills\n",
-              static_cast<unsigned long long>(tally.answered + tally.failed),
-              static_cast<unsigned long long>(tally.failed),
-              static_cast<unsigned long long>(trouble.faults), trouble.kills);
+  std::cout << tally.answered + tally.failed << " requests answered, " << tally.failed
+            << " with an error; " << trouble.faults << " faults, " << trouble.kills << " kills\n";
   EXPECT_EQ(trouble.kills, 3);
   EXPECT_GT(trouble.faults, 0U);
   EXPECT_GT(tally.answered, 50U);

@@ -144,6 +144,7 @@ std::optional<std::string> FakeStore::pathForID(VLFileObjectID id, NSErrorOut er
 std::vector<std::optional<std::string>> FakeStore::pathsForIDs(
     const std::vector<VLFileObjectID>& ids, NSErrorOut) {
   std::vector<std::optional<std::string>> paths;
+  paths.reserve(ids.size());
   for (const VLFileObjectID& id : ids) paths.push_back(pathForID(id, nullptr));
   return paths;
 }

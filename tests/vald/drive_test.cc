@@ -25,7 +25,7 @@ class DriveTest : public DriveFixture {
     EXPECT_EQ(tagged(path, {"Red", "Tax 2024"}), "");
     EXPECT_EQ(ranked(path, 7), "");
     EXPECT_EQ(used(path, NSDate(std::chrono::seconds(1'700'000'000))), "");
-    const std::string all = portrait(path);
+    std::string all = portrait(path);
     EXPECT_NE(all.find("Red,Tax 2024 7 1700000000"), std::string::npos) << all;
     return all;
   }

@@ -164,8 +164,8 @@ void IndexWriter::erase(const ItemRow& row) {
 
 Tombstone IndexWriter::bury(const ItemRow& row, VLFileObjectID holder, std::int64_t now) {
   erase(row);
-  const Tombstone tombstone{++_rank,  row.id,         holder,        row.parent,
-                            row.name, row.state.kind, row.state.key, now};
+  Tombstone tombstone{++_rank,  row.id,         holder,        row.parent,
+                      row.name, row.state.kind, row.state.key, now};
   _bury
       .start(tombstone.rank, row.id.rawID(), static_cast<int>(tombstone.kind), holder.rawID(),
              row.parent, row.name, tombstone.key.inode, tombstone.key.generation,
