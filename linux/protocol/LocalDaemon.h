@@ -117,7 +117,8 @@ class LocalDaemon : public VLDaemon {
                                     Reply<std::vector<NSURLPtr>, NSErrorPtr> reply) = 0;
 
   // The item at an absolute path inside the store, also one that came a moment ago.
-  // `scanFirst`: look at the file before answering. Null item and NSCocoaErrorDomain 4 when there is none.
+  // `scanFirst`: look at the file before answering. Null item and NSCocoaErrorDomain 4 when
+  // there is none.
   virtual void queryItemForURL(NSURLPtr url, bool scanFirst,
                                Reply<VLQueryItemPtr, NSErrorPtr> reply) = 0;
 
