@@ -65,6 +65,23 @@ TEST_F(ContentsTest, EqualContentsAreKeptOnceAndGoWithTheirLastRecord) {
   EXPECT_EQ(rig.records->usedBytes(), 0u);
 }
 
+TEST_F(ContentsTest, WhatTheDiskRefusesWhileContentsAreCopiedIsTold) {
+  // The sync at the end would not hear of it again.
+  class Unwritable final : public FileLayer {
+    int beforeStep(FileStep step, std::string_view) override {
+      return step == FileStep::Sync ? EIO : 0;
+    }
+  } files;
+  const std::string path = folder.path() / "large";
+  std::ofstream(path, std::ios::binary) << std::string(9 << 20, 'x');
+  const FileDescriptor from(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
+  const FileDescriptor to(::open((path + " copy").c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600));
+  EXPECT_TRUE(copyContents(rig.files, from.get(), to.get(), "large", unhindered));
+  const auto refused = copyContents(files, from.get(), to.get(), "large", unhindered);
+  ASSERT_FALSE(refused);
+  EXPECT_NE(refused.error()->localizedDescription().find("large"), std::string::npos);
+}
+
 TEST_F(ContentsTest, SpoiledContentsAreFoundAndLeftoversGoAtTheOpening) {
   upload(1, rig.write("a", "words"));
   const auto hash = (*rig.records->record(documentNumber(1)))->contents.hash;

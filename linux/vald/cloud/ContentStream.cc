@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <utility>
 #include <vector>
 
 #include "linux/vald/files/FileErrors.h"
@@ -52,13 +53,10 @@ Outcome<HashedContents> copyContents(FileLayer& files, int file, int target,
   std::uint64_t written = 0;
   std::uint64_t begun = 0;  // so far the disk was asked to write
   return stream(file, name, observer, [&](const char* data, std::size_t size) {
-    const int failure = files.write(target, {data, size});
+    if (const int failure = files.write(target, {data, size})) return failure;
     written += size;
-    if (failure == 0 && written - begun >= kWriteBehind) {
-      files.writeBehind(target, begun, written);
-      begun = written;
-    }
-    return failure;
+    if (written - begun < kWriteBehind) return 0;
+    return files.writeBehind(target, std::exchange(begun, written), written);
   });
 }
 

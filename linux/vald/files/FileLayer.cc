@@ -149,13 +149,21 @@ int FileLayer::removeFolder(int at, const std::string& name) {
   return result([&] { return ::unlinkat(at, name.c_str(), AT_REMOVEDIR); });
 }
 
-void FileLayer::writeBehind(int file, std::uint64_t from, std::uint64_t to) {
-  ::sync_file_range(file, static_cast<off64_t>(from), static_cast<off64_t>(to - from),
-                    SYNC_FILE_RANGE_WRITE);
-  if (from == 0) return;
-  ::sync_file_range(
-      file, 0, static_cast<off64_t>(from),
-      SYNC_FILE_RANGE_WAIT_BEFORE | SYNC_FILE_RANGE_WRITE | SYNC_FILE_RANGE_WAIT_AFTER);
+int FileLayer::writeBehind(int file, std::uint64_t from, std::uint64_t to) {
+  if (const int fault = beforeStep(FileStep::Sync, {})) return fault;
+  int failure = result([&] {
+    return ::sync_file_range(file, static_cast<off64_t>(from), static_cast<off64_t>(to - from),
+                             SYNC_FILE_RANGE_WRITE);
+  });
+  if (failure == 0 && from > 0) {
+    failure = result([&] {
+      return ::sync_file_range(
+          file, 0, static_cast<off64_t>(from),
+          SYNC_FILE_RANGE_WAIT_BEFORE | SYNC_FILE_RANGE_WRITE | SYNC_FILE_RANGE_WAIT_AFTER);
+    });
+  }
+  // Where there is no such thing, the sync does it all.
+  return failure == EINVAL || failure == ENOSYS || failure == EOPNOTSUPP ? 0 : failure;
 }
 
 int FileLayer::sync(int file) {

@@ -71,8 +71,8 @@ class FileLayer {
   int removeFolder(int at, const std::string& name);
   // While a large file is written: has the disk begin with the bytes `from` to `to`, and waits
   // for those before. Nothing piles up then that a sync, or whoever needs the file's lock, has
-  // to wait for. No step of its own: it changes nothing.
-  void writeBehind(int file, std::uint64_t from, std::uint64_t to);
+  // to wait for. An error of the disk that is told here is not told again by the sync.
+  int writeBehind(int file, std::uint64_t from, std::uint64_t to);
   // A file or folder. A file system that has nothing to say about folders is no failure.
   int sync(int file);
   // Everything that is pending on the file system of `file`.

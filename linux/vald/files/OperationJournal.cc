@@ -95,8 +95,7 @@ std::unique_ptr<OperationJournal> OperationJournal::open(const std::string& data
 
   MutexLock lock(journal->_mutex);
   int version = 0;
-  // Nobody else reads it: without locks an entry costs half as much. The lock that keeps others
-  // out is taken with the first access.
+  // Nobody else reads it, so one lock, taken with the first access, stands for all.
   int code = journal->run("PRAGMA locking_mode = EXCLUSIVE; PRAGMA journal_mode = WAL");
   if (code == SQLITE_OK) {
     sqlite3_stmt* statement = nullptr;

@@ -36,8 +36,8 @@ std::vector<std::string> splitTags(const std::string& value);
 // The entry's tags. `path` is named by errors. Links are not followed.
 TagResult readTags(const DirectoryHandle& folder, const std::string& name, const std::string& path);
 // Replaces the whole set, in one step that is on the disk when this returns; no names
-// removes the attribute. `written` (or null) is called between the two, unless the file had
-// exactly these.
+// removes the attribute. `written` (or null) is called between the two. What the file has
+// already is neither written nor waited for.
 TagResult writeTags(FileLayer& files, const DirectoryHandle& folder, const std::string& name,
                     const std::string& path, const std::vector<std::string>& names,
                     const std::function<void()>& written);

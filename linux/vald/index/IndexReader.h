@@ -36,10 +36,7 @@ class IndexReader {
     _roots.reset();
     _database->beginReading();
   }
-  void end() {
-    if (!_database->failed()) _database->commit();
-    _database->rollback();
-  }
+  void end() { _database->commit(); }
   bool failed() const { return _database->failed(); }
   const std::string& message() const { return _database->message(); }
 
