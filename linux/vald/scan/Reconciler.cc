@@ -235,8 +235,9 @@ void Reconciler::vanished(const ItemRow& seen) {
           !other.state.key.names(row->state.key)) {
         continue;
       }
-      // The younger of the two links goes: the other is who it was.
-      if (row->seen > other.seen) continue;
+      // The younger of the two links goes: the other is who it was. So it is when both came in
+      // the same millisecond: what stays is not renumbered without a reason.
+      if (row->seen >= other.seen) continue;
       if (whereabouts(other, there) != Whereabouts::StillThere) continue;
       _journal.bury(other, _now);
       recordDeparture(*row, {other.parent, other.name});
