@@ -156,11 +156,7 @@ void Daemon::getContainerURLForID(
     if (error) return answerError(reply, error);
     if (recreated) {
       // It is another folder than the one that was there, and looked up next.
-      std::vector<StoreRoot> roots = self->_parts.containers.storeRoots();
-      std::vector<StoreRoot> others = roots;
-      std::erase_if(others, [&](const auto& root) { return root.containerID == containerID; });
-      self->_parts.store.setContainers(std::move(others));
-      self->_parts.store.setContainers(std::move(roots));
+      self->_parts.store.setContainers(self->_parts.containers.storeRoots());
       // So that it is in the index then; where that fails, the lookup says so.
       self->_parts.store.itemAtPath(container.documentsURL->path(), /*scanFirst=*/true, nullptr);
     }

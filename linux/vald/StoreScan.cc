@@ -5,6 +5,7 @@
 #include <iterator>
 
 #include "linux/vald/StoreWriter.h"
+#include "linux/vald/files/StoreRoots.h"
 #include "linux/vald/index/IndexFile.h"
 #include "linux/vald/scan/DocumentNumbers.h"
 #include "linux/vald/scan/StoreNames.h"
@@ -22,6 +23,15 @@ constexpr int kPagesOfBulk = 8000;
 
 bool isSameRoot(const FileKey& a, const FileKey& b) {
   return a.inode == b.inode && a.generation == b.generation;
+}
+
+// Whether the folder that stands in the place of an app's was made anew, by whomever; it is
+// the container's from then on, and what was in the old one is gone. Where a volume is
+// mounted or was unmounted, and for the drive's own folder, nothing is concluded.
+bool wasMadeAnew(const TreeRoot& root, const std::optional<RootFolder>& found) {
+  return root.containerID && found && !isSameRoot(found->key, root.folder.key) &&
+         !isMountPoint(root.folder.path, found->device) &&
+         (root.folder.device == 0 || root.folder.device == found->device);
 }
 
 }  // namespace
@@ -86,10 +96,14 @@ void StoreWriter::load() {
 void StoreWriter::setContainers(const std::vector<StoreRoot>& containers) {
   _options.containers = containers;
   const auto wanted = [&](const TreeRoot& root) {
-    return !root.containerID ||
-           std::any_of(containers.begin(), containers.end(), [&](const StoreRoot& container) {
-             return container.containerID == root.containerID && container.path == root.folder.path;
-           });
+    if (!root.containerID) return true;
+    int error = 0;
+    return std::any_of(containers.begin(), containers.end(),
+                       [&](const StoreRoot& container) {
+                         return container.containerID == root.containerID &&
+                                container.path == root.folder.path;
+                       }) &&
+           !wasMadeAnew(root, findRoot(root.folder.path, error));
   };
   std::vector<FolderKey> unwanted;
   for (const auto& [folder, root] : _folders.roots()) {
@@ -160,6 +174,7 @@ void StoreWriter::setContainers(const std::vector<StoreRoot>& containers) {
 
 void StoreWriter::checkRoots() {
   bool isBack = false;
+  bool isAnew = false;
   for (auto& [folder, root] : _folders.roots()) {
     int error = 0;
     const auto found = findRoot(root.folder.path, error);
@@ -170,6 +185,8 @@ void StoreWriter::checkRoots() {
       root.folder.key = found->key;
       isBack = true;
       VL_NOTICE(_log, "[NOTICE] %@ is back", root.folder.path);
+    } else if (wasMadeAnew(root, found)) {
+      isAnew = true;
     } else if (!isThere && !root.isLost) {
       VL_ERROR(_log,
                "[ERROR] %@ is missing: deleted, renamed or unmounted. Nothing is taken for "
@@ -178,7 +195,20 @@ void StoreWriter::checkRoots() {
     }
     root.isLost = !isThere;
   }
+  for (const StoreRoot& container : _options.containers) {
+    int error = 0;
+    const bool isKnown = std::any_of(
+        _folders.roots().begin(), _folders.roots().end(),
+        [&](const auto& root) { return root.second.containerID == container.containerID; });
+    if (!isKnown && findRoot(container.path, error)) isAnew = true;  // it could not be opened
+  }
   if (isBack) startRound(LocalDaemonStatus::Scan::Rescanning);
+  // In the middle of other work it waits for the next look, which is soon.
+  if (isAnew && !_inTransaction) {
+    VL_NOTICE(_log, "[NOTICE] an app's container is there anew; the drive goes on with it");
+    setContainers(_options.containers);
+    return;
+  }
   checkTrashes(false);
 }
 

@@ -171,6 +171,57 @@ TEST_F(StoreListing, ContainersAreListedAtTheRootAndJournalled) {
   std::filesystem::remove_all(container);
 }
 
+// By vald or by anybody else, while the store is open or not. A folder that is merely away
+// is waited for.
+TEST_F(StoreListing, AContainersFolderThatWasMadeAnewIsTheContainerFromThenOn) {
+  const std::string container = root + "-app";
+  const auto makeAnew = [&](const char* file) {
+    std::filesystem::remove_all(container);
+    std::filesystem::create_directory(container);
+    std::ofstream(container + '/' + file) << "x";
+  };
+  const auto inside = [&] {
+    const VLQueryItemPtr folder = store->itemAtPath(container, false, nullptr);
+    std::vector<std::string> names;
+    if (folder == nullptr) return names;
+    for (const auto& item :
+         store->listFolder(folder->fileObjectID(), SortOrder::Name, 0, 10, nullptr).items) {
+      names.push_back(item->filename());
+    }
+    return names;
+  };
+  const auto becomes = [&](const std::vector<std::string>& wanted) {
+    const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(20);
+    while (inside() != wanted && std::chrono::steady_clock::now() < deadline) {
+      store->settle(std::chrono::seconds(1));
+    }
+    return inside() == wanted;
+  };
+  makeAnew("first");
+  options.containers = {{container, "com.example.Notes", "Notes"}};
+  open();
+  EXPECT_TRUE(becomes({"first"}));
+  makeAnew("second");
+  EXPECT_TRUE(becomes({"second"}));
+  makeAnew("third");
+  store->setContainers(options.containers);
+  EXPECT_TRUE(becomes({"third"}));
+  close();
+  makeAnew("fourth");
+  open();
+  EXPECT_TRUE(becomes({"fourth"}));
+
+  const VLQueryItemPtr kept = store->itemAtPath(container + "/fourth", false, nullptr);
+  ASSERT_NE(kept, nullptr);
+  std::filesystem::rename(container, container + "-away");
+  store->setContainers(options.containers);
+  EXPECT_NE(store->itemWithID(kept->fileObjectID(), nullptr), nullptr);
+  std::filesystem::rename(container + "-away", container);
+  EXPECT_TRUE(becomes({"fourth"}));
+  EXPECT_NE(store->itemWithID(kept->fileObjectID(), nullptr), nullptr);
+  std::filesystem::remove_all(container);
+}
+
 TEST_F(StoreListing, AnIndexThatIsNoneIsKeptAsideAndMadeAnew) {
   write("doc");
   std::ofstream(options.databasePath) << std::string(20'000, 'z');

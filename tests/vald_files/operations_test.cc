@@ -120,6 +120,29 @@ TEST(Operations, NeverFollowALinkOutOfTheStore) {
   EXPECT_EQ(TestDrive::get(drive.outside + "/secret"), "s");
 }
 
+TEST(Operations, AnAppsFolderThatWasMadeAnewIsTheOneThatIsChangedAndTheDrivesIsNot) {
+  TestDrive drive;
+  FileOperations& operations = drive.open();
+  const std::string app = drive.top + "/app";
+  std::filesystem::create_directory(app);
+  ASSERT_EQ(operations.setRoots({drive.store, app}), nullptr);
+  const auto placed = [&](const std::string& folder) {
+    StorePlace place;
+    EXPECT_EQ(operations.roots().locate(folder + "/name", place), nullptr);
+    struct stat there {};
+    struct stat held {};
+    EXPECT_EQ(::stat(folder.c_str(), &there), 0);
+    EXPECT_EQ(place.folder.status(held), 0);
+    return there.st_ino == held.st_ino;
+  };
+  for (const std::string& folder : {app, drive.store}) {
+    EXPECT_TRUE(placed(folder));
+    std::filesystem::rename(folder, folder + "-away");
+    std::filesystem::create_directory(folder);
+    EXPECT_EQ(placed(folder), folder == app);
+  }
+}
+
 TEST(Import, KeepsATreeAsItIsWithProgressAndCancelsWithoutATrace) {
   TestDrive drive;
   FileOperations& files = drive.open();

@@ -1,5 +1,6 @@
 #include "linux/vald/files/StoreRoots.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <utility>
 
@@ -24,6 +25,11 @@ bool isPlain(const std::string& relative) {
 
 }  // namespace
 
+bool isMountPoint(const std::string& path, dev_t device) {
+  struct stat parent {};
+  return stat((path + "/..").c_str(), &parent) != 0 || parent.st_dev != device;
+}
+
 std::string StorePlace::path() const {
   return relative.empty() ? root->path : joinPath(root->path, relative);
 }
@@ -36,6 +42,7 @@ NSErrorPtr StoreRoots::set(const std::vector<std::string>& paths) {
   std::vector<std::shared_ptr<const OpenRoot>> roots;
   for (const std::string& path : paths) {
     auto root = std::make_shared<OpenRoot>();
+    root->mayBeMadeAnew = !roots.empty();
     root->path = withoutTrailingSeparators(path);
     if (const int failure = DirectoryHandle::openRoot(root->path, root->folder)) {
       return fileError(failure, "can't open the folder", path);
@@ -64,6 +71,26 @@ std::shared_ptr<const OpenRoot> StoreRoots::rootOf(const std::string& path) cons
   return found;
 }
 
+std::shared_ptr<const OpenRoot> StoreRoots::current(std::shared_ptr<const OpenRoot> root) const {
+  struct stat known {};
+  struct stat there {};
+  if (!root->mayBeMadeAnew || root->folder.status(known) != 0 ||
+      stat(root->path.c_str(), &there) != 0) {
+    return root;
+  }
+  const bool isSame = known.st_ino == there.st_ino && known.st_dev == there.st_dev;
+  // A deleted folder that is held open keeps its number, but the number of its links is 0.
+  if ((isSame && known.st_nlink != 0) || isMountPoint(root->path, there.st_dev)) return root;
+  auto anew = std::make_shared<OpenRoot>();
+  anew->path = root->path;
+  anew->mayBeMadeAnew = true;
+  if (DirectoryHandle::openRoot(root->path, anew->folder) != 0) return root;
+  MutexLock lock(_mutex);
+  const auto place = std::find(_roots.begin(), _roots.end(), root);
+  if (place != _roots.end()) *place = anew;
+  return anew;
+}
+
 bool StoreRoots::contains(const std::string& path) const { return rootOf(path) != nullptr; }
 
 NSErrorPtr StoreRoots::locate(const std::string& given, StorePlace& place) const {
@@ -73,6 +100,7 @@ NSErrorPtr StoreRoots::locate(const std::string& given, StorePlace& place) const
     return fileErrorWithWords(NSFileWriteNoPermissionError, EACCES,
                               "\"" + printable(path) + "\" is not in the drive", path);
   }
+  root = current(std::move(root));
   std::string relative = path.substr(root->path.size());
   if (!relative.empty() && relative.front() == '/') relative.erase(0, 1);
   if (!isPlain(relative)) {
