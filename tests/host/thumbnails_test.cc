@@ -8,6 +8,7 @@
 #include "base/ThreadPool.h"
 #include "linux/host/ThumbnailStream.h"
 #include "tests/host/HostFixture.h"
+#include "tests/protocol/Waiting.h"
 
 namespace skein {
 namespace {
@@ -77,11 +78,16 @@ TEST(ThumbnailsOfThreads, WhoBringsMoreThanFitsWaitsUntilItIsTakenOrNotWanted) {
     }
   });
   for (std::size_t taken = 0; taken < 2;) {
-    std::promise<std::size_t> came;
-    stream->next([&](const HostThumbnailStep& step, const NSErrorPtr&) {
-      came.set_value(step.thumbnails.size());
+    const auto came = std::make_shared<std::promise<std::size_t>>();
+    stream->next([came](const HostThumbnailStep& step, const NSErrorPtr&) {
+      came->set_value(step.thumbnails.size());
     });
-    taken += came.get_future().get();
+    auto count = came->get_future();
+    if (count.wait_until(testDeadline()) != std::future_status::ready) {
+      ADD_FAILURE() << "nothing came after " << taken;
+      break;
+    }
+    taken += count.get();
     // There is no room for two of them.
     EXPECT_LE(brought, taken + 1);
   }

@@ -6,6 +6,7 @@
 #include <thread>
 
 #include "linux/vald/files/FileCoordinator.h"
+#include "tests/protocol/Waiting.h"
 #include "tests/vald_files/FilesFixture.h"
 
 namespace skein::vald {
@@ -38,10 +39,11 @@ TEST(Coordinator, OverlappingPathsFollowEachOtherInOrder) {
     served.set_value();
   });
   // It is in line once a name beside the held one is refused.
-  while (coordinator.claim({"/s/folder/z"}, now, other) == nullptr) {
-    other.release();
-    std::this_thread::yield();
-  }
+  EXPECT_TRUE(becomesTrue([&] {
+    const bool isFree = coordinator.claim({"/s/folder/z"}, now, other) == nullptr;
+    if (isFree) other.release();
+    return !isFree;
+  }));
   held.release();
   EXPECT_EQ(served.get_future().wait_for(std::chrono::seconds(30)), std::future_status::ready);
   waiter.join();
