@@ -38,7 +38,7 @@ enum class RenderStatus : std::uint32_t {
   Failed,       // reading the document or writing the picture
 };
 
-inline constexpr std::uint32_t kRenderVersion = 1;
+inline constexpr std::uint32_t kRenderVersion = 2;
 inline constexpr std::uint32_t kLargestSide = 1024;
 inline constexpr std::uint64_t kMostPictureBytes = 16 << 20;
 inline constexpr std::size_t kRequestDescriptors = 2;
@@ -47,9 +47,8 @@ inline constexpr std::uint64_t kWorkerSeconds = 600;
 
 struct Greeting {
   std::uint32_t version = kRenderVersion;
-  std::uint32_t isFiltered = 0;  // 1: a filter of system calls is in place
-  std::uint32_t hasFonts = 0;    // 1: it can draw letters in pages
-  std::uint32_t kinds = 0;       // bit 1 << kind: there is a loader for it
+  std::uint32_t hasFonts = 0;  // 1: it can draw letters in pages
+  std::uint32_t kinds = 0;     // bit 1 << kind: there is a loader for it
 };
 
 struct RenderRequest {

@@ -6,9 +6,8 @@
 namespace skein::thumbnailer {
 
 struct LockDown {
-  std::string problem;      // empty, or what could not be done: then nothing may be decoded
-  bool isFiltered = false;  // system calls are; only where there is a filter for the processor
-  bool hasFonts = false;    // fonts can still be opened; only where the kernel has Landlock
+  std::string problem;    // empty, or what could not be done: then nothing may be decoded
+  bool hasFonts = false;  // fonts can still be opened; only where the kernel has Landlock
 };
 
 // Takes from this process, for good, what decoding does not need: a time of the processor

@@ -26,9 +26,9 @@ namespace {
 using Clock = std::chrono::steady_clock;
 
 constexpr int kWorkerSocket = 3;
-// A process that served so many has earned its rest: whatever a document left behind in its
-// memory goes with it.
-constexpr std::uint64_t kMostJobs = 500;
+// A document that takes a process over can forge the pictures of those that come after it, and
+// see them; so these are few.
+constexpr std::uint64_t kMostJobs = 8;
 constexpr std::uint64_t kMostSeconds = kWorkerSeconds / 2;
 
 // Nothing of this process's own surroundings, which may name files to load.

@@ -80,24 +80,15 @@ struct ThumbnailRenderer::Core : std::enable_shared_from_this<Core> {
     MutexLock lock(mutex);
     ++alive;
     const Greeting& greeting = (*worker)->greeting();
-    const bool tells = !toldOfGaps && (greeting.isFiltered == 0 || greeting.hasFonts == 0);
+    const bool tells = !toldOfGaps && greeting.hasFonts == 0;
     if (tells) toldOfGaps = true;
     lock.unlock();
-    if (tells) tellOfGaps(greeting);
-    return worker;
-  }
-
-  void tellOfGaps(const Greeting& greeting) {
-    if (greeting.isFiltered == 0) {
-      VL_NOTICE(log,
-                "[NOTICE] documents are drawn without a filter of system calls: there is none "
-                "for this kind of processor");
-    }
-    if (greeting.hasFonts == 0) {
+    if (tells) {
       VL_NOTICE(log,
                 "[NOTICE] documents are drawn without fonts: the kernel cannot confine files "
                 "(Landlock), or there are no fonts");
     }
+    return worker;
   }
 
   void forget(WorkerPtr& worker) SKEIN_EXCLUDES(mutex) {
