@@ -21,7 +21,8 @@ std::shared_ptr<NSProgress> Files::download(NSURLPtr url, bool, Reply<NSErrorPtr
 
 void Files::startDownload(const std::string& path, const std::shared_ptr<NSProgress>& progress,
                           Reply<NSErrorPtr> reply) {
-  const DocumentPlace place = findDocument(_parts.operations.roots(), path);
+  const Subject subject = subjectAt(path);
+  const DocumentPlace& place = subject.place;
   if (!place.isEvicted()) {
     StorePlace there;
     NSErrorPtr error = _parts.operations.roots().locate(path, there);
@@ -35,6 +36,7 @@ void Files::startDownload(const std::string& path, const std::shared_ptr<NSProgr
   Downloader::Request request;
   request.document = place.marker->document;
   request.path = place.path;
+  request.isCopy = subject.item && subject.item->fileObjectID() != request.document;
   request.progress = [weak = std::weak_ptr<NSProgress>(progress)](std::uint64_t bytes,
                                                                   std::uint64_t) {
     const auto told = weak.lock();

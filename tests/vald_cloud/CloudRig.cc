@@ -85,6 +85,11 @@ TemporaryFolder::~TemporaryFolder() {
   std::filesystem::remove_all(_path, ignored);
 }
 
+int RecordingFileLayer::beforeStep(FileStep step, std::string_view name) {
+  if (before) before(step, name);
+  return FaultyFileLayer::beforeStep(step, name);
+}
+
 CloudRig::CloudRig(std::filesystem::path where) : top(std::move(where)) {
   std::filesystem::create_directories(top / "drive");
   EXPECT_EQ(brief(roots.set({(top / "drive").string()})), "none");
@@ -123,7 +128,7 @@ NSErrorPtr CloudRig::evict(VLFileObjectID document, const std::string& path) {
 }
 
 NSErrorPtr CloudRig::download(VLFileObjectID document, const std::string& path) {
-  return DownloadTransfer(places(), conditions, clock, document, path, nullptr).run();
+  return DownloadTransfer(places(), conditions, clock, document, path, false, nullptr).run();
 }
 
 std::vector<std::string> CloudRig::names() const {

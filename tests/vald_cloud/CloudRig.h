@@ -60,6 +60,15 @@ class TemporaryFolder {
   std::filesystem::path _path;
 };
 
+// Tells of each step before it is taken: which, and of what.
+class RecordingFileLayer final : public FaultyFileLayer {
+ public:
+  std::function<void(FileStep, std::string_view)> before;
+
+ protected:
+  int beforeStep(FileStep step, std::string_view name) override;
+};
+
 // What one process has open of a cloud. `top`/drive is the store, `top`/cloud the cloud.
 struct CloudRig {
   explicit CloudRig(std::filesystem::path top);
@@ -78,7 +87,7 @@ struct CloudRig {
   std::vector<std::string> names() const;
 
   const std::filesystem::path top;
-  FaultyFileLayer files;
+  RecordingFileLayer files;
   StoreRoots roots;
   std::unique_ptr<CloudContents> contents;
   std::unique_ptr<CloudRecords> records;

@@ -30,7 +30,7 @@ class DownloadTest : public testing::Test {
   };
   Downloader::Request request(std::uint64_t number, const std::string& path, Answer& answer,
                               DownloadTransfer::Progress progress = nullptr) {
-    return {documentNumber(number), path, std::move(progress), [&answer](NSErrorPtr error) {
+    return {documentNumber(number), path, false, std::move(progress), [&answer](NSErrorPtr error) {
               answer.error = brief(error);
               ++answer.times;
               answer.came.set();
@@ -147,7 +147,7 @@ TEST_F(DownloadTest, ACloudThatFailsLeavesTheMarkerAlone) {
     rig.conditions.change([](Settings& settings) { settings = {}; });
   }
   // Removed, or moved, while it comes.
-  DownloadTransfer transfer(rig.places(), rig.conditions, rig.clock, documentNumber(1), path,
+  DownloadTransfer transfer(rig.places(), rig.conditions, rig.clock, documentNumber(1), path, false,
                             [&](std::uint64_t bytes, std::uint64_t) {
                               if (bytes == kSize) {
                                 std::filesystem::rename(rig.top / "drive/.1.skein",

@@ -1,6 +1,8 @@
 // Out to the cloud and back: what may go, why something may not, what comes back.
 #include <fcntl.h>
 #include <sys/stat.h>
+#include <sys/xattr.h>
+#include <unistd.h>
 
 #include <fstream>
 
@@ -141,15 +143,151 @@ TEST_F(EvictionTest, WhatIsNotSafeStaysWithTheReason) {
   EXPECT_EQ(refusal(path), code(EvictionRefusal::ChangedSinceUpload));
   ASSERT_TRUE(std::holds_alternative<UploadDone>(rig.upload(kDocument, path)));
 
-  std::filesystem::remove_all(rig.top / "cloud/objects");
-  std::filesystem::create_directory(rig.top / "cloud/objects");
-  EXPECT_EQ(refusal(path), code(EvictionRefusal::NotUploaded));
+  // A program that runs with its owner's rights: no marker gives them back.
+  ASSERT_EQ(chmod(path.c_str(), 04755), 0);
+  ASSERT_TRUE(std::holds_alternative<UploadDone>(rig.upload(kDocument, path)));
+  EXPECT_EQ(refusal(path), code(EvictionRefusal::NotADocument));
+  ASSERT_EQ(chmod(path.c_str(), 0644), 0);
 
   std::filesystem::create_directory(rig.top / "drive/folder");
   std::filesystem::create_symlink(path, rig.top / "drive/link");
   EXPECT_EQ(refusal((rig.top / "drive/folder").string()), code(EvictionRefusal::NotADocument));
   EXPECT_EQ(refusal((rig.top / "drive/link").string()), code(EvictionRefusal::NotADocument));
   EXPECT_EQ(refusal((rig.top / "drive/nothing").string()), "NSCocoaErrorDomain 4");
+}
+
+TEST_F(EvictionTest, TheCloudsCopyIsVerifiedAndMendedBeforeTheFileGoes) {
+  const std::string path = uploaded("a", "the document");
+  const std::string hash = (*rig.records->record(kDocument))->contents.hash.asString();
+  const auto object = rig.top / "cloud/objects" / hash.substr(0, 2) / hash;
+  const auto spoil = [&] {
+    std::filesystem::permissions(object, std::filesystem::perms::owner_all);
+    std::ofstream(object) << "the docum3nt";  // as long as it was
+  };
+  for (const bool lost : {false, true}) {
+    spoil();
+    if (lost) std::filesystem::remove(object);
+    ASSERT_EQ(brief(rig.evict(kDocument, path)), "none");
+    EXPECT_EQ(contentsOf(object), "the document");
+    ASSERT_EQ(brief(rig.download(kDocument, path)), "none");
+    EXPECT_EQ(contentsOf(path), "the document");
+  }
+  // Nor does an upload believe a copy for its length: not another document's either.
+  spoil();
+  const std::string twin = rig.write("twin", "the document");
+  ASSERT_TRUE(std::holds_alternative<UploadDone>(rig.upload(documentNumber(9), twin)));
+  EXPECT_EQ(contentsOf(object), "the document");
+  spoil();
+  setTags(path, "red");
+  ASSERT_TRUE(std::holds_alternative<UploadDone>(rig.upload(kDocument, path)));
+  EXPECT_EQ(contentsOf(object), "the document");
+
+  // The file is no longer what was uploaded, and what was uploaded is lost: it stays.
+  spoil();
+  std::ofstream(path) << "other words";
+  EXPECT_EQ(refusal(path), code(EvictionRefusal::NotUploaded));
+}
+
+TEST_F(EvictionTest, OnlyAMarkerThatWasMadeHereIsServed) {
+  const std::string path = uploaded("a", "a secret");
+  ASSERT_EQ(brief(rig.evict(kDocument, path)), "none");
+  const std::string marker = (rig.top / "drive/.a.skein").string();
+  const std::string text = contentsOf(marker);
+  const auto served = [&](const std::string& changed) {
+    std::ofstream(marker) << changed;
+    const std::string answer = brief(rig.download(kDocument, path));
+    if (answer == "none") {
+      EXPECT_EQ(contentsOf(path), "a secret");
+      EXPECT_TRUE(std::holds_alternative<UploadDone>(rig.upload(kDocument, path)));
+      EXPECT_EQ(brief(rig.evict(kDocument, path)), "none");
+    } else {
+      EXPECT_EQ(rig.names(), std::vector<std::string>{".a.skein"});
+    }
+    return answer;
+  };
+  const auto with = [&](const std::string& from, const std::string& to) {
+    std::string changed = text;
+    changed.replace(changed.find(from), from.size(), to);
+    return changed;
+  };
+  EXPECT_EQ(served(text), "none");
+  EXPECT_EQ(served(with("mode 6", "mode 7")), "NSCocoaErrorDomain 259");
+  EXPECT_EQ(served(with("size 8", "size 9")), "NSCocoaErrorDomain 259");
+  EXPECT_EQ(served(with("end\n", "mode 777\nend\n")), "NSCocoaErrorDomain 259");
+  // One without a seal needs the record that it speaks of.
+  const std::string bare = EvictionMarker::parse(text)->asText();
+  EXPECT_EQ(served(bare), "none");
+  std::string endless = bare;
+  endless.replace(endless.find("size 8"), 6, "size 9000000000000000000");
+  EXPECT_EQ(served(endless), "NSCocoaErrorDomain 259");
+  ASSERT_EQ(brief(rig.records->remove(kDocument)), "none");
+  EXPECT_EQ(served(bare), "NSCocoaErrorDomain 259");
+  EXPECT_EQ(served(text), "none");
+  if (geteuid() != 0) return;
+  std::ofstream(marker) << text;
+  ASSERT_EQ(chown(marker.c_str(), 12345, 12345), 0);
+  EXPECT_EQ(brief(rig.download(kDocument, path)), "NSCocoaErrorDomain 259");
+}
+
+TEST_F(EvictionTest, GroupListsHolesAndFarDatesComeBack) {
+  const std::string path = rig.write("a", "words");
+  std::filesystem::resize_file(path, 40 << 20);
+  const timespec times[2] = {{1700000001, 5}, {20'000'000'000, 7}};  // after 2262
+  ASSERT_EQ(utimensat(AT_FDCWD, path.c_str(), times, 0), 0);
+  if (geteuid() == 0) {
+    ASSERT_EQ(chown(path.c_str(), -1, 12345), 0);
+  }
+  // user::rw-, user:12345:r--, group::---, mask::r--, other::---
+  const unsigned char list[] = {2, 0,  0,   0,   1,   0,   6,  0, 255, 255, 255, 255, 2,   0,  4,
+                                0, 57, 48,  0,   0,   4,   0,  0, 0,   255, 255, 255, 255, 16, 0,
+                                4, 0,  255, 255, 255, 255, 32, 0, 0,   0,   255, 255, 255, 255};
+  const bool hasLists =
+      setxattr(path.c_str(), "system.posix_acl_access", list, sizeof list, 0) == 0;
+  struct stat before {};
+  struct stat after {};
+  ASSERT_EQ(stat(path.c_str(), &before), 0);
+  ASSERT_TRUE(std::holds_alternative<UploadDone>(rig.upload(kDocument, path)));
+  if (hasLists) {
+    // What the folder gives to new files by default is not the file's.
+    ASSERT_EQ(
+        setxattr((rig.top / "drive").c_str(), "system.posix_acl_default", list, sizeof list, 0), 0);
+  }
+  ASSERT_EQ(brief(rig.evict(kDocument, path)), "none");
+  ASSERT_EQ(brief(rig.download(kDocument, path)), "none");
+  ASSERT_EQ(stat(path.c_str(), &after), 0);
+  EXPECT_EQ(after.st_size, before.st_size);
+  EXPECT_LE(after.st_blocks, before.st_blocks + 1024);
+  EXPECT_EQ(after.st_gid, before.st_gid);
+  EXPECT_EQ(after.st_mode, before.st_mode);
+  EXPECT_EQ(after.st_mtim.tv_sec, before.st_mtim.tv_sec);
+  EXPECT_EQ(after.st_mtim.tv_nsec, before.st_mtim.tv_nsec);
+  if (!hasLists) return;
+  std::string got(200, '\0');
+  got.resize(std::max<ssize_t>(
+      0, getxattr(path.c_str(), "system.posix_acl_access", got.data(), got.size())));
+  EXPECT_EQ(got, std::string(reinterpret_cast<const char*>(list), sizeof list));
+  // And a file that had none gets none.
+  const std::string plain = rig.write("plain", "words");
+  removexattr(plain.c_str(), "system.posix_acl_access");
+  ASSERT_EQ(chmod(plain.c_str(), 0640), 0);
+  ASSERT_TRUE(std::holds_alternative<UploadDone>(rig.upload(documentNumber(5), plain)));
+  ASSERT_EQ(brief(rig.evict(documentNumber(5), plain)), "none");
+  ASSERT_EQ(brief(rig.download(documentNumber(5), plain)), "none");
+  EXPECT_LT(getxattr(plain.c_str(), "system.posix_acl_access", got.data(), got.size()), 0);
+}
+
+TEST_F(EvictionTest, AStaleMarkerGoesAndAnothersStays) {
+  const std::string path = uploaded("a", "one");
+  ASSERT_EQ(brief(rig.evict(kDocument, path)), "none");
+  rig.write("a", "two, by another program");
+  EXPECT_EQ(refusal(path), code(EvictionRefusal::MarkerNameTaken));  // not uploaded yet
+  ASSERT_TRUE(std::holds_alternative<UploadDone>(rig.upload(documentNumber(4), path)));
+  EXPECT_EQ(brief(rig.evict(documentNumber(4), path)),
+            "SkeinEvictionErrorDomain 8");  // it may be the other document's only trace
+  ASSERT_TRUE(std::holds_alternative<UploadDone>(rig.upload(kDocument, path)));
+  ASSERT_EQ(brief(rig.evict(kDocument, path)), "none");
+  ASSERT_EQ(brief(rig.download(kDocument, path)), "none");
+  EXPECT_EQ(contentsOf(path), "two, by another program");
 }
 
 TEST_F(EvictionTest, AFileThatTookTheNameMeanwhileIsNotTouched) {
@@ -165,20 +303,94 @@ TEST_F(EvictionTest, AFileThatTookTheNameMeanwhileIsNotTouched) {
   EXPECT_EQ(contentsOf(path), "the document");
 }
 
+TEST_F(EvictionTest, AWriterThatOpensJustBeforeTheFileGoesKeepsIt) {
+  const std::string path = uploaded("a", "the document");
+  FileDescriptor held(open(path.c_str(), O_RDONLY | O_CLOEXEC));  // who found it by name
+  std::atomic<int> writer{-1};
+  // Once the file is set aside, in the last sync before it would be removed.
+  rig.files.before = [&](FileStep step, std::string_view) {
+    if (step != FileStep::Sync || !std::filesystem::exists(rig.top / "drive/.a.skein-old")) return;
+    const std::string name = descriptorPath(held.get());
+    // It waits while the lease stands; without waiting it is told so, and the lease breaks.
+    EXPECT_EQ(open(name.c_str(), O_WRONLY | O_NONBLOCK | O_CLOEXEC), -1);
+    EXPECT_EQ(errno, EWOULDBLOCK);
+    ++writer;
+  };
+  EXPECT_EQ(refusal(path), code(EvictionRefusal::OpenForWriting));
+  EXPECT_GE(writer, 0);
+  EXPECT_EQ(rig.names(), std::vector<std::string>{"a"});
+}
+
+TEST_F(EvictionTest, RecoveryComparesContentsAndFindsTheMovedFolder) {
+  const std::string path = uploaded("a", "the document");
+  const auto date = std::filesystem::last_write_time(path);
+  ASSERT_EQ(brief(rig.evict(kDocument, path)), "none");
+  const auto hash = (*rig.records->record(kDocument))->contents.hash;
+  const auto note = [&](const std::string& folder) {
+    StorePlace place;
+    ASSERT_EQ(brief(rig.roots.locate(folder, "a", place)), "none");
+    ASSERT_TRUE(rig.places().beginWork(place, hash));
+  };
+  // A writer of as many bytes, who put the date back.
+  std::filesystem::last_write_time(rig.write(".a.skein-old", "the d0cument"), date);
+  note((rig.top / "drive").string());
+  ASSERT_EQ(brief(recoverUnfinishedWork(rig.places())), "none");
+  EXPECT_EQ(rig.names(), std::vector<std::string>{"a"});
+  EXPECT_EQ(contentsOf(path), "the d0cument");
+  std::filesystem::remove(path);
+
+  // The marker was moved away: the file was about to go, and no second one comes back.
+  rig.write(".a.skein-old", "the document");
+  note((rig.top / "drive").string());
+  ASSERT_EQ(brief(recoverUnfinishedWork(rig.places())), "none");
+  EXPECT_EQ(rig.names(), std::vector<std::string>{});
+
+  // The folder was renamed since, and another has its name.
+  std::filesystem::create_directory(rig.top / "drive/f");
+  std::ofstream(rig.top / "drive/f/.a.skein-old") << "late words";
+  note((rig.top / "drive/f").string());
+  std::filesystem::rename(rig.top / "drive/f", rig.top / "drive/g");
+  std::filesystem::create_directory(rig.top / "drive/f");
+  ASSERT_EQ(brief(recoverUnfinishedWork(rig.places())), "none");
+  EXPECT_EQ(contentsOf((rig.top / "drive/g/a").string()), "late words");
+  EXPECT_TRUE(rig.records->unfinishedWork()->empty());
+
+  // And while the process goes on, what is noted is mended by who comes next.
+  const std::string other = uploaded("a", "words");
+  ASSERT_EQ(brief(rig.evict(kDocument, other)), "none");
+  rig.write(".a.skein-old", "words, more");
+  note((rig.top / "drive").string());
+  EXPECT_EQ(brief(rig.download(kDocument, other)), "none");
+  EXPECT_EQ(contentsOf(other), "words, more");
+}
+
+TEST_F(EvictionTest, AMarkerThatWasCopiedLeavesTheDocumentsStampAlone) {
+  const std::string path = uploaded("a");
+  ASSERT_EQ(brief(rig.evict(kDocument, path)), "none");
+  std::filesystem::copy_file(rig.top / "drive/.a.skein", rig.top / "drive/.b.skein");
+  const std::string copy = (rig.top / "drive/b").string();
+  ASSERT_EQ(brief(DownloadTransfer(rig.places(), rig.conditions, rig.clock, kDocument, copy, true,
+                                   nullptr)
+                      .run()),
+            "none");
+  EXPECT_EQ(contentsOf(copy), "words");
+  EXPECT_FALSE(*rig.records->stamp(kDocument));
+}
+
 TEST_F(EvictionTest, AWriterThatCameAtTheLastMomentKeepsTheFile) {
   // What is left when the process ends between setting the file aside and removing it, and
   // a program that had it open by then wrote to it.
   const std::string path = uploaded("a", "the document");
   ASSERT_EQ(brief(rig.evict(kDocument, path)), "none");
   rig.write(".a.skein-old", "the document, and more");
-  ASSERT_TRUE(rig.records->beginWork(path));
+  ASSERT_TRUE(rig.records->beginWork({0, path, 0, {}}));
   ASSERT_EQ(brief(recoverUnfinishedWork(rig.places())), "none");
   EXPECT_EQ(rig.names(), std::vector<std::string>{"a"});
   EXPECT_EQ(contentsOf(path), "the document, and more");
 
   // And when the name is taken, too, both stay.
   rig.write(".a.skein-old", "third");
-  ASSERT_TRUE(rig.records->beginWork(path));
+  ASSERT_TRUE(rig.records->beginWork({0, path, 0, {}}));
   ASSERT_EQ(brief(recoverUnfinishedWork(rig.places())), "none");
   EXPECT_EQ(rig.names(), (std::vector<std::string>{"a", "a 2"}));
   EXPECT_EQ(rig.records->unfinishedWork()->size(), 0u);
@@ -202,6 +414,8 @@ TEST(EvictionMarkerTest, WhatIsNoMarkerIsNotTakenForOne) {
                                                                    {"size 0", "size -1"},
                                                                    {"hash 0", "hash g"},
                                                                    {"mode 600", "mode 9"},
+                                                                   {"end", "name a%2fb\nend"},
+                                                                   {"end", "name ..\nend"},
                                                                    {"size 0\n", ""}}) {
     std::string wrong = text;
     wrong.replace(wrong.find(from), from.size(), to);

@@ -2,6 +2,7 @@
 
 #include <dirent.h>
 #include <fcntl.h>
+#include <sys/random.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -43,6 +44,42 @@ std::vector<std::string> entries(int folder) {
   return names;
 }
 
+// Reading here, without the cloud's conditions.
+class LocalRead final : public StreamObserver {
+ public:
+  NSErrorPtr didPass(std::uint64_t) override { return nullptr; }
+};
+
+// The key that markers are sealed with; made when there is none, or only a part of one.
+Outcome<std::string> openKey(FileLayer& files, int top, int incoming, const std::string& folder) {
+  constexpr std::size_t kKeySize = 32;
+  constexpr char kName[] = "key";
+  const std::string path = joinPath(folder, kName);
+  std::string key(kKeySize, '\0');
+  const FileDescriptor file(openat(top, kName, O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
+  if (!file && errno != ENOENT) return fileError(errno, "can't open the cloud's key", path);
+  if (file) {
+    struct stat status {};
+    if (fstat(file.get(), &status) != 0) return fileError(errno, "can't read", path);
+    if (!S_ISREG(status.st_mode) || status.st_uid != geteuid()) {
+      return fileError(EACCES, "the cloud's key must be a file of this user's own:", path);
+    }
+    const ssize_t got = pread(file.get(), key.data(), key.size(), 0);
+    if (got < 0) return fileError(errno, "can't read", path);
+    if (static_cast<std::size_t>(got) == key.size()) return key;
+  }
+  if (getrandom(key.data(), key.size(), 0) != static_cast<ssize_t>(key.size())) {
+    return fileError(errno, "can't make the cloud's key", path);
+  }
+  FileDescriptor fresh;
+  int code = files.createFile(incoming, kName, 0600, fresh);
+  if (code == 0) code = files.write(fresh.get(), key);
+  if (code == 0) code = files.sync(fresh.get());
+  if (code == 0) code = files.renameOver(incoming, kName, top, kName);
+  if (code != 0) return fileError(code, "can't make the cloud's key", path);
+  return key;
+}
+
 }  // namespace
 
 CloudContents::Hold::Hold(Hold&& other) noexcept
@@ -82,9 +119,11 @@ Outcome<std::unique_ptr<CloudContents>> CloudContents::open(const std::string& f
       return fileError(code, "can't remove", joinPath(folder + "/incoming", name));
     }
   }
+  auto key = openKey(files, top.get(), incoming.get(), folder);
+  if (!key) return key.error();
   if (const int code = files.sync(top.get())) return fileError(code, "can't make durable", folder);
   return std::unique_ptr<CloudContents>(
-      new CloudContents(folder, files, std::move(objects), std::move(incoming)));
+      new CloudContents(folder, files, std::move(objects), std::move(incoming), std::move(*key)));
 }
 
 Outcome<CloudContents::Added> CloudContents::add(int file, const std::string& name,
@@ -106,7 +145,8 @@ Outcome<CloudContents::Added> CloudContents::add(int file, const std::string& na
   Hold hold;
   if (error == nullptr) {
     hold = takeHold(contents->hash);
-    if (!contains(*contents)) {
+    LocalRead read;
+    if (!contains(*contents) || verify(contents->hash, read) != nullptr) {
       error = settle(incoming, copy.get(), *contents);
       if (error == nullptr) return Added{*contents, std::move(hold)};
     }

@@ -7,6 +7,7 @@
 #include <optional>
 #include <set>
 #include <string>
+#include <string_view>
 
 #include "base/Mutex.h"
 #include "linux/protocol/FileDescriptor.h"
@@ -22,6 +23,7 @@ namespace skein::vald {
 //
 //   objects/ab/ab12…   one file per contents, never changed once it stands there
 //   incoming/          what is still being written; emptied when the folder is opened
+//   key                32 bytes by chance, which markers are sealed with
 //
 // Contents appear by atomic rename when they are durable. Any thread; calls block.
 class CloudContents {
@@ -52,11 +54,15 @@ class CloudContents {
   static Outcome<std::unique_ptr<CloudContents>> open(const std::string& folder, FileLayer& files);
 
   // Takes in a copy of `file`, from its start; shares its blocks where the file system can.
-  // `name` is for errors.
+  // `name` is for errors. Contents that are there already are verified, and replaced when they
+  // are damaged.
   Outcome<Added> add(int file, const std::string& name, StreamObserver& observer)
       SKEIN_EXCLUDES(_mutex);
   // Holds contents that are there with this size; an empty optional when they are not.
   std::optional<Hold> hold(const HashedContents& contents) SKEIN_EXCLUDES(_mutex);
+
+  // The seal of a marker's text; only this cloud makes the same.
+  ContentHash seal(std::string_view text) const { return keyedHash(_key, text); }
 
   // For reading; NSCocoaErrorDomain 4 when there are no such contents.
   Outcome<FileDescriptor> read(const ContentHash& hash) const;
@@ -73,11 +79,12 @@ class CloudContents {
 
  private:
   CloudContents(std::string folder, FileLayer& files, FileDescriptor objects,
-                FileDescriptor incoming)
+                FileDescriptor incoming, std::string key)
       : _folder(std::move(folder)),
         _files(files),
         _objects(std::move(objects)),
-        _incoming(std::move(incoming)) {}
+        _incoming(std::move(incoming)),
+        _key(std::move(key)) {}
 
   // Waits while the contents are being collected.
   Hold takeHold(const ContentHash& hash) SKEIN_EXCLUDES(_mutex);
@@ -98,6 +105,7 @@ class CloudContents {
   FileLayer& _files;
   const FileDescriptor _objects;
   const FileDescriptor _incoming;
+  const std::string _key;
 
   Mutex _mutex;
   CondVar _collected;

@@ -1,14 +1,23 @@
 #include "linux/vald/cloud/CloudPlaces.h"
 
+#include <sys/stat.h>
+
+#include "linux/vald/cloud/CloudErrors.h"
 #include "linux/vald/files/FileErrors.h"
 
 namespace skein::vald {
 
-Outcome<CloudRecords::Work> CloudPlaces::beginWork(const std::string& path) const {
+Outcome<CloudRecords::Work> CloudPlaces::beginWork(const StorePlace& place,
+                                                   const ContentHash& contents) const {
+  const std::string path = place.path();
+  struct stat folder {};
+  if (const int code = place.folder.status(folder)) {
+    return fileError(code, "can't look at the folder of", path);
+  }
   if (const int code = files.step(FileStep::JournalBegin, path)) {
     return fileError(code, "can't note the work on", path);
   }
-  return records.beginWork(path);
+  return records.beginWork({0, path, folder.st_ino, contents});
 }
 
 NSErrorPtr CloudPlaces::endWork(const CloudRecords::Work& work) const {
@@ -16,6 +25,18 @@ NSErrorPtr CloudPlaces::endWork(const CloudRecords::Work& work) const {
     return fileError(code, "can't note the end of the work on", work.path);
   }
   return records.endWork(work);
+}
+
+NSErrorPtr CloudPlaces::refusalOf(const EvictionMarker& marker, const std::string& path) const {
+  if (marker.seal && contents.seal(marker.sealed) == *marker.seal) return nullptr;
+  const auto record = records.record(marker.document);
+  if (!record) return record.error();
+  if (!marker.seal && *record && (*record)->contents.hash == marker.contents.hash) return nullptr;
+  return fileErrorWithWords(NSFileReadCorruptFileError, 0,
+                            "the marker of \"" + printable(path) +
+                                "\" was not made by this drive's cloud, or was changed since; "
+                                "remove it, or get the document where it comes from",
+                            path);
 }
 
 }  // namespace skein::vald

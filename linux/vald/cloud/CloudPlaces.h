@@ -8,6 +8,7 @@
 
 #include "linux/vald/cloud/CloudContents.h"
 #include "linux/vald/cloud/CloudRecords.h"
+#include "linux/vald/cloud/EvictionMarker.h"
 #include "linux/vald/files/FileLayer.h"
 #include "linux/vald/files/StoreRoots.h"
 
@@ -28,8 +29,12 @@ struct CloudPlaces {
   // Notes that something is done at a document's place, for recovery; and that it is done.
   // What cannot be noted must not be begun; an end that is not noted costs a look at the
   // next start.
-  Outcome<CloudRecords::Work> beginWork(const std::string& path) const;
+  Outcome<CloudRecords::Work> beginWork(const StorePlace& place, const ContentHash& contents) const;
   NSErrorPtr endWork(const CloudRecords::Work& work) const;
+
+  // Null when the marker was made here: its seal is right, or its document has a record of
+  // these contents.
+  NSErrorPtr refusalOf(const EvictionMarker& marker, const std::string& path) const;
 };
 
 }  // namespace skein::vald

@@ -24,6 +24,12 @@ constexpr char kSchema1[] = R"sql(
   CREATE TABLE work(number INTEGER PRIMARY KEY, path BLOB NOT NULL);
 )sql";
 
+// What recovery needs to know the file again, wherever its folder is by now.
+constexpr char kSchema2[] = R"sql(
+  ALTER TABLE work ADD COLUMN folder INTEGER NOT NULL DEFAULT 0;
+  ALTER TABLE work ADD COLUMN hash BLOB NOT NULL DEFAULT x'';
+)sql";
+
 constexpr char kColumns[] =
     "SELECT document, zone, owner, hash, size, modified, created, uploaded, revision, thumbnail "
     "FROM records ";
@@ -37,14 +43,17 @@ std::string_view bytesOf(const ContentHash& hash) {
   return {reinterpret_cast<const char*>(hash.bytes().data()), hash.bytes().size()};
 }
 
+ContentHash hashOf(const std::string& bytes) {
+  ContentHash::Bytes hash{};
+  std::memcpy(hash.data(), bytes.data(), std::min(bytes.size(), hash.size()));
+  return ContentHash(hash);
+}
+
 CloudRecord recordOf(const CloudStatement& row) {
   CloudRecord record;
   record.document = VLFileObjectID::documentWithRawID(static_cast<std::uint64_t>(row.integer(0)));
   record.zone = {row.text(1), row.text(2)};
-  ContentHash::Bytes hash{};
-  const std::string bytes = row.text(3);
-  std::memcpy(hash.data(), bytes.data(), std::min(bytes.size(), hash.size()));
-  record.contents = {ContentHash(hash), static_cast<std::uint64_t>(row.integer(4))};
+  record.contents = {hashOf(row.text(3)), static_cast<std::uint64_t>(row.integer(4))};
   record.modified = date(row.integer(5));
   if (!row.isNull(6)) record.created = date(row.integer(6));
   record.uploaded = date(row.integer(7));
@@ -67,7 +76,7 @@ bool countsForQuota(const CloudRecord& record) {
 }  // namespace
 
 Outcome<std::unique_ptr<CloudRecords>> CloudRecords::open(const std::string& path) {
-  auto database = CloudDatabase::open(path, {kSchema1});
+  auto database = CloudDatabase::open(path, {kSchema1, kSchema2});
   if (!database) return database.error();
   std::unique_ptr<CloudRecords> records(new CloudRecords(std::move(*database)));
   if (NSErrorPtr error = records->measure()) return error;
@@ -272,11 +281,15 @@ Outcome<bool> CloudRecords::isPinned(VLFileObjectID document) {
   return pinned;
 }
 
-Outcome<CloudRecords::Work> CloudRecords::beginWork(const std::string& path) {
+Outcome<CloudRecords::Work> CloudRecords::beginWork(Work work) {
   MutexLock lock(_mutex);
-  const auto row = _database->prepare("INSERT INTO work(path) VALUES(?)");
-  if (NSErrorPtr error = row->bindBytes(1, path).run()) return error;
-  return Work{_database->lastInsertedRow(), path};
+  const auto row = _database->prepare("INSERT INTO work(path, folder, hash) VALUES(?, ?, ?)");
+  row->bindBytes(1, work.path)
+      .bind(2, static_cast<std::int64_t>(work.folder))
+      .bindBytes(3, bytesOf(work.contents));
+  if (NSErrorPtr error = row->run()) return error;
+  work.number = _database->lastInsertedRow();
+  return work;
 }
 
 NSErrorPtr CloudRecords::endWork(const Work& work) {
@@ -289,8 +302,11 @@ NSErrorPtr CloudRecords::endWork(const Work& work) {
 Outcome<std::vector<CloudRecords::Work>> CloudRecords::unfinishedWork() {
   MutexLock lock(_mutex);
   std::vector<Work> works;
-  const auto row = _database->prepare("SELECT number, path FROM work ORDER BY number");
-  while (row->step()) works.push_back({row->integer(0), row->text(1)});
+  const auto row =
+      _database->prepare("SELECT number, path, folder, hash FROM work ORDER BY number");
+  while (row->step())
+    works.push_back({row->integer(0), row->text(1), static_cast<std::uint64_t>(row->integer(2)),
+                     hashOf(row->text(3))});
   if (NSErrorPtr error = row->error()) return error;
   return works;
 }

@@ -83,9 +83,11 @@ class CloudRecords {
   // A file whose eviction or download is under way: what recovery looks at after a crash.
   struct Work {
     std::int64_t number = 0;
-    std::string path;  // of the document
+    std::string path;          // of the document
+    std::uint64_t folder = 0;  // the inode of its folder: where it is found after a move
+    ContentHash contents;      // what the marker stands for
   };
-  Outcome<Work> beginWork(const std::string& path) SKEIN_EXCLUDES(_mutex);
+  Outcome<Work> beginWork(Work work) SKEIN_EXCLUDES(_mutex);
   // A power cut may lose it: recovery then finds nothing to do.
   NSErrorPtr endWork(const Work& work) SKEIN_EXCLUDES(_mutex);
   Outcome<std::vector<Work>> unfinishedWork() SKEIN_EXCLUDES(_mutex);

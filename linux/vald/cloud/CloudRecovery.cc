@@ -1,6 +1,7 @@
 #include "linux/vald/cloud/CloudRecovery.h"
 
 #include <cerrno>
+#include <filesystem>
 
 #include "linux/vald/cloud/EvictionMarker.h"
 #include "linux/vald/cloud/UploadStamp.h"
@@ -17,14 +18,17 @@ class WithoutInterruption final : public StreamObserver {
 
 class PlaceRecovery {
  public:
-  PlaceRecovery(const CloudPlaces& places, const StorePlace& place)
-      : _places(places), _place(place), _names(place.name) {}
+  PlaceRecovery(const CloudPlaces& places, const StorePlace& place,
+                const std::optional<ContentHash>& noted)
+      : _places(places), _place(place), _noted(noted), _names(place.name) {}
 
   NSErrorPtr run() {
     if (NSErrorPtr error = remove(_names.part)) return error;
     if (NSErrorPtr error = remove(_names.fresh)) return error;
     auto marker = openMarker(_place.folder, _names.marker, _place.path());
-    if (marker) _marker = marker->marker;
+    if (marker && _places.refusalOf(marker->marker, _place.path()) == nullptr) {
+      _marker = marker->marker;
+    }
     // Without a marker there may still be a file to put back.
     if (_place.folder.exists(_names.aside)) {
       if (NSErrorPtr error = putBack()) return error;
@@ -35,7 +39,8 @@ class PlaceRecovery {
         if (NSErrorPtr error = remove(_names.marker)) return error;
       }
     }
-    const int code = _changed ? _places.files.sync(_place.folder.get()) : 0;
+    // Also what a recovery before this one changed: the note of it ends next.
+    const int code = _places.files.sync(_place.folder.get());
     return code == 0 ? nullptr : failed(code);
   }
 
@@ -44,41 +49,47 @@ class PlaceRecovery {
 
   NSErrorPtr remove(const std::string& name) {
     if (!_place.folder.exists(name)) return nullptr;
-    _changed = true;
     const int code = _places.files.unlink(_place.folder.get(), name);
     return code == 0 || code == ENOENT ? nullptr : failed(code);
   }
 
   int rename(const std::string& from, const std::string& to) {
-    _changed = true;
     const int folder = _place.folder.get();
     return _places.files.renameWithoutReplacing(folder, from, folder, to);
   }
 
   Outcome<bool> isWhatTheMarkerStandsFor(const std::string& name) const {
-    if (!_marker) return false;
+    return _marker ? hasContents(name, _marker->contents.hash, _marker->contents.size)
+                   : Outcome<bool>(false);
+  }
+
+  // Of its contents, and never of its date: who writes can put that back.
+  Outcome<bool> hasContents(const std::string& name, const ContentHash& hash,
+                            std::optional<std::uint64_t> size) const {
     struct stat status {};
     if (const int code = _place.folder.status(name, status)) return failed(code);
-    const auto stamp = UploadStamp::of(status);
-    if (!S_ISREG(status.st_mode) || stamp.size != _marker->contents.size ||
-        stamp.modified != _marker->modified) {
-      return false;
-    }
+    if (!S_ISREG(status.st_mode)) return false;
+    if (size && static_cast<std::uint64_t>(status.st_size) != *size) return false;
     FileDescriptor file;
     if (const int code = _place.folder.openFile(name, file)) return failed(code);
     WithoutInterruption observer;
     const auto contents = hashContents(file.get(), _place.path(), observer);
     if (!contents) return contents.error();
-    return contents->hash == _marker->contents.hash;
+    return contents->hash == hash;
   }
 
   NSErrorPtr putBack() {
     const auto same = isWhatTheMarkerStandsFor(_names.aside);
     if (!same) return same.error();
-    if (_place.folder.exists(_place.name)) {
-      // Somebody made another file of this name. The marker is enough for the same contents.
-      return *same ? remove(_names.aside) : putBackUnderAnotherName();
+    if (!_marker && _noted) {
+      // The marker was on the disk before the file was set aside: it was moved, or removed,
+      // by whoever found the document evicted. Only somebody's late words are put back.
+      const auto isKept = isSafeInTheCloud();
+      if (!isKept) return isKept.error();
+      if (*isKept) return remove(_names.aside);
     }
+    // Somebody made another file of this name.
+    if (_place.folder.exists(_place.name)) return putBackUnderAnotherName();
     // Each step leaves something that the next recovery understands: the same contents may
     // stand beside their marker, other ones may not.
     if (_marker && !*same) {
@@ -88,29 +99,110 @@ class PlaceRecovery {
     return _marker && *same ? remove(_names.marker) : nullptr;
   }
 
+  Outcome<bool> isSafeInTheCloud() const {
+    const auto same = hasContents(_names.aside, *_noted, std::nullopt);
+    if (!same || !*same) return same;
+    WithoutInterruption observer;
+    return _places.contents.verify(*_noted, observer) == nullptr;
+  }
+
   NSErrorPtr putBackUnderAnotherName() {
-    if (_marker) {
-      if (NSErrorPtr error = remove(_names.marker)) return error;
-    }
     constexpr unsigned kMostTries = 1000;
     int code = EEXIST;
     for (unsigned number = 2; code == EEXIST && number < kMostTries; ++number) {
       code = rename(_names.aside, numberedName(_place.name, number, ' '));
     }
-    return code == 0 ? nullptr : failed(code);
+    if (code != 0) return failed(code);
+    return _marker ? remove(_names.marker) : nullptr;
   }
 
   const CloudPlaces& _places;
   const StorePlace& _place;
+  const std::optional<ContentHash> _noted;
   const MarkerNames _names;
   std::optional<EvictionMarker> _marker;
-  bool _changed = false;
 };
+
+// Whether the folder is the one that the note was made of.
+bool isFolderOf(const StorePlace& place, const CloudRecords::Work& work) {
+  struct stat status {};
+  return work.folder == 0 || (place.folder.status(status) == 0 && status.st_ino == work.folder);
+}
+
+// The place of noted work: its path, or, when the folder was moved or renamed since, the
+// folder itself wherever it is. Nil when it is in no root any more.
+Outcome<std::optional<StorePlace>> placeOf(const CloudPlaces& places,
+                                           const CloudRecords::Work& work) {
+  namespace fs = std::filesystem;
+  StorePlace place;
+  NSErrorPtr error = places.roots.locate(work.path, place);
+  if (error == nullptr && isFolderOf(place, work)) return std::optional(std::move(place));
+  if (error != nullptr && error->code() != NSFileNoSuchFileError) return error;
+  for (const auto& root : places.roots.list()) {
+    std::error_code failure;
+    fs::recursive_directory_iterator entry(root->path,
+                                           fs::directory_options::skip_permission_denied, failure);
+    for (; !failure && entry != fs::recursive_directory_iterator(); entry.increment(failure)) {
+      std::error_code ignored;
+      if (!entry->is_directory(ignored) || entry->is_symlink(ignored)) continue;
+      const std::string path = joinPath(entry->path().string(), nameOfPath(work.path));
+      StorePlace moved;
+      if (places.roots.locate(path, moved) == nullptr && isFolderOf(moved, work)) {
+        return std::optional(std::move(moved));
+      }
+    }
+    if (failure) return fileError(failure.value(), "can't look for", work.path);
+  }
+  return error == nullptr ? std::optional(std::move(place)) : std::nullopt;
+}
+
+NSErrorPtr recoverWork(const CloudPlaces& places, const CloudRecords::Work& work) {
+  const auto place = placeOf(places, work);
+  if (!place) return place.error();
+  if (*place) {
+    const auto lock = places.coordinate((*place)->path());
+    if (!lock) return lock.error();
+    if (NSErrorPtr error = recoverPlace(places, **place, work.contents)) return error;
+  }
+  return places.endWork(work);
+}
 
 }  // namespace
 
-NSErrorPtr recoverPlace(const CloudPlaces& places, const StorePlace& place) {
-  return PlaceRecovery(places, place).run();
+NSErrorPtr recoverPlace(const CloudPlaces& places, const StorePlace& place,
+                        const std::optional<ContentHash>& noted) {
+  return PlaceRecovery(places, place, noted).run();
+}
+
+NSErrorPtr recoverNoted(const CloudPlaces& places, const StorePlace& place) {
+  const auto works = places.records.unfinishedWork();
+  if (!works) return works.error();
+  for (const CloudRecords::Work& work : *works) {
+    // The folder may have been moved since the note was made.
+    if (nameOfPath(work.path) != place.name || !isFolderOf(place, work)) continue;
+    if (NSErrorPtr error = recoverPlace(places, place, work.contents)) return error;
+    if (NSErrorPtr error = places.endWork(work)) return error;
+  }
+  return nullptr;
+}
+
+NSErrorPtr removeStaleMarker(const CloudPlaces& places, const StorePlace& place,
+                             VLFileObjectID document) {
+  const MarkerNames names(place.name);
+  if (!place.folder.exists(place.name) || !place.folder.exists(names.marker)) return nullptr;
+  const auto stamp = places.records.stamp(document);
+  if (!stamp) return stamp.error();
+  struct stat status {};
+  if (const int code = place.folder.status(place.name, status)) {
+    return fileError(code, "can't look at", place.path());
+  }
+  // The file counts as the document, and the cloud has what it holds.
+  if (!*stamp || !UploadStamp::of(status).sameButForChanged(**stamp)) return nullptr;
+  const auto marker = openMarker(place.folder, names.marker, place.path());
+  if (!marker || marker->marker.document != document) return nullptr;
+  int code = places.files.unlink(place.folder.get(), names.marker);
+  if (code == 0) code = places.files.sync(place.folder.get());
+  return code == 0 ? nullptr : fileError(code, "can't remove the old marker of", place.path());
 }
 
 NSErrorPtr recoverUnfinishedWork(const CloudPlaces& places) {
@@ -118,15 +210,7 @@ NSErrorPtr recoverUnfinishedWork(const CloudPlaces& places) {
   if (!works) return works.error();
   NSErrorPtr first;
   for (const CloudRecords::Work& work : *works) {
-    StorePlace place;
-    NSErrorPtr error = places.roots.locate(work.path, place);
-    if (error != nullptr && error->code() == NSFileNoSuchFileError) {
-      error = nullptr;
-    } else if (error == nullptr) {
-      const auto lock = places.coordinate(work.path);
-      error = lock ? recoverPlace(places, place) : lock.error();
-    }
-    if (error == nullptr) error = places.endWork(work);
+    NSErrorPtr error = recoverWork(places, work);
     if (first == nullptr) first = error;
   }
   return first;

@@ -1,7 +1,7 @@
 // What a crash, or a step that failed, left of an eviction or a download.
 #pragma once
 
-#include <cstdint>
+#include <optional>
 
 #include "linux/vald/cloud/CloudPlaces.h"
 
@@ -11,13 +11,27 @@ namespace skein::vald {
 // written are removed; a file set aside is put back and its marker removed; a file and a
 // marker that stand for the same contents become the file alone. A file that is none of
 // this system's doing is never touched: a marker beside a file with other contents stays,
-// and a file set aside whose name was taken meanwhile gets another name, unless it is what
-// the marker stands for. Nothing may be under way there. Null when all is in order.
-NSErrorPtr recoverPlace(const CloudPlaces& places, const StorePlace& place);
+// and a file set aside whose name was taken meanwhile gets another name. What stands for what
+// is told by contents. `noted`: what the place's note says of the contents; a file set aside
+// that is just that, whose marker was moved away since, is what the eviction was about to
+// remove, and goes when the cloud's copy is whole. Nothing may be under way there, and its
+// lock is held. Durable when it answers null: then the note may end.
+NSErrorPtr recoverPlace(const CloudPlaces& places, const StorePlace& place,
+                        const std::optional<ContentHash>& noted = std::nullopt);
+
+// The same, with what the notes say, if there are notes of the place; they end.
+NSErrorPtr recoverNoted(const CloudPlaces& places, const StorePlace& place);
+
+// Removes the marker beside a file that is a newer revision of the same document, and
+// uploaded: another program wrote it while the document was evicted. Any other marker stays.
+// The place's lock is held.
+NSErrorPtr removeStaleMarker(const CloudPlaces& places, const StorePlace& place,
+                             VLFileObjectID document);
 
 // The same for everything that was under way when the process ended. At start, before the
 // first eviction or download. Goes on after a place that cannot be mended, which stays noted
-// for the next start, and answers the first error. A folder that is gone is in order.
+// for the next start, and answers the first error. A folder that was moved is looked for; one
+// that is gone is in order.
 NSErrorPtr recoverUnfinishedWork(const CloudPlaces& places);
 
 }  // namespace skein::vald

@@ -1,6 +1,7 @@
 #include "linux/vald/cloud/ContentHash.h"
 
 #include <openssl/evp.h>
+#include <openssl/hmac.h>
 
 #include <stdexcept>
 
@@ -32,6 +33,18 @@ std::string ContentHash::asString() const {
     text += kDigits[byte & 15];
   }
   return text;
+}
+
+ContentHash keyedHash(std::string_view key, std::string_view text) {
+  ContentHash::Bytes bytes{};
+  unsigned int size = 0;
+  if (HMAC(EVP_sha256(), key.data(), static_cast<int>(key.size()),
+           reinterpret_cast<const unsigned char*>(text.data()), text.size(), bytes.data(),
+           &size) == nullptr ||
+      size != bytes.size()) {
+    throw std::runtime_error("the keyed hash failed");
+  }
+  return ContentHash(bytes);
 }
 
 // libcrypto, since it uses the processor's own instructions where there are some: 4 times

@@ -30,6 +30,9 @@ class ContentHash {
   Bytes _bytes{};
 };
 
+// The keyed hash of a short text (HMAC with SHA-256): only who has the key can make it. Any thread.
+ContentHash keyedHash(std::string_view key, std::string_view text);
+
 // Hashes a stream. One thread at a time.
 class ContentHasher {
  public:

@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <cstring>
 #include <utility>
 #include <vector>
 
@@ -14,6 +15,12 @@ namespace skein::vald {
 namespace {
 
 constexpr std::uint64_t kWriteBehind = std::uint64_t{8} << 20;
+
+// A piece of nothing but zeroes needs no block.
+bool isHole(const char* data, std::size_t size) {
+  constexpr std::size_t kBlock = 4096;
+  return size >= kBlock && data[0] == 0 && std::memcmp(data, data + 1, size - 1) == 0;
+}
 
 // `write` answers an errno.
 template <class Write>
@@ -52,12 +59,23 @@ Outcome<HashedContents> copyContents(FileLayer& files, int file, int target,
                                      const std::string& name, StreamObserver& observer) {
   std::uint64_t written = 0;
   std::uint64_t begun = 0;  // so far the disk was asked to write
-  return stream(file, name, observer, [&](const char* data, std::size_t size) {
-    if (const int failure = files.write(target, {data, size})) return failure;
+  bool endsInHole = false;
+  auto copied = stream(file, name, observer, [&](const char* data, std::size_t size) {
+    endsInHole = isHole(data, size);
+    if (endsInHole) {
+      if (lseek(target, static_cast<off_t>(size), SEEK_CUR) < 0) return errno;
+    } else if (const int failure = files.write(target, {data, size})) {
+      return failure;
+    }
     written += size;
     if (written - begun < kWriteBehind) return 0;
     return files.writeBehind(target, std::exchange(begun, written), written);
   });
+  if (copied && endsInHole) {
+    const int failure = files.setLength(target, static_cast<std::int64_t>(written));
+    if (failure != 0) return fileError(failure, "can't write", name);
+  }
+  return copied;
 }
 
 int reserveSpace(FileLayer& files, int file, std::uint64_t size) {

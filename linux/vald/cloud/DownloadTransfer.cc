@@ -32,19 +32,20 @@ class DownloadTransfer::Stream final : public CloudTransfer {
 
 DownloadTransfer::DownloadTransfer(CloudPlaces places, CloudConditions& conditions,
                                    CloudClock& clock, VLFileObjectID document, std::string path,
-                                   Progress progress)
+                                   bool isCopy, Progress progress)
     : _places(std::move(places)),
       _conditions(conditions),
       _clock(clock),
       _document(document),
       _path(std::move(path)),
+      _isCopy(isCopy),
       _progress(std::move(progress)) {}
 
 NSErrorPtr DownloadTransfer::run() {
   if (_cancellation.isCancelled()) return cancelledError();
   if (NSErrorPtr error = begin()) return error;
   if (!_marker) return nullptr;
-  const auto work = _places.beginWork(_path);
+  const auto work = _places.beginWork(_place, _marker->marker.contents.hash);
   if (!work) return work.error();
   FileDescriptor part;
   NSErrorPtr error;
@@ -71,6 +72,8 @@ NSErrorPtr DownloadTransfer::begin() {
     return fileErrorWithWords(NSFileNoSuchFileError, 0,
                               "\"" + printable(_path) + "\" is another document by now", _path);
   }
+  if (NSErrorPtr error = _places.refusalOf(marker->marker, _path)) return error;
+  if (NSErrorPtr error = mendWhatWasLeft()) return error;
   for (const std::string* name : {&_names->part, &_names->fresh, &_names->aside}) {
     if (_place.folder.exists(*name)) {
       return fileError(EEXIST, "can't download to", joinPath(_place.folderPath(), *name));
@@ -80,6 +83,15 @@ NSErrorPtr DownloadTransfer::begin() {
   if (_place.folder.exists(_place.name)) return resolveBoth();
   _marker.emplace(std::move(*marker));
   return nullptr;
+}
+
+NSErrorPtr DownloadTransfer::mendWhatWasLeft() {
+  if (!_place.folder.exists(_names->part) && !_place.folder.exists(_names->fresh) &&
+      !_place.folder.exists(_names->aside)) {
+    return nullptr;
+  }
+  const auto lock = _places.coordinate(_path);
+  return lock ? recoverNoted(_places, _place) : lock.error();
 }
 
 NSErrorPtr DownloadTransfer::resolveBoth() {
@@ -95,9 +107,6 @@ NSErrorPtr DownloadTransfer::resolveBoth() {
 }
 
 NSErrorPtr DownloadTransfer::transfer(const FileDescriptor& part) {
-  if (const int code = reserveSpace(_places.files, part.get(), _marker->marker.contents.size)) {
-    return fileError(code, "can't download", _path);
-  }
   if (NSErrorPtr error = fetch(part)) return error;
   return finish(part);
 }
@@ -106,6 +115,18 @@ NSErrorPtr DownloadTransfer::fetch(const FileDescriptor& part) {
   const HashedContents& wanted = _marker->marker.contents;
   const auto source = _places.contents.read(wanted.hash);
   if (!source) return source.error();
+  struct stat status {};
+  if (fstat(source->get(), &status) != 0) return fileError(errno, "can't download", _path);
+  if (static_cast<std::uint64_t>(status.st_size) != wanted.size) {
+    return corruptError("\"" + printable(_path) + "\"");
+  }
+  // As many blocks as the contents have: what is sparse stays so.
+  constexpr std::uint64_t kBlock = 512;
+  if (static_cast<std::uint64_t>(status.st_blocks) * kBlock >= wanted.size) {
+    if (const int code = reserveSpace(_places.files, part.get(), wanted.size)) {
+      return fileError(code, "can't download", _path);
+    }
+  }
   Stream stream(*this);
   // Where the blocks can be shared they only have to be read; a cloud that spoils contents
   // has to write them.
@@ -150,7 +171,10 @@ NSErrorPtr DownloadTransfer::dressPart(const FileDescriptor& part) {
           copyFileAttributes(_places.files, _marker->file.get(), part.get(), marker.mode, _path)) {
     return error;
   }
-  const timespec times[2] = {now.st_atim, UploadStamp::timeOf(marker.modified)};
+  // The marker's own time may be one that no date can tell.
+  const bool isSame = UploadStamp::dateOf(now.st_mtim) == marker.modified;
+  const timespec times[2] = {now.st_atim,
+                             isSame ? now.st_mtim : UploadStamp::timeOf(marker.modified)};
   int code = _places.files.setTimes(part.get(), "", times);
   if (code == 0) code = _places.files.sync(part.get());
   return code == 0 ? nullptr : fileError(code, "can't download", _path);
@@ -162,13 +186,15 @@ void DownloadTransfer::removeMarker(const FileDescriptor& part) {
   const int folder = _place.folder.get();
   int code = _places.files.sync(folder);
   if (code == 0) code = _places.files.unlink(folder, _names->marker);
+  // Before the note ends: a marker that a power cut brings back is noted still.
+  if (code == 0) code = _places.files.sync(folder);
   if (code != 0) {
     MutexLock lock(_partMutex);
     _leftSomething = true;
     return;
   }
   struct stat status {};
-  if (fstat(part.get(), &status) != 0) return;
+  if (_isCopy || fstat(part.get(), &status) != 0) return;
   // Without a stamp the document is looked at again, and found to be uploaded.
   _places.records.setStamp(_document, UploadStamp::of(status));
 }

@@ -26,11 +26,14 @@ namespace skein::vald {
 // (CloudRecovery).
 class DownloadTransfer {
  public:
+  // `isCopy`: `document` is what the marker names, and another item is at `path`: a marker
+  // was copied. The file is then not what the document was uploaded as.
+  //
   // Bytes that have arrived, of how many; on the transfer's thread, without a lock.
   using Progress = std::function<void(std::uint64_t bytes, std::uint64_t total)>;
 
   DownloadTransfer(CloudPlaces places, CloudConditions& conditions, CloudClock& clock,
-                   VLFileObjectID document, std::string path, Progress progress);
+                   VLFileObjectID document, std::string path, bool isCopy, Progress progress);
 
   // Null when the file is there, also when it was before. Otherwise its place is as it was.
   NSErrorPtr run() SKEIN_EXCLUDES(_partMutex);
@@ -43,6 +46,8 @@ class DownloadTransfer {
   class Stream;
 
   NSErrorPtr begin();
+  // What earlier work left at the place and could not mend then.
+  NSErrorPtr mendWhatWasLeft();
   // The file and its marker are both there.
   NSErrorPtr resolveBoth();
   NSErrorPtr transfer(const FileDescriptor& part);
@@ -63,6 +68,7 @@ class DownloadTransfer {
   CloudClock& _clock;
   const VLFileObjectID _document;
   const std::string _path;
+  const bool _isCopy;
   const Progress _progress;
 
   // Set by run() before there is a part.

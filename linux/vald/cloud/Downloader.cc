@@ -131,6 +131,7 @@ std::shared_ptr<Downloader::Ticket> Downloader::download(Request request) {
   fresh->key = {request.document, request.path};
   fresh->transfer = std::make_unique<DownloadTransfer>(
       _core->places, _core->conditions, _core->clock, request.document, std::move(request.path),
+      request.isCopy,
       // The transfer belongs to the download, and runs only while that lives.
       [core = _core.get(), download = fresh.get()](std::uint64_t bytes, std::uint64_t total) {
         core->tellProgress(*download, bytes, total);

@@ -39,6 +39,7 @@ class Downloader {
   struct Request {
     VLFileObjectID document = VLFileObjectID::documentWithRawID(0);
     std::string path;                     // absolute, the document's own
+    bool isCopy = false;                  // the marker names another item than is at `path`
     DownloadTransfer::Progress progress;  // may be empty; on the download's thread
     // Null when the file is there. Once; on the download's thread, or the canceller's. It
     // must not let the downloader go. A progress may still be told meanwhile.

@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <cerrno>
 #include <utility>
@@ -61,7 +62,8 @@ struct Eviction::Subject {
   FileLease lease;  // after the file, so that it is given up first
   UploadStamp uploadedAs;
   CloudRecord record;
-  CloudContents::Hold contents;
+  std::optional<CloudContents::Hold> contents;
+  bool isDurable = true;  // that the file is gone
 };
 
 NSErrorPtr Eviction::evict(const Request& request) {
@@ -71,26 +73,64 @@ NSErrorPtr Eviction::evict(const Request& request) {
     return refusal(EvictionRefusal::NotADocument, request.path, "it is a folder");
   }
   subject.names.emplace(subject.place.name);
+  // Before anybody has to wait: this reads as much as the document is large.
+  if (NSErrorPtr error = secureContents(subject)) return error;
   const auto lock = _places.coordinate(request.path);
   if (!lock) return lock.error();
   if (NSErrorPtr error = check(subject)) return error;
 
-  const auto work = _places.beginWork(request.path);
+  const auto work = _places.beginWork(subject.place, subject.record.contents.hash);
   if (!work) return work.error();
   NSErrorPtr error = perform(subject);
   if (error != nullptr) {
     subject.lease.giveUp();
     // What is not undone now stays noted and is undone at the next start.
-    if (recoverPlace(_places, subject.place) != nullptr) return error;
+    if (recoverPlace(_places, subject.place, work->contents) != nullptr) return error;
   } else {
     // A stamp that is left fits no file any more: nothing depends on this.
     _places.records.setStamp(request.document, std::nullopt);
   }
-  _places.endWork(*work);
+  if (subject.isDurable) _places.endWork(*work);
   return error;
 }
 
+// What the cloud has becomes the only copy: it is read and held before the file goes. What is
+// lost or damaged there is taken in again from the file, which is still here.
+NSErrorPtr Eviction::secureContents(Subject& subject) {
+  const std::string& path = subject.request.path;
+  const auto record = _places.records.record(subject.request.document);
+  if (!record) return record.error();
+  if (!*record) return nullptr;  // refused below, with the reason
+  const HashedContents& wanted = (*record)->contents;
+  LocalRead observer;
+  auto held = _places.contents.hold(wanted);
+  if (!held || _places.contents.verify(wanted.hash, observer) != nullptr) {
+    FileDescriptor file;
+    if (const int code = subject.place.folder.openFile(subject.place.name, file)) {
+      return code == ENOENT ? nullptr : fileError(code, "can't evict", path);
+    }
+    struct stat status {};
+    if (fstat(file.get(), &status) != 0) return fileError(errno, "can't evict", path);
+    if (!S_ISREG(status.st_mode)) return nullptr;
+    auto added = _places.contents.add(file.get(), path, observer);
+    if (!added) return added.error();
+    if (added->contents.hash != wanted.hash) {
+      return refusal(EvictionRefusal::NotUploaded, path,
+                     "the cloud has lost its contents, and the file is no longer the same; "
+                     "change it or upload it again");
+    }
+    held = std::move(added->hold);
+  }
+  subject.record = **record;
+  subject.contents = std::move(*held);
+  return nullptr;
+}
+
 NSErrorPtr Eviction::check(Subject& subject) {
+  if (subject.place.folder.exists(subject.names->aside) ||
+      subject.place.folder.exists(subject.names->fresh)) {
+    if (NSErrorPtr error = recoverNoted(_places, subject.place)) return error;
+  }
   // From here on these names are this system's: recovery may remove what it finds there.
   for (const std::string* name :
        {&subject.names->fresh, &subject.names->aside, &subject.names->part}) {
@@ -100,6 +140,9 @@ NSErrorPtr Eviction::check(Subject& subject) {
   if (subject.place.folder.exists(subject.names->marker) &&
       subject.place.folder.exists(subject.place.name)) {
     if (NSErrorPtr error = recoverPlace(_places, subject.place)) return error;
+    if (NSErrorPtr error = removeStaleMarker(_places, subject.place, subject.request.document)) {
+      return error;
+    }
     if (subject.place.folder.exists(subject.names->marker)) {
       return nameTaken(subject.request.path, subject.names->marker);
     }
@@ -119,6 +162,13 @@ NSErrorPtr Eviction::checkFile(Subject& subject) {
   }
   if (!S_ISREG(status.st_mode)) {
     return refusal(EvictionRefusal::NotADocument, path, "it is no plain file");
+  }
+  if (status.st_uid != geteuid()) {
+    return fileError(EACCES, "can't evict a file of another user,", path);
+  }
+  if ((status.st_mode & (S_ISUID | S_ISGID | S_ISVTX)) != 0) {
+    return refusal(EvictionRefusal::NotADocument, path,
+                   "it runs with special rights, which no marker gives back");
   }
   if (status.st_nlink != 1) {
     return refusal(EvictionRefusal::SeveralNames, path,
@@ -153,10 +203,9 @@ NSErrorPtr Eviction::checkUpload(Subject& subject) {
   if (!*record || !*stamp) {
     return refusal(EvictionRefusal::NotUploaded, path, "it is not uploaded yet");
   }
-  auto contents = _places.contents.hold((*record)->contents);
-  if (!contents) {
-    return refusal(EvictionRefusal::NotUploaded, path,
-                   "the cloud has lost its contents; change it or upload it again");
+  // Uploaded again meanwhile: those contents were not looked at.
+  if (!subject.contents || (*record)->contents.hash != subject.record.contents.hash) {
+    return changedSinceUpload(path);
   }
   struct stat status {};
   if (fstat(subject.file.get(), &status) != 0) return fileError(errno, "can't evict", path);
@@ -167,7 +216,6 @@ NSErrorPtr Eviction::checkUpload(Subject& subject) {
   }
   subject.record = std::move(**record);
   subject.uploadedAs = now;
-  subject.contents = std::move(*contents);
   return nullptr;
 }
 
@@ -185,7 +233,11 @@ NSErrorPtr Eviction::checkContents(Subject& subject, const HashedContents& uploa
 NSErrorPtr Eviction::perform(Subject& subject) {
   if (NSErrorPtr error = writeMarker(subject)) return error;
   if (NSErrorPtr error = setAside(subject)) return error;
-  const int code = _places.files.unlink(subject.place.folder.get(), subject.names->aside);
+  const int folder = subject.place.folder.get();
+  const int code = _places.files.unlink(folder, subject.names->aside);
+  // Before the note ends: a file that a power cut brings back is noted still. It is gone even
+  // when this fails; then the note stays.
+  if (code == 0) subject.isDurable = _places.files.sync(folder) == 0;
   return code == 0 ? nullptr : fileError(code, "can't evict", subject.request.path);
 }
 
@@ -198,17 +250,20 @@ NSErrorPtr Eviction::writeMarker(Subject& subject) {
   marker.contents = subject.record.contents;
   marker.modified = subject.uploadedAs.modified;
   marker.created = subject.record.created;
-  marker.mode = status.st_mode & 07777;
+  marker.mode = status.st_mode & 0777;
   marker.type = subject.request.type;
   if (subject.names->shortened) marker.name = subject.place.name;
 
   const int folder = subject.place.folder.get();
   FileDescriptor fresh;
   int code = _places.files.createFile(folder, subject.names->fresh, 0600, fresh);
-  if (code == 0) code = _places.files.write(fresh.get(), marker.asText());
+  if (code == 0) {
+    const auto seal = [this](std::string_view text) { return _places.contents.seal(text); };
+    code = _places.files.write(fresh.get(), marker.asText(seal));
+  }
   if (code != 0) return fileError(code, "can't write the marker of", path);
   // The owner can always read it, even where the document's mode would not let him.
-  const mode_t mode = (marker.mode & 0777) | S_IRUSR;
+  const mode_t mode = marker.mode | S_IRUSR;
   if (NSErrorPtr error =
           copyFileAttributes(_places.files, subject.file.get(), fresh.get(), mode, path)) {
     return error;
@@ -221,7 +276,7 @@ NSErrorPtr Eviction::writeMarker(Subject& subject) {
   // The marker must be on the disk before the file goes.
   if (code == 0) code = _places.files.sync(folder);
   return code == 0 ? nullptr : fileError(code, "can't write the marker of", path);
-}
+}  // namespace skein::vald
 
 NSErrorPtr Eviction::setAside(Subject& subject) {
   const std::string& path = subject.request.path;

@@ -23,9 +23,11 @@ enum class EvictionRefusal : std::int64_t {
   CannotBeWatched = 9,  // the file system cannot tell whether somebody writes to the file
 };
 
-// Replaces files by their markers (see EvictionMarker.h). Any thread; calls block, for some
-// milliseconds however large the file is; a file that changed in its tags, its mode or its name
-// alone is read once more, and when it is too large for that it has to be uploaded again.
+// Replaces files by their markers (see EvictionMarker.h). Any thread; calls block
+// while the cloud's contents are read, which are verified (and repaired from the file) before
+// the file is given up; others are kept waiting for some milliseconds only. A file that changed in
+// its tags, its mode or its name alone is read once more, and when it is too large for that it has
+// to be uploaded again.
 //
 // The steps, so that a crash leaves the file or its marker and never neither:
 //   1. the marker is written beside the file under another name, and made durable;
@@ -50,6 +52,7 @@ class Eviction {
  private:
   struct Subject;
 
+  NSErrorPtr secureContents(Subject& subject);
   NSErrorPtr check(Subject& subject);
   NSErrorPtr checkFile(Subject& subject);
   NSErrorPtr checkUpload(Subject& subject);

@@ -1,5 +1,6 @@
 #include "linux/vald/cloud/EvictionMarker.h"
 
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <array>
@@ -9,6 +10,7 @@
 
 #include "linux/vald/cloud/CloudErrors.h"
 #include "linux/vald/files/FileErrors.h"
+#include "linux/vald/files/FileNames.h"
 
 namespace skein::vald {
 namespace {
@@ -94,7 +96,7 @@ bool take(EvictionMarker& marker, std::string_view key, std::string_view value, 
   } else if (key == "mode") {
     const auto mode = number<mode_t>(value, 8);
     if (!mode) return false;
-    marker.mode = *mode & 07777;
+    marker.mode = *mode & 0777;
     seen |= 16;
   } else if (key == "created") {
     marker.created = date(value);
@@ -104,19 +106,23 @@ bool take(EvictionMarker& marker, std::string_view key, std::string_view value, 
     return marker.type.has_value();
   } else if (key == "name") {
     marker.name = unescaped(value);
-    return marker.name.has_value();
+    return marker.name.has_value() && refusalOfName(*marker.name, false) == nullptr;
+  } else if (key == "seal") {
+    marker.seal = ContentHash::parse(value);
+    return marker.seal.has_value();
   }
   return true;
 }
 
 }  // namespace
 
-std::string EvictionMarker::asText() const {
+std::string EvictionMarker::asText(
+    const std::function<ContentHash(std::string_view)>& makeSeal) const {
   const auto nanoseconds = [](NSDate when) {
     return std::to_string(when.time_since_epoch().count());
   };
   std::array<char, 16> octal{};
-  std::to_chars(octal.data(), octal.data() + octal.size() - 1, mode & 07777, 8);
+  std::to_chars(octal.data(), octal.data() + octal.size() - 1, mode & 0777, 8);
   std::string text(kFirstLine);
   text += "\ndocument " + document.asString() + "\nhash " + contents.hash.asString() + "\nsize " +
           std::to_string(contents.size) + "\nmodified " + nanoseconds(modified);
@@ -124,7 +130,9 @@ std::string EvictionMarker::asText() const {
   text += std::string("\nmode ") + octal.data();
   if (type) text += "\ntype " + escaped(*type);
   if (name) text += "\nname " + escaped(*name);
-  return text + "\nend\n";
+  text += "\n";
+  if (makeSeal) text += "seal " + makeSeal(text).asString() + "\n";
+  return text + "end\n";
 }
 
 std::optional<EvictionMarker> EvictionMarker::parse(const std::string& text) {
@@ -142,6 +150,8 @@ std::optional<EvictionMarker> EvictionMarker::parse(const std::string& text) {
     if (line == "end")
       return seen == kAllSeen && left.empty() ? std::optional(marker) : std::nullopt;
     const std::size_t space = line.find(' ');
+    if (marker.seal) return std::nullopt;  // nothing is said that it does not vouch for
+    if (line.starts_with("seal ")) marker.sealed = text.substr(0, line.data() - text.data());
     if (!first && space != std::string_view::npos &&
         !take(marker, line.substr(0, space), line.substr(space + 1), seen)) {
       return std::nullopt;
@@ -170,7 +180,8 @@ MarkerNames::MarkerNames(const std::string& name) {
 }
 
 bool mayBeMarkerName(const std::string& name) {
-  return name.size() > 1 + kSuffix.size() && name[0] == '.' && name.ends_with(kSuffix);
+  return name.size() > 1 + kSuffix.size() && name[0] == '.' && name.ends_with(kSuffix) &&
+         refusalOfName(documentNameOfMarker(name), false) == nullptr;
 }
 
 bool isCloudTemporaryName(const std::string& name) {
@@ -191,6 +202,10 @@ std::string documentNameOfMarker(const std::string& markerName) {
 }
 
 std::optional<EvictionMarker> readMarkerText(int file) {
+  struct stat status {};
+  if (fstat(file, &status) != 0 || !S_ISREG(status.st_mode) || status.st_uid != geteuid()) {
+    return std::nullopt;
+  }
   std::string text(kLargestMarker + 1, '\0');
   ssize_t size = 0;
   do {

@@ -13,10 +13,16 @@
 //   mode 644                            octal
 //   type text/plain                     absent when nobody knows
 //   name a%20long%20name                only where the marker's own name is too short for it
+//   seal 5f16aa…                        keyed hash of all before this line, with the cloud's key
 //   end
 //
 // Fields come in this order; a reader skips lines that it does not know, and refuses another
 // number in the first line. A text without its last line is no marker.
+//
+// Who may write to a folder could put a text of this kind there, and name contents that he
+// may not read. So a file counts as a marker only when it is this user's own, and it is
+// served only when its seal is right, or, where it has none, when the record of the
+// document that it names has these contents. Its mode gives permissions alone.
 //
 // A name of more than 240 bytes makes a marker's name that no file system takes: then it is
 // ".BEGINNING~HASH.skein", with at most 200 bytes of the name and 16 digits of the name's
@@ -28,8 +34,10 @@
 
 #include <sys/types.h>
 
+#include <functional>
 #include <optional>
 #include <string>
+#include <string_view>
 
 #include "linux/vald/cloud/ContentStream.h"
 #include "linux/vald/cloud/Outcome.h"
@@ -44,11 +52,14 @@ struct EvictionMarker {
   HashedContents contents;
   NSDate modified;
   std::optional<NSDate> created;
-  mode_t mode = 0600;
+  mode_t mode = 0600;  // 0777 at most
   std::optional<std::string> type;
-  std::optional<std::string> name;
+  std::optional<std::string> name;  // a name that a file may have
+  std::optional<ContentHash> seal;
+  std::string sealed;  // the text that the seal is of, as it was read
 
-  std::string asText() const;
+  // `makeSeal` makes the seal of a text; without it there is none.
+  std::string asText(const std::function<ContentHash(std::string_view)>& makeSeal = nullptr) const;
   // Nil for anything that is no marker.
   static std::optional<EvictionMarker> parse(const std::string& text);
 };
@@ -76,7 +87,8 @@ std::string nameOfDocument(const EvictionMarker& marker, const std::string& mark
 std::string documentNameOfMarker(const std::string& markerName);
 // A document's name longer than this may be shortened in its marker's.
 inline constexpr std::size_t kLongestMarkerBeginning = 200;
-// What an open file says, if it is a marker. Its position stays.
+// What an open file says, if it is a plain file of this user's and a marker. Its position
+// stays.
 std::optional<EvictionMarker> readMarkerText(int file);
 
 // A marker and the open file it was read from. NSCocoaErrorDomain 4 when there is no such

@@ -29,6 +29,12 @@ int copyExtendedAttributes(FileLayer& files, int from, int to) {
     value.resize(static_cast<std::size_t>(length));
     if (const int code = files.setAttribute(descriptorPath(to), name, value)) return code;
   }
+  // What a folder gives to new files by default is not what the file had.
+  constexpr char kAccessList[] = "system.posix_acl_access";
+  if (fgetxattr(from, kAccessList, nullptr, 0) < 0 && errno == ENODATA &&
+      fgetxattr(to, kAccessList, nullptr, 0) >= 0) {
+    return files.removeAttribute(descriptorPath(to), kAccessList);
+  }
   return 0;
 }
 
@@ -38,6 +44,14 @@ NSErrorPtr copyFileAttributes(FileLayer& files, int from, int to, mode_t mode,
                               const std::string& path) {
   struct stat status {};
   if (fstat(from, &status) != 0) return fileError(errno, "can't look at", path);
+  struct stat target {};
+  if (fstat(to, &target) != 0) return fileError(errno, "can't look at", path);
+  // Before the mode, which would be cut by it.
+  if (status.st_gid != target.st_gid) {
+    if (const int code = files.setGroup(to, status.st_gid)) {
+      return fileError(code, "can't keep the group of", path);
+    }
+  }
   if (const int code = copyExtendedAttributes(files, from, to)) {
     return fileError(code, "can't keep the attributes of", path);
   }

@@ -91,7 +91,9 @@ class Attempt {
       const auto here = hashContents(_file.get(), _path, observer);
       if (!here) return here.error();
       if (here->hash == record->contents.hash) {
-        if (auto hold = _services.contents.hold(record->contents)) {
+        // What is damaged there is replaced below.
+        auto hold = _services.contents.hold(record->contents);
+        if (hold && _services.contents.verify(here->hash, observer) == nullptr) {
           return CloudContents::Added{*here, std::move(*hold)};
         }
       }

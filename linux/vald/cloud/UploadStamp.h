@@ -16,7 +16,14 @@ struct UploadStamp {
   NSDate changed;  // of the contents or of anything about the file, its name included
   std::uint64_t inode = 0;
 
+  // A time that no date can tell (after 2262) is the last one.
   static NSDate dateOf(const timespec& time) {
+    constexpr auto kLast =
+        std::chrono::floor<std::chrono::seconds>(NSDate::max().time_since_epoch());
+    constexpr auto kFirst =
+        std::chrono::ceil<std::chrono::seconds>(NSDate::min().time_since_epoch());
+    if (time.tv_sec >= kLast.count()) return NSDate::max();
+    if (time.tv_sec <= kFirst.count()) return NSDate::min();
     return NSDate(std::chrono::seconds(time.tv_sec) + std::chrono::nanoseconds(time.tv_nsec));
   }
   static timespec timeOf(NSDate date) {

@@ -33,6 +33,7 @@ std::string_view fileStepName(FileStep step) {
     case FileStep::SetAttribute: return "set attribute";
     case FileStep::RemoveAttribute: return "remove attribute";
     case FileStep::SetMode: return "set mode";
+    case FileStep::SetGroup: return "set group";
     case FileStep::SetTimes: return "set times";
     case FileStep::MakeLink: return "make link";
     case FileStep::Rename: return "rename";
@@ -109,6 +110,11 @@ int FileLayer::removeAttribute(const std::string& path, const std::string& name)
 int FileLayer::setMode(int file, mode_t mode) {
   if (const int fault = beforeStep(FileStep::SetMode, {})) return fault;
   return result([&] { return ::fchmod(file, mode); });
+}
+
+int FileLayer::setGroup(int file, gid_t group) {
+  if (const int fault = beforeStep(FileStep::SetGroup, {})) return fault;
+  return result([&] { return ::fchown(file, static_cast<uid_t>(-1), group); });
 }
 
 int FileLayer::setTimes(int at, const std::string& name, const timespec times[2]) {

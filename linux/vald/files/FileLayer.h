@@ -22,6 +22,7 @@ enum class FileStep : std::uint8_t {
   SetAttribute,
   RemoveAttribute,
   SetMode,
+  SetGroup,
   SetTimes,
   MakeLink,
   Rename,
@@ -58,6 +59,7 @@ class FileLayer {
   int setAttribute(const std::string& path, const std::string& name, std::string_view value);
   int removeAttribute(const std::string& path, const std::string& name);
   int setMode(int file, mode_t mode);
+  int setGroup(int file, gid_t group);
   // By name, not followed; times are (access, modification). An empty name is `at` itself.
   int setTimes(int at, const std::string& name, const timespec times[2]);
   int makeLink(const std::string& target, int at, const std::string& name);
