@@ -197,12 +197,18 @@ void VLFileEnumerator::_signalChange() {
 }
 
 void VLFileEnumerator::_invalidateChangeToken() {
+  // Before the lock, which may be held for as long as an observer takes.
+  VL_DEBUG(_environment.log, "[DEBUG] invalidating change token");
   MonitorLock lock(_lock);
-  _invalidateChangeTokenWithLock();
+  resetChangeState();
 }
 
 void VLFileEnumerator::_invalidateChangeTokenWithLock() {
   VL_DEBUG(_environment.log, "[DEBUG] invalidating change token");
+  resetChangeState();
+}
+
+void VLFileEnumerator::resetChangeState() {
   _deletedItemsIdentifiers.clear();
   _updatedItemsByIDs.clear();
   _rank = 0;

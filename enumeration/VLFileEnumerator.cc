@@ -25,6 +25,8 @@ struct VLFileEnumerator::ListingRequest {
   template <class Answer>
   void end(Answer&& answer) {
     const auto ended = std::exchange(observer, nullptr);
+    // A second answer is the daemon's fault, and nobody is left to hear it.
+    if (!ended) return;
     answer(*ended);
     section.close();
   }

@@ -101,6 +101,7 @@ class VLFileEnumerator final : public NSFileProviderEnumerator,
   // Begins a new change state. The second form is for callers that hold the lock.
   void _invalidateChangeToken() SKEIN_EXCLUDES(_lock);
   void _invalidateChangeTokenWithLock() SKEIN_REQUIRES(_lock);
+  void resetChangeState() SKEIN_REQUIRES(_lock);
   std::size_t pendingCount() const SKEIN_REQUIRES(_lock);
   uuid_t uuid() const SKEIN_EXCLUDES(_uuidMutex);
   void drawUUID() SKEIN_EXCLUDES(_uuidMutex);

@@ -29,11 +29,10 @@ void deleteItemWithIdentifier(const ItemRequest& request,
       url, [&log, &fileOperations, url,
             completionHandler = std::move(completionHandler)](const NSErrorPtr& error) mutable {
         if (isNoSuchFile(error)) {
-          const NSURLPtr physicalURL = fileOperations.vl_physicalURL(url);
-          VL_DEBUG(log, "[DEBUG] couldn't delete %@, retrying with physical url %@", url,
-                   physicalURL);
           // Without one there is nothing to send the retry to, and the first error stands.
-          if (physicalURL) {
+          if (const NSURLPtr physicalURL = fileOperations.vl_physicalURL(url)) {
+            VL_DEBUG(log, "[DEBUG] couldn't delete %@, retrying with physical url %@", url,
+                     physicalURL);
             fileOperations.fp_deleteWithCompletionHandler(
                 physicalURL, [completionHandler = std::move(completionHandler)](
                                  const NSErrorPtr& retryError) mutable {

@@ -60,8 +60,10 @@ std::string pathOfURL(std::string_view url) {
   for (std::size_t at = 0; at < url.size(); ++at) {
     const auto byte =
         url[at] == '%' ? bytesOfHexadecimal(lowercase(url.substr(at + 1, 2))) : std::nullopt;
-    path += byte ? byte->front() : url[at];
-    if (byte) at += 2;
+    // A sign that nothing follows stands for itself.
+    const bool isEscaped = byte && !byte->empty();
+    path += isEscaped ? byte->front() : url[at];
+    if (isEscaped) at += 2;
   }
   return path;
 }

@@ -3,12 +3,13 @@
 #include <array>
 #include <charconv>
 #include <cstdio>
+#include <utility>
 
 namespace skein::cli {
 namespace {
 
 constexpr std::array<std::string_view, 4> kMarkers{"┏", "┣", "┳", "┗"};
-enum Marker : std::uint8_t { Opens, GoesOn, Arrives, Closes, None };
+enum Marker : std::uint8_t { Opens, GoesOn, Arrives, Closes, OfAnother, None };
 
 // MOMENT LEVEL PROCESS/THREAD TEXT: the third field.
 std::string threadOf(std::string_view line) {
@@ -27,7 +28,7 @@ Marker markerOf(std::string_view line, std::string_view number) {
     const std::string_view rest = line.substr(at + kMarkers[i].size());
     const bool same =
         rest.starts_with(number) && (rest.size() == number.size() || rest[number.size()] == ' ');
-    return same ? static_cast<Marker>(i) : None;
+    return same ? static_cast<Marker>(i) : OfAnother;
   }
   return None;
 }
@@ -45,12 +46,24 @@ bool SectionFilter::wants(std::string_view line) {
   const std::string thread = threadOf(line);
   switch (markerOf(line, _number)) {
     case Opens:
-    case Arrives: _inside.insert(thread); return true;
-    case GoesOn: return true;
-    case Closes: _inside.clear(); return true;
+    case Arrives:
+      _hasBegun = true;
+      _inside.insert(thread);
+      return true;
+    case GoesOn:
+      // Some sections begin so. Such a one has no others within, and may never close.
+      if (!std::exchange(_hasBegun, true)) _begunByGoingOn = thread;
+      return true;
+    case Closes:
+      _inside.clear();
+      _begunByGoingOn.clear();
+      return true;
+    case OfAnother:
+      if (thread == _begunByGoingOn) _begunByGoingOn.clear();
+      break;
     case None: break;
   }
-  return _inside.contains(thread);
+  return _inside.contains(thread) || (!thread.empty() && thread == _begunByGoingOn);
 }
 
 std::optional<std::uint64_t> parseSection(const std::string& text) {

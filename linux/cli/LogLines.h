@@ -18,6 +18,8 @@ class SectionFilter {
 
  private:
   const std::string _number;
+  bool _hasBegun = false;
+  std::string _begunByGoingOn;  // the thread that goes on with such a section; else empty
   std::unordered_set<std::string> _inside;  // threads, as "process/thread"
 };
 

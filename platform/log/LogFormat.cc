@@ -11,7 +11,7 @@ std::string renderLog(std::string_view format, std::span<const LogArgument> argu
     const std::size_t start = format.find('%');
     line += format.substr(0, start);
     const auto [conversion, length] = logConversionAt(format.substr(start));
-    char digits[64];
+    char digits[320];  // the largest double has 309 digits before its point
     switch (conversion) {
       case LogConversion::Signed:
         line += std::to_string(static_cast<std::int64_t>(argument.bits));

@@ -172,9 +172,7 @@ TEST_F(Removal, DeletingTriesThePhysicalFileOnceWhenThereIsNoSuchFile) {
 
   framework.fileOperations.physicalURLs.clear();
   start();
-  EXPECT_EQ(finishDeletion(cocoa(4)),
-            (Lines{"[DEBUG] couldn't delete file:///store/alias, retrying with physical url (null)",
-                   "answer: NSCocoaErrorDomain 4"}));
+  EXPECT_EQ(finishDeletion(cocoa(4)), (Lines{"answer: NSCocoaErrorDomain 4"}));
   host.deleteItemWithIdentifier(unknown, errorAnswer());
   EXPECT_EQ(take().at(1), "answer: NSFileProviderErrorDomain -1005 of " + unknown);
 }
