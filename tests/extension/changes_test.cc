@@ -18,6 +18,10 @@ TEST_F(Changes, APushIsSignalledThenReplied) {
   env.framework.manager.signals.next()->reply(kCocoa14);
   EXPECT_EQ(env.run(), Lines{"[ERROR] failed to signal enumerator for root container: "
                              "NSCocoaErrorDomain 14"});
+  push({makeItem(1)});
+  env.run();
+  env.framework.manager.signals.next()->reply(nullptr);
+  EXPECT_EQ(env.run(), Lines{}) << "a signal that went well says nothing";
   enumerator->receiveProgressUpdates({makeItem(2)},
                                      [this] { env.transcript.add("progress was replied"); });
   EXPECT_EQ(env.run(), Lines{});
@@ -54,11 +58,14 @@ TEST_F(Changes, EachBatchIsOneRankAndNothingIsNone) {
             (Lines{"[DEBUG] ┏1 listing changes", "[DEBUG] requested rank: 0",
                    "[DEBUG] no update to send back", "observer: anchor", "[DEBUG] ┗1 "}));
   push({makeItem(1)});
+  env.run();
   const NSData second = changes(first)->anchor.value();
+  // Both lists are reported, the empty one too.
+  EXPECT_EQ(env.runCalls(),
+            (Lines{"observer: updated [doc]", "observer: deleted []", "observer: anchor"}));
   push({makeItem(1, true)});
   env.run();
   const NSData third = changes(second)->anchor.value();
-  // Both lists are reported, the empty one too.
   EXPECT_EQ(env.runCalls(), (Lines{"observer: updated []", "observer: deleted [d0000000000000001]",
                                    "observer: anchor"}));
   EXPECT_EQ(changes(third)->anchor, third);
@@ -179,6 +186,54 @@ TEST_F(Changes, ABatchIsReportedWithoutTheLockAndLosesNothing) {
   const auto next = changes(observer->anchor);
   ASSERT_EQ(next->updated.size(), 1u);
   EXPECT_EQ(next->updated[0]->itemIdentifier(), documentID(2));
+}
+
+// Other threads that want the enumerator's lock.
+struct LockProbe {
+  explicit LockProbe(VLFileEnumerator& enumerator) : _enumerator(enumerator) {}
+  ~LockProbe() {
+    for (std::thread& thread : _threads) thread.join();
+  }
+  // Whether another thread gets the lock while this one waits for it, at most so long.
+  bool isFree(std::chrono::milliseconds patience) {
+    auto taken = std::make_shared<std::promise<void>>();
+    auto future = taken->get_future();
+    _threads.emplace_back([this, taken] {
+      _enumerator.pendingChangeCount();
+      taken->set_value();
+    });
+    return future.wait_for(patience) == std::future_status::ready;
+  }
+
+ private:
+  VLFileEnumerator& _enumerator;
+  std::vector<std::thread> _threads;
+};
+
+TEST_F(Changes, SignalsGoOutWithoutTheLockAndASenderIsInvalidatedUnderIt) {
+  LockProbe lock(*enumerator);
+  env.framework.manager.signals.handTo([&](const auto& call) {
+    EXPECT_TRUE(lock.isFree(kDeadline)) << "a signal goes out with the lock held";
+    call->reply(nullptr);
+  });
+  push({makeItem(1)});
+  // Whoever has the lock may rely on it that the link is not taken down meanwhile.
+  const auto sender = link();
+  bool asked = false;
+  sender->invalidated = [&] {
+    asked = true;
+    EXPECT_FALSE(lock.isFree(std::chrono::milliseconds(50)));
+  };
+  enumerator->invalidate();
+  env.executor->runAll();
+  EXPECT_TRUE(asked);
+}
+
+TEST_F(Changes, EachEnumeratorBeginsWithAnIdentityOfItsOwn) {
+  const NSData first = currentAnchor();
+  enumerator = make(kFolder);
+  EXPECT_NE(currentAnchor(), first);
+  EXPECT_TRUE(expired(first));
 }
 
 TEST_F(Changes, ARequestForChangesSetsUpNoLink) {

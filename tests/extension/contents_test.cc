@@ -139,6 +139,17 @@ TEST_F(ProvidingContents, ASecondStartTakesThePlaceAndBothAreAnswered) {
                            "answer: NSCocoaErrorDomain 4", "[DEBUG] ┗3 "}));
 }
 
+TEST_F(ProvidingContents, AStopCancelsTheNewerOfTwoStarts) {
+  start(a);
+  start(a);
+  take();
+  const auto older = nextOperation();
+  const auto newer = nextOperation();
+  host.stopProvidingItemAtURL(a);
+  EXPECT_FALSE(newer->finish(nullptr)) << "the newer one goes on";
+  EXPECT_TRUE(older->finish(nullptr));
+}
+
 TEST_F(ProvidingContents, HandlersRunWithoutTheLockAndKeepTheExtension) {
   // The handler waits for another thread that needs the lock, while a stop is under way.
   bool answered = false;

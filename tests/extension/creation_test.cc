@@ -23,10 +23,13 @@ TEST_F(Creation, ImportLooksTheFolderUpBeforeItsSection) {
   EXPECT_EQ(finish(created), (Lines{gotNewURL, "items: ask file:///store/f/new after a scan",
                                     "answer: new, no error"}));
 
+  import(alias);
+  EXPECT_EQ(take().at(2), "files: import file:///home/x under file:///store/target");
+  finish(nullptr, cocoa(4));
   import(unknown);
-  EXPECT_EQ(take(), (Lines{"[DEBUG] ┏9 importing document at file:///home/x to (null)",
+  EXPECT_EQ(take(), (Lines{"[DEBUG] ┏d importing document at file:///home/x to (null)",
                            "answer: no item, NSFileProviderErrorDomain -1005 of " + unknown,
-                           "[DEBUG] ┗9 "}));
+                           "[DEBUG] ┗d "}));
 }
 
 TEST_F(Creation, ACreatedFolderIsNamedByItsParentsIdentifier) {

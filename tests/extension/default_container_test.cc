@@ -13,6 +13,8 @@ struct DefaultContainer : OperationsFixture {
     framework.bundles.apps["editor"] = {{VLSkeinContainerIdentifiersEntitlement, {"one", "two"}},
                                         {"unasked", {"x"}}};
     framework.bundles.apps["game"] = {};
+    framework.bundles.apps["com.tessel.Binder.viewer"] = {
+        {VLUbiquityContainerIdentifiersEntitlement, {"ubiquitous"}}};
   }
   Lines ask(std::optional<std::string> bundleIdentifier) {
     host._defaultApplicationContainerForBundleIdentifier(std::move(bundleIdentifier), answer());
@@ -68,6 +70,13 @@ TEST_F(DefaultContainer, AnAppGetsItsFirstContainer) {
       take(),
       Lines{"answer: no item, NSFileProviderErrorDomain -1004 under NSCocoaErrorDomain 4355"});
   EXPECT_TRUE(weak.expired());
+}
+
+TEST_F(DefaultContainer, EveryKindOfEntitlementIsReadAndTheFilesAppIsKnownByItsWholeName) {
+  EXPECT_EQ(ask("com.tessel.Binder.viewer").at(2),
+            "daemon: url of container ubiquitous, recreated");
+  framework.daemon.containerURLs.next()->reply(nullptr, std::nullopt, false, nullptr);
+  take();
 }
 
 TEST_F(DefaultContainer, AnUnknownAppAndOneWithoutContainersAreRefused) {

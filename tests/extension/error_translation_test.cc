@@ -55,6 +55,8 @@ TEST(ErrorTranslation, AFileThatExistsBecomesACollisionWhenItsItemIsKnown) {
   const NSErrorPtr collision =
       fileProviderErrorFromFSError(exists(516, NSCocoaErrorDomain, storeURL("/a")), identity);
   EXPECT_EQ(brief(collision), "NSFileProviderErrorDomain -1001");
+  // The item is there already: no scan is asked for.
+  EXPECT_EQ(env.runCalls(), Lines{"items: ask file:///store/a"});
   EXPECT_EQ(collision->userInfo().at(NSFileProviderErrorCollidingItemKey),
             NSErrorValue(NSFileProviderItemPtr(item)));
 

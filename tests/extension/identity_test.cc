@@ -99,6 +99,11 @@ TEST_F(Identity, AURLsIdentifierGoesByTheErrorNotTheItem) {
                    "[DEBUG] ┏3 asked properties for file:///store/a", "items: ask file:///store/a",
                    "[DEBUG] returning <" + one + " \"doc\">", "[DEBUG] ┗3 ",
                    "[DEBUG] returning " + one, "[DEBUG] ┗1 "}));
+  const auto account = std::exchange(framework.accounts.account, nullptr);
+  EXPECT_EQ(identity.persistentIdentifierForItemAtURL(storeURL("/a")), one)
+      << "who is logged in is not asked";
+  framework.accounts.account = account;
+  env.run();
   EXPECT_EQ(identity.persistentIdentifierForItemAtURL(storeURL("/none")), std::nullopt);
   EXPECT_EQ(env.run()[5], "[DEBUG] returning (null)");
 

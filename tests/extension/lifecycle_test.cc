@@ -25,6 +25,8 @@ TEST_F(Lifecycle, WithoutTheSuperclassNothingIsMadeOrRegistered) {
 }
 
 TEST_F(Lifecycle, AnAccountChangeSignalsTheRootUntilTheEnd) {
+  // Changes are posted before anybody listens, so none is heard half made.
+  env.framework.accounts.observed = [this] { EXPECT_EQ(observers(), 0u); };
   auto extension = VLFileProviderExtension::init(attributes, env.environment);
   ASSERT_TRUE(extension);
   EXPECT_EQ(env.run(), Lines{"accounts: observe"});

@@ -86,6 +86,10 @@ TEST_F(Removal, UntrashingGoesWhereItWasAsked) {
   EXPECT_EQ(take(), (Lines{"[DEBUG] ┏9 untrashing item " + unknown,
                            "answer: no item, NSFileProviderErrorDomain -1005 of " + unknown,
                            "[DEBUG] ┗9 "}));
+  // The alias comes back, not what it points to.
+  host.untrashItemWithIdentifier(alias, folder, answer());
+  EXPECT_EQ(take().at(2), "[DEBUG] untrashing from url: file:///store/alias");
+  finish(nullptr, cocoa(4));
 }
 
 TEST_F(Removal, UntrashingFallsBackToWhereItWasThenToItsContainer) {
@@ -164,11 +168,14 @@ TEST_F(Removal, DeletingTriesThePhysicalFileOnceWhenThereIsNoSuchFile) {
 
   // Only that code of only that domain; a name that is taken is no error of a deletion.
   for (const NSErrorPtr& error : {NSError::errorWithDomain(NSPOSIXErrorDomain, 4), cocoa(512),
-                                  fileExists(storeURL("/f/new"))}) {
+                                  cocoa(260), fileExists(storeURL("/f/new"))}) {
     start();
     EXPECT_EQ(finishDeletion(error), Lines{"answer: " + say(error)});
     EXPECT_EQ(lastError, error);
   }
+  start();
+  EXPECT_EQ(finishDeletion(cocoa(4355)),
+            Lines{"answer: NSFileProviderErrorDomain -1004 under NSCocoaErrorDomain 4355"});
 
   framework.fileOperations.physicalURLs.clear();
   start();

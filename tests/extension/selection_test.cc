@@ -30,11 +30,16 @@ struct Selection : testing::Test {
     const Lines lines = env.runCalls();
     enumerator->invalidate();
     env.executor->runAll();
+    const auto watch = std::find_if(lines.begin(), lines.end(), [](const std::string& line) {
+      return line.find(" watch ") != std::string::npos;
+    });
+    watched = watch != lines.end() ? watch->substr(watch->find(" watch ") + 7) : "nothing";
     return lines.back();
   }
 
   TestEnvironment env;
   ItemIdentity identity{env.environment};
+  std::string watched;  // by the last enumerator that listed
 };
 
 TEST_F(Selection, NobodyLoggedInGetsNone) {
@@ -69,8 +74,10 @@ TEST_F(Selection, FoldersGetTheirsByURL) {
   EXPECT_EQ(folderAskedFor(select(kRoot)), "daemon: items in (null) order 0 offset 0 limit 200");
   EXPECT_EQ(folderAskedFor(select(folder.asString())),
             "daemon: items in i0000000000000007 order 0 offset 0 limit 200");
+  EXPECT_EQ(watched, "file:///store/folder 19") << "its children alone";
   EXPECT_EQ(folderAskedFor(select(file.asString())),
             "daemon: items in d0000000000000008 order 0 offset 0 limit 200");
+  EXPECT_EQ(watched, "file:///store/target 19");
 }
 
 TEST_F(Selection, WithoutAURLThereIsNoSuchItem) {

@@ -79,6 +79,7 @@ TEST_F(WorkingSet, RepliesErrorsAreTranslatedTheConnectionsAreNot) {
       {error(NSCocoaErrorDomain, 4355),
        "NSFileProviderErrorDomain -1004 under NSCocoaErrorDomain 4355"},
       {error(VLVellumErrorDomain, 9), "VLVellumErrorDomain 9"},
+      {error(NSCocoaErrorDomain, 2), "NSCocoaErrorDomain 2"},
   };
   for (const auto& [reply, told] : kCases) {
     const auto listing = list();

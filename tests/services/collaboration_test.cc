@@ -122,7 +122,7 @@ TEST_F(Collaboration, FolderSharingIsWhatIsLeftOfTheFirstFlags) {
   };
   constexpr std::int64_t kHigh = std::int64_t{1} << 40;
   for (const Case& one : {Case{0, 1, 0, "no"}, Case{1, 0, 1, "no"}, Case{3, 3, 1, "yes"},
-                          Case{1, 0, 2, "yes"}, Case{kHigh, 0, 1, "yes"}}) {
+                          Case{1, 0, 2, "yes"}, Case{1, 0, 3, "no"}, Case{kHigh, 0, 1, "yes"}}) {
     state();
     framework.daemon.shareOptions.next()->reply(one.a, one.b, one.c, "Team", nullptr);
     EXPECT_EQ(take().back(), std::string("answer: ") + one.expected + " no error");

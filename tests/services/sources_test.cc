@@ -106,6 +106,16 @@ TEST_F(ServiceSources, AnEndpointThatNobodyConnectsToEndsWithItsSource) {
   EXPECT_TRUE(listener.expired());
 }
 
+TEST_F(ServiceSources, AConnectionThatEndedTakesItsListenerAlongThoughTheSourceStays) {
+  const auto source = sources(document).at(1);
+  source->makeListenerEndpointAndReturnError(nullptr);
+  const auto listener = framework.xpcListeners.made.at(0);
+  auto connection = listener.lock()->connect();
+  connection->close();
+  connection = nullptr;
+  EXPECT_TRUE(listener.expired());
+}
+
 TEST_F(ServiceSources, CollaborationExportsItsOwnProxyAndSaysSo) {
   const auto source = sources(document).at(0);
   source->makeListenerEndpointAndReturnError(nullptr);

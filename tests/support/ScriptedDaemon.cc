@@ -27,6 +27,7 @@ std::shared_ptr<VLItemNotificationSending> ScriptedSender::remoteObjectProxyWith
 
 void ScriptedSender::invalidate() {
   _transcript.add(_name + " invalidate");
+  if (invalidated) invalidated();
   releaseReceiver();
 }
 

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <functional>
 #include <memory>
 #include <string>
 #include <vector>
@@ -35,6 +36,7 @@ class ScriptedSender final : public VLItemNotificationSender,
 
   HeldCalls<> boosts;
   HeldCalls<NSErrorPtr> watches;
+  std::function<void()> invalidated;  // called as it is invalidated; set before threads start
 
  private:
   class Proxy;

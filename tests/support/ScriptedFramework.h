@@ -24,7 +24,10 @@ namespace skein {
 class ScriptedAccounts final : public VLAccounts {
  public:
   explicit ScriptedAccounts(Transcript& transcript) : _transcript(transcript) {}
-  void startAccountTokenChangeObserverIfNeeded() override { _transcript.add("accounts: observe"); }
+  void startAccountTokenChangeObserverIfNeeded() override {
+    _transcript.add("accounts: observe");
+    if (observed) observed();
+  }
   std::shared_ptr<const VLAccount> currentCachedLoggedInAccountWithError(NSErrorOut out) override {
     if (error) out.store(error);
     return account;
@@ -38,6 +41,7 @@ class ScriptedAccounts final : public VLAccounts {
 
   std::shared_ptr<const VLAccount> account = std::make_shared<VLAccount>("kim", "kim's files");
   NSErrorPtr error;
+  std::function<void()> observed;  // called when changes are asked to be observed
 
  private:
   Transcript& _transcript;

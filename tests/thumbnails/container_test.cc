@@ -4,6 +4,7 @@
 #include "support/NSString+PortfolioAdditions.h"
 #include "tests/thumbnails/ThumbnailFixture.h"
 #include "thumbnails/ContainerThumbnail.h"
+#include "vellum/VLErrors.h"
 
 namespace skein {
 namespace {
@@ -67,6 +68,14 @@ TEST_F(ContainerThumbnails, AnIconAndWhetherItIsAnAppsOrWhyThereIsNone) {
   EXPECT_EQ(ask("bare", false), bare);
   EXPECT_EQ(ask("bare"),
             (Lines{bare[0], bare[1], "thumbnail of i7: no data, no type, VLVellumErrorDomain 15"}));
+  NSErrorPtr noImage;
+  _fetchThumbnailForContainerID(
+      "bare", "i7", {64, 64}, framework.containers.table,
+      [&](auto&, auto&&, auto&&, const NSErrorPtr& error) { noImage = error; }, env.log);
+  ASSERT_TRUE(noImage);
+  EXPECT_EQ(noImage->localizedDescription(),
+            vlc_errorInvalidParameter("size", "{64.00, 64.00}")->localizedDescription());
+  env.run();
   EXPECT_EQ(ask("gone", false), Lines{"[ERROR] can't find container with ID gone"});
   // The error is the item's, not the container's.
   NSErrorPtr missing;

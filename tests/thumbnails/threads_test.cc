@@ -20,8 +20,13 @@ TEST(ThumbnailThreads, WaitingForADownloadToStartLeavesAThreadForIt) {
   properties.typeIdentifier = framework.transfer.renderableType;
   framework.queryItems.items["/store/1"] = std::make_shared<VLQueryItem>(properties);
   framework.transfer.holdsStarts = true;
-  framework.transfer.starts.handTo(
-      [&](const auto& call) { pool->post([call] { call->reply(nullptr); }); });
+  std::atomic<int> thumbnails{0};
+  framework.transfer.starts.handTo([&](const auto& call) {
+    pool->post([&thumbnails, call] {
+      EXPECT_EQ(thumbnails, 0) << "answered before the download was under way";
+      call->reply(nullptr);
+    });
+  });
   // The answer of vald comes on the same thread, which the question does not hold.
   framework.daemon.contentRecords.handTo([&](const auto& call) {
     pool->post([call, document] {
@@ -31,7 +36,6 @@ TEST(ThumbnailThreads, WaitingForADownloadToStartLeavesAThreadForIt) {
 
   const auto extension =
       VLFileProviderExtension::init(std::make_shared<NSExtensionAttributes>(), env.environment);
-  std::atomic<int> thumbnails{0};
   std::atomic<int> completions{0};
   pool->post([&] {
     extension->fetchThumbnailsForItemIdentifiersWithType(
