@@ -14,6 +14,10 @@ using FaultHandler = std::function<void(std::string_view text)>;
 // handler. Called once by main, and by tests that expect a fault. Any thread.
 FaultHandler setFaultHandler(FaultHandler handler);
 
+// From now on the process does not end without a word at an exception that nobody caught: its
+// text goes to the fault handler first. For main, once.
+void reportUncaughtExceptions();
+
 // Reports a fault on the calling thread. Aborts in a debug build unless a handler
 // was set.
 void reportFault(std::string_view text);

@@ -3,7 +3,9 @@
 #include <pthread.h>
 
 #include <algorithm>
+#include <chrono>
 #include <deque>
+#include <optional>
 #include <thread>
 #include <utility>
 #include <vector>
@@ -13,8 +15,8 @@
 namespace skein {
 namespace {
 
-// A pool whose workers all wait may grow, but not without end.
-constexpr std::size_t kMostThreads = 256;
+// How long a spare thread stays for the next wait.
+constexpr auto kSparePatience = std::chrono::seconds(5);
 
 }  // namespace
 
@@ -25,6 +27,8 @@ struct ThreadPool::State : std::enable_shared_from_this<State> {
 
   void run() SKEIN_EXCLUDES(mutex);
   void addThreadIfNeeded() SKEIN_REQUIRES(mutex);
+  // Waits for a task. Nothing when this thread is to end; it is in `ended` then.
+  std::optional<Task> nextTask() SKEIN_EXCLUDES(mutex);
 
   const std::size_t width;
   const std::string name;
@@ -32,6 +36,7 @@ struct ThreadPool::State : std::enable_shared_from_this<State> {
   CondVar workArrived;
   std::deque<Task> tasks SKEIN_GUARDED_BY(mutex);
   std::vector<std::thread> threads SKEIN_GUARDED_BY(mutex);
+  std::vector<std::thread> ended SKEIN_GUARDED_BY(mutex);  // about to return, to be joined
   std::size_t idle SKEIN_GUARDED_BY(mutex) = 0;
   std::size_t waiting SKEIN_GUARDED_BY(mutex) = 0;
   bool stopping SKEIN_GUARDED_BY(mutex) = false;
@@ -40,26 +45,36 @@ struct ThreadPool::State : std::enable_shared_from_this<State> {
 void ThreadPool::State::addThreadIfNeeded() {
   if (idle >= tasks.size()) return;
   if (threads.size() >= std::min(width + waiting, kMostThreads)) return;
+  for (std::thread& thread : ended) thread.join();
+  ended.clear();
   threads.emplace_back([self = shared_from_this()] { self->run(); });
+}
+
+std::optional<Task> ThreadPool::State::nextTask() {
+  MutexLock lock(mutex);
+  while (tasks.empty()) {
+    if (stopping) return std::nullopt;
+    ++idle;
+    const bool woken =
+        workArrived.waitUntil(mutex, std::chrono::steady_clock::now() + kSparePatience);
+    --idle;
+    if (woken || !tasks.empty() || stopping || threads.size() <= width + waiting) continue;
+    const auto own = std::find_if(threads.begin(), threads.end(), [](const std::thread& thread) {
+      return thread.get_id() == std::this_thread::get_id();
+    });
+    if (own == threads.end()) continue;  // the pool's end has it
+    ended.push_back(std::move(*own));
+    threads.erase(own);
+    return std::nullopt;
+  }
+  Task task = std::move(tasks.front());
+  tasks.pop_front();
+  return task;
 }
 
 void ThreadPool::State::run() {
   pthread_setname_np(pthread_self(), name.c_str());
-  for (;;) {
-    Task task;
-    {
-      MutexLock lock(mutex);
-      while (tasks.empty()) {
-        if (stopping) return;
-        ++idle;
-        workArrived.wait(mutex);
-        --idle;
-      }
-      task = std::move(tasks.front());
-      tasks.pop_front();
-    }
-    task();
-  }
+  while (std::optional<Task> task = nextTask()) (*task)();
 }
 
 ThreadPool::ThreadPool(std::size_t width, std::string name)
@@ -76,6 +91,8 @@ ThreadPool::~ThreadPool() {
     {
       MutexLock lock(_state->mutex);
       threads.swap(_state->threads);
+      for (std::thread& thread : _state->ended) threads.push_back(std::move(thread));
+      _state->ended.clear();
     }
     if (threads.empty()) return;
     for (std::thread& thread : threads) {
@@ -104,6 +121,11 @@ void ThreadPool::beginWait() {
 void ThreadPool::endWait() {
   MutexLock lock(_state->mutex);
   --_state->waiting;
+}
+
+std::size_t ThreadPool::threadCount() const {
+  MutexLock lock(_state->mutex);
+  return _state->threads.size();
 }
 
 }  // namespace skein

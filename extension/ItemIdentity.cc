@@ -29,7 +29,7 @@ NSURLPtr ItemIdentity::_URLForItemWithPersistentIdentifier(
   VL_DEBUG(log, "[DEBUG] ┏%llx asked url for %@", section.number(), identifier);
 
   if (identifier == NSFileProviderRootContainerItemIdentifier) {
-    NSURLPtr root = _environment.rootURL.get(_environment.containers);
+    NSURLPtr root = _environment.rootURL.get(_environment.containers, *_environment.executor);
     VL_DEBUG(log, "[DEBUG] returning %@", root);
     return root;
   }

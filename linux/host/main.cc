@@ -15,6 +15,7 @@
 #include <string_view>
 #include <thread>
 
+#include "base/BoundedExecutor.h"
 #include "base/ThreadPool.h"
 #include "extension/VLFileProviderExtension.h"
 #include "linux/framework/LocalFramework.h"
@@ -54,6 +55,10 @@ Exit codes: 0 ended as asked, or another skein-host serves the drive already; 1 
 constexpr int kExitFailure = 1;
 constexpr int kExitUsage = 2;
 constexpr int kExitExtension = 3;
+
+// Each may wait on a thread of its own.
+constexpr std::size_t kMostRunningRequests = 128;
+static_assert(kMostRunningRequests <= ThreadPool::kMostThreads / 2);
 
 struct Arguments {
   std::string store;
@@ -175,7 +180,11 @@ int serve(const Arguments& arguments, const DrivePaths& paths, const FileDescrip
   if (!attributes) return fail(kExitExtension, error->localizedDescription());
 
   const std::shared_ptr<Executor> executor = std::make_shared<ThreadPool>(4, "host");
-  const std::shared_ptr<Timers> timers = std::make_shared<SteadyTimers>(executor);
+  // Clients decide how many requests there are. However many of them wait, threads are left for
+  // what ends a wait; deadlines have their own besides.
+  const auto requestsExecutor = std::make_shared<BoundedExecutor>(executor, kMostRunningRequests);
+  const std::shared_ptr<Timers> timers =
+      std::make_shared<SteadyTimers>(std::make_shared<ThreadPool>(2, "deadlines"));
   const std::shared_ptr<RpcLoop> loop = RpcLoop::start("host-io");
   NSNotificationCenter notificationCenter;
   LocalFramework framework(loop, executor, notificationCenter, *log,
@@ -232,9 +241,10 @@ int serve(const Arguments& arguments, const DrivePaths& paths, const FileDescrip
       host, [drive](HostTarget target, Reply<std::string, NSErrorPtr> reply) {
         drive->findIdentifier(std::move(target), std::move(reply));
       });
-  auto server =
-      HostServer::listen(loop, executor, requests, services, paths.hostSocket, *log, &error);
-  if (!server) return fail(kExitFailure, error->localizedDescription());
+  auto server = HostServer::listen(loop, requestsExecutor, requests, services, paths.hostSocket,
+                                   *log, &error);
+  // At once, as at the end below: what was made above refers to each other.
+  if (!server) std::_Exit(fail(kExitFailure, error->localizedDescription()));
   VL_NOTICE(*log, "[NOTICE] serving %s", paths.store);
   report(parent, 0);
 

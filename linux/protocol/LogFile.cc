@@ -108,6 +108,7 @@ void LogFile::takeFaults(std::shared_ptr<LogFile> log) {
   setFaultHandler([log = std::move(log)](std::string_view text) {
     log->write(LogType::Fault, "[CRIT] " + std::string(text));
   });
+  reportUncaughtExceptions();
 }
 
 }  // namespace skein

@@ -7,6 +7,7 @@
 #include <cstring>
 #include <unordered_map>
 
+#include "base/Numbers.h"
 #include "linux/vald/RandomToken.h"
 #include "linux/vald/files/FileNames.h"
 #include "linux/vald/index/IndexFile.h"
@@ -374,7 +375,16 @@ ChangePage FolderStore::changesSince(std::uint64_t rank, std::uint64_t limit, NS
   auto reader = _readers.lease();
   if (storeFailure(reader, error)) return page;
   std::uint64_t oldest = 0;
-  if (const auto text = reader->setting("oldest rank")) oldest = std::stoull(*text);
+  if (const auto text = reader->setting("oldest rank")) {
+    const auto rank = parseNumber<std::uint64_t>(*text);
+    if (!rank) {
+      error.store(vl_errorWithPOSIXCode(
+          EIO, "The index " + _options.databasePath + " is damaged: \"" + *text +
+                   "\" is no rank. Stop vald and delete the index; it is made anew."));
+      return page;
+    }
+    oldest = *rank;
+  }
   const std::uint64_t newest =
       std::max({reader->number("SELECT max(rank) FROM item"),
                 reader->number("SELECT max(rank) FROM tombstone"), oldest});
@@ -404,7 +414,8 @@ ChangePage FolderStore::changesSince(std::uint64_t rank, std::uint64_t limit, NS
       change.folder = item->holder.id;
       ++item;
     } else {
-      const bool isDrive = tombstone->folder.rawID() == reader->folder(kDriveFolder)->id.rawID();
+      const auto drive = reader->folder(kDriveFolder);
+      const bool isDrive = drive && tombstone->folder.rawID() == drive->id.rawID();
       change.rank = tombstone->rank;
       change.item = makeDeadItem(tombstone->id, tombstone->kind, {tombstone->folder, isDrive});
       change.folder = tombstone->folder;

@@ -4,6 +4,7 @@
 #include <cstring>
 #include <iterator>
 
+#include "base/Numbers.h"
 #include "linux/vald/StoreWriter.h"
 #include "linux/vald/files/StoreRoots.h"
 #include "linux/vald/index/IndexFile.h"
@@ -79,7 +80,7 @@ void StoreWriter::load() {
   checkTrashes(false);
   const auto rankOf = [&](const char* name) {
     const auto text = _index.setting(name);
-    return text ? std::stoull(*text) : 0;
+    return text ? parseNumber<std::uint64_t>(*text).value_or(0) : 0;
   };
   _attributesAt = rankOf(kAttributesRead);
   _attributesUntil = rankOf(kAttributesUntil);

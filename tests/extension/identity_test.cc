@@ -1,8 +1,12 @@
 // Identifiers to URLs and back, the items of both, and the log-in test.
 #include <gtest/gtest.h>
 
+#include <atomic>
+#include <future>
+
 #include "extension/ItemIdentity.h"
 #include "platform/fileprovider/NSFileProviderError.h"
+#include "tests/support/CountingPool.h"
 #include "tests/support/Observers.h"
 #include "tests/support/TestEnvironment.h"
 #include "vellum/VLErrors.h"
@@ -41,12 +45,51 @@ TEST_F(Identity, TheRootsURLIsFoundOnceAndIgnoresLogInFlagsAndLocation) {
   EXPECT_EQ(brief(error), "NSFileProviderErrorDomain -1000 under VLVellumErrorDomain 2");
 }
 
-TEST_F(Identity, AMissingRootIsRememberedToo) {
+TEST_F(Identity, ARootThatCouldNotBeAskedForIsAskedForAgainAndOneWithoutAFolderIsNot) {
   framework.containers.table.clear();
+  EXPECT_FALSE(identity.URLForItemWithPersistentIdentifier(kRoot));
+  framework.containers.add(VLUbiquitousDefaultContainerID, nullptr);
   EXPECT_FALSE(identity.URLForItemWithPersistentIdentifier(kRoot));
   framework.containers.add(VLUbiquitousDefaultContainerID, storeURL());
   EXPECT_FALSE(identity.URLForItemWithPersistentIdentifier(kRoot));
-  EXPECT_EQ(env.runCalls(), Lines{"containers: table"});
+  EXPECT_EQ(env.runCalls(), (Lines{"containers: table", "containers: table"}));
+}
+
+// The table of containers, from a daemon whose answer needs a thread of the pool.
+struct ContainersOverAPool final : VLContainers {
+  explicit ContainersOverAPool(Executor& executor) : _executor(executor) {}
+  VLContainersByID allContainersByContainerID() override {
+    ++questions;
+    const auto answered = std::make_shared<std::promise<void>>();
+    _executor.post([answered] { answered->set_value(); });
+    ScopedWait wait(_executor);
+    if (answered->get_future().wait_for(std::chrono::seconds(20)) != std::future_status::ready) {
+      return {};
+    }
+    return {{VLUbiquitousDefaultContainerID, std::make_shared<VLContainer>(VLContainer::Properties{
+                                                 "default", storeURL(), "default", std::nullopt})}};
+  }
+  VLContainersByID allContainers() override { return {}; }
+
+  std::atomic<int> questions{0};
+
+ private:
+  Executor& _executor;
+};
+
+TEST(RootURLUnderThreads, FirstLookupsOnAPoolOfOneAskOnceAndAllGetIt) {
+  CountingPool pool(1);
+  ContainersOverAPool containers(pool);
+  RootURL rootURL;
+  std::atomic<int> found{0};
+  for (int i = 0; i < 64; ++i) {
+    pool.post([&] {
+      if (rootURL.get(containers, pool)) ++found;
+    });
+  }
+  ASSERT_TRUE(pool.waitIdle());
+  EXPECT_EQ(found, 64);
+  EXPECT_EQ(containers.questions, 1);
 }
 
 TEST_F(Identity, AnIdentifiersURLIsLoggedBeforeItsLocationIsTested) {

@@ -1,5 +1,6 @@
 #include "linux/vald/index/IndexReader.h"
 
+#include "base/Numbers.h"
 #include "linux/vald/scan/StoreNames.h"
 
 namespace skein::vald {
@@ -122,7 +123,8 @@ std::vector<FolderRow> IndexReader::trashes() {
   std::vector<FolderRow> trashes;
   for (const RootRow& root : roots()) {
     const auto key = setting(trashSetting(root.folder));
-    auto trash = key ? folder(std::stoll(*key)) : std::nullopt;
+    const auto number = key ? parseNumber<FolderKey>(*key) : std::nullopt;
+    auto trash = number ? folder(*number) : std::nullopt;
     if (trash) trashes.push_back(std::move(*trash));
   }
   return trashes;
