@@ -1,6 +1,8 @@
 // skein watch, skein changes
 #include <unistd.h>
 
+#include <map>
+#include <string>
 #include <utility>
 
 #include "linux/cli/Commands.h"
@@ -28,7 +30,31 @@ std::string_view wordOf(HostChange::Kind kind) {
   return "changed";
 }
 
-void writeChange(Output& output, const HostChange& change, bool json) {
+// Paths of changed items, by those of their folders, each asked for once. For a moment: the
+// folders move, too.
+class ChangedPaths {
+ public:
+  explicit ChangedPaths(HostService& host) : _host(host) {}
+
+  // Empty where there is none.
+  std::string of(const NSFileProviderItem& item) {
+    if (item.isTrashed()) return {};
+    const auto [at, isNew] = _folders.try_emplace(item.parentItemIdentifier());
+    if (isNew) {
+      at->second = std::get<0>(await<std::string>([&](auto reply) {
+        _host.pathForIdentifier(item.parentItemIdentifier(), std::move(reply));
+      }));
+    }
+    if (at->second.empty()) return {};
+    return (at->second == "/" ? "" : at->second) + '/' + item.filename();
+  }
+
+ private:
+  HostService& _host;
+  std::map<std::string, std::string> _folders;
+};
+
+void writeChange(Output& output, const HostChange& change, bool json, ChangedPaths& paths) {
   if (json) {
     std::string line = "{\"change\":\"" +
                        std::string(change.previousFilename ? "renamed" : wordOf(change.kind)) +
@@ -38,7 +64,7 @@ void writeChange(Output& output, const HostChange& change, bool json) {
               jsonBytes("previousName", *change.previousFilename) + ',';
     }
     if (change.item) {
-      line += jsonMembers(*change.item, "");
+      line += jsonMembers(*change.item, paths.of(*change.item));
     } else {
       line += "\"name\":" + jsonString(change.filename) + jsonBytes("name", change.filename) +
               ",\"id\":" + jsonString(change.identifier);
@@ -84,8 +110,9 @@ int runWatch(HostService& host, const WatchOptions& options) {
     const auto answer = next.waitUntil(end);
     if (!answer) return kSuccess;
     const auto& [changes, problem] = *answer;
+    ChangedPaths paths(host);
     for (const HostChange& change : changes) {
-      writeChange(output, change, options.json);
+      writeChange(output, change, options.json, paths);
       if (++seen == options.count) return kSuccess;
     }
     output.flush();
@@ -117,15 +144,16 @@ int runChanges(HostService& host, const ChangesOptions& options) {
       output.flush();
       return complainAbout(error);
     }
+    ChangedPaths paths(host);
     for (const NSFileProviderItemPtr& item : batch.updates) {
       writeChange(
           output,
           {HostChange::Kind::Changed, item->itemIdentifier(), item->filename(), std::nullopt, item},
-          options.json);
+          options.json, paths);
     }
     for (const std::string& identifier : batch.deletions) {
       writeChange(output, {HostChange::Kind::Deleted, identifier, "", std::nullopt, nullptr},
-                  options.json);
+                  options.json, paths);
     }
     output.flush();
     token = batch.token;

@@ -82,6 +82,7 @@ constexpr Meaning kMeanings[] = {
     {VLVellumErrorDomain, VLVellumErrorDaemonUnreachable, kUnreachable,
      "the drive's processes cannot be reached", kTryAgain},
     {NSPOSIXErrorDomain, EACCES, kRefused, "permission denied", kPermissions},
+    {NSPOSIXErrorDomain, EBUSY, kRefused, "it is in use just now", "try again when that is over"},
     {"SkeinEvictionErrorDomain", kAnyCode, kRefused, "it was not evicted",
      "see its state with: skein stat"},
 };

@@ -9,6 +9,7 @@
 #include <utility>
 
 #include "linux/framework/DocumentURLScope.h"
+#include "linux/protocol/DocumentURL.h"
 #include "vellum/VLErrors.h"
 
 namespace skein {
@@ -44,7 +45,7 @@ NSURLPtr LocalDocuments::vl_documentURLFromFileObjectID(const VLFileObjectID& fi
     daemon.URLForFileObjectID(fileObjectID, std::move(reply));
   });
   if (!url && problem) error.store(std::move(problem));
-  return url;
+  return url ? documentURL(url->path(), fileObjectID) : nullptr;
 }
 
 bool LocalDocuments::vl_isInSyncedLocation(const NSURLPtr& url) {

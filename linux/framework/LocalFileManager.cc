@@ -1,5 +1,6 @@
 #include "linux/framework/LocalFileManager.h"
 
+#include "linux/framework/EvictionOutcome.h"
 #include "linux/framework/FileCall.h"
 
 namespace skein {
@@ -9,6 +10,7 @@ bool LocalFileManager::evictUbiquitousItemAtURL(const NSURLPtr& url, NSErrorOut 
       askFilesForError(_access, [&](LocalFiles& files, const RequestOrigin&, auto reply) {
         files.evict(url, std::move(reply));
       });
+  EvictionOutcomeScope::note(problem);
   if (!problem) return true;
   error.store(std::move(problem));
   return false;

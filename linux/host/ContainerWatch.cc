@@ -13,8 +13,8 @@ using namespace std::chrono_literals;
 // Between attempts while the extension fails.
 constexpr auto kFirstPause = 100ms;
 constexpr auto kLongestPause = 3200ms;
-// Anchors that expire again and again (a folder that changes faster than it is listed) are
-// followed at once this often, then with pauses.
+// Anchors that expire again and again (a folder that changes faster than it is listed, or that
+// can be listed and not be watched) are followed at once this often, then with pauses.
 constexpr unsigned kExpiriesAtOnce = 3;
 
 bool isProviderError(const NSErrorPtr& error, std::int64_t code) {
@@ -75,10 +75,11 @@ class ContainerWatch::RoundObserver final : public NSFileProviderChangeObserver 
   Round _round;
 };
 
-ContainerWatch::ContainerWatch(NSFileProviderItemIdentifier container,
-                               MakeEnumerator makeEnumerator, HostTools tools, Log& log)
+ContainerWatch::ContainerWatch(NSFileProviderItemIdentifier container, Open open,
+                               BeginNews beginNews, HostTools tools, Log& log)
     : _container(std::move(container)),
-      _makeEnumerator(std::move(makeEnumerator)),
+      _open(std::move(open)),
+      _beginNews(std::move(beginNews)),
       _tools(std::move(tools)),
       _log(log),
       _queue("container-watch", _tools.executor) {}
@@ -140,26 +141,47 @@ void ContainerWatch::continueStep(std::uint64_t step, UniqueFunction<void(Contai
 
 void ContainerWatch::open() {
   _state = State::Opening;
+  // Before the first round, so that nothing falls between.
+  if (_beginNews && !_newsOfOthers) {
+    _newsOfOthers = _beginNews([weak = weak_from_this()] {
+      if (const auto self = weak.lock()) self->signal();
+    });
+  }
   const std::uint64_t step = beginStep();
   _tools.executor->post([self = shared_from_this(), step] {
     NSErrorPtr error;
-    auto enumerator = self->_makeEnumerator(&error);
-    self->_queue.async([self, step, enumerator = std::move(enumerator), error] {
+    Opened opened = self->_open(&error);
+    self->_queue.async([self, step, opened = std::move(opened), error]() mutable {
       self->_queue.assumeCurrent();
-      if (self->_step != step) {
-        if (enumerator) enumerator->invalidate();
-        return;
+      if (self->_step == step) {
+        self->didOpen(std::move(opened), error);
+      } else if (opened.enumerator) {
+        opened.enumerator->invalidate();
       }
-      self->endStep();
-      if (!enumerator) {
-        self->didFail(error ? error
-                            : fileProviderErrorForNonExistentItemWithIdentifier(self->_container));
-        return;
-      }
-      self->_enumerator = enumerator;
-      self->rebuild();
     });
   });
+}
+
+void ContainerWatch::didOpen(Opened opened, NSErrorPtr error) {
+  endStep();
+  if (!opened.enumerator) {
+    didFail(error ? error : fileProviderErrorForNonExistentItemWithIdentifier(_container));
+    return;
+  }
+  _enumerator = std::move(opened.enumerator);
+  _folder = std::move(opened.folder);
+  if (dynamic_cast<NSFileProviderChangeEnumerating*>(_enumerator.get()) == nullptr) {
+    end(NSError::errorWithDomain(
+        NSCocoaErrorDomain, NSFeatureUnsupportedError,
+        {{NSLocalizedDescriptionKey, "This container reports no changes."}}));
+    return;
+  }
+  if (_anchor) {
+    _state = State::Resuming;
+    startRound();
+  } else {
+    rebuild();
+  }
 }
 
 // The anchor comes first: what changes while the listing runs is then in the first round,
@@ -169,15 +191,9 @@ void ContainerWatch::rebuild() {
   _inRound = false;
   _fresh.clear();
   _news.clear();
-  auto* changes = dynamic_cast<NSFileProviderChangeEnumerating*>(_enumerator.get());
-  if (changes == nullptr) {
-    end(NSError::errorWithDomain(
-        NSCocoaErrorDomain, NSFeatureUnsupportedError,
-        {{NSLocalizedDescriptionKey, "This container reports no changes."}}));
-    return;
-  }
+  auto& changes = dynamic_cast<NSFileProviderChangeEnumerating&>(*_enumerator);
   const std::uint64_t step = beginStep();
-  changes->currentSyncAnchorWithCompletionHandler(
+  changes.currentSyncAnchorWithCompletionHandler(
       [self = shared_from_this(), step](std::optional<NSFileProviderSyncAnchor> anchor) {
         self->continueStep(step, [anchor = std::move(anchor)](ContainerWatch& watch) mutable {
           watch._queue.assumeCurrent();
@@ -232,38 +248,41 @@ void ContainerWatch::roundDidEnd(Round round) {
   endStep();
   _inRound = false;
   if (round.error) {
-    if (isProviderError(round.error, NSFileProviderErrorSyncAnchorExpired) &&
-        ++_expiries <= kExpiriesAtOnce) {
-      rebuild();
+    if (isProviderError(round.error, NSFileProviderErrorSyncAnchorExpired)) {
+      anchorDidExpire(round.error);
     } else {
       didFail(round.error);
     }
     return;
   }
   _anchor = std::move(round.anchor);
-  if (_state == State::Rebuilding) {
-    apply(round, _fresh);
-    if (round.moreComing) {
-      startRound();
-    } else {
-      becomeLive();
-    }
-    return;
-  }
-  tell(apply(round, _known));
-  if (std::find(round.deletions.begin(), round.deletions.end(), _container) !=
-      round.deletions.end()) {
+  const bool rebuilds = _state == State::Rebuilding;
+  tell(apply(round, rebuilds ? _fresh : _known));
+  // Also while it is being listed: nothing comes of a folder that is gone, not even this again.
+  if (std::any_of(round.deletions.begin(), round.deletions.end(), [this](const auto& identifier) {
+        _queue.assumeCurrent();
+        return isOwnFolder(identifier);
+      })) {
     end(fileProviderErrorForNonExistentItemWithIdentifier(_container));
     return;
   }
-  if (round.moreComing || _hasNews) startRound();
+  if (!rebuilds) {
+    _state = State::Live;
+    _failures = 0;
+    _expiries = 0;
+  }
+  if (round.moreComing || (!rebuilds && _hasNews)) {
+    startRound();
+  } else if (rebuilds) {
+    becomeLive();
+  }
 }
 
 // What was listed takes the place of what was known.
 void ContainerWatch::becomeLive() {
   _state = State::Live;
-  _failures = 0;
-  _expiries = 0;
+  // Not the expiries: a watch that cannot stand expires as soon as it is live.
+  if (_expiries == 0) _failures = 0;
   std::vector<HostChange> changes;
   if (_begun) {
     for (const auto& [identifier, known] : _known) {
@@ -283,12 +302,16 @@ void ContainerWatch::becomeLive() {
   if (_hasNews) startRound();
 }
 
+bool ContainerWatch::isOwnFolder(const NSFileProviderItemIdentifier& identifier) const {
+  return identifier == _container || identifier == _folder;
+}
+
 std::vector<HostChange> ContainerWatch::apply(const Round& round, KnownItems& known) {
   const bool rebuilding = &known == &_fresh;
   std::vector<HostChange> changes;
   for (const NSFileProviderItemPtr& item : round.updates) {
     const NSFileProviderItemIdentifier identifier = item->itemIdentifier();
-    if (identifier == _container) continue;  // the folder itself, not what it holds
+    if (isOwnFolder(identifier)) continue;  // the folder itself, not what it holds
     const KnownItem now = KnownItem::of(*item);
     const auto [place, isNew] = known.try_emplace(identifier, now);
     if (rebuilding) {
@@ -324,19 +347,40 @@ void ContainerWatch::tell(const std::vector<HostChange>& changes) {
 
 // --- Failures and the end.
 
+void ContainerWatch::anchorDidExpire(const NSErrorPtr& error) {
+  _anchor.reset();
+  // This enumerator is new: the anchor was another one's.
+  if (_state == State::Resuming) {
+    rebuild();
+    return;
+  }
+  letGoOfEnumerator();
+  if (++_expiries <= kExpiriesAtOnce) {
+    open();
+  } else {
+    openLater(_expiries - kExpiriesAtOnce - 1, error);
+  }
+}
+
 void ContainerWatch::didFail(const NSErrorPtr& error) {
   endStep();
   letGoOfEnumerator();
+  // The anchor of a state that was not listed to its end.
+  if (_state == State::Rebuilding) _anchor.reset();
   const bool final = isProviderError(error, NSFileProviderErrorNotAuthenticated) ||
                      isProviderError(error, NSFileProviderErrorNoSuchItem);
-  // A first state is not waited for, unless it only changes faster than it can be listed.
-  if (final || (!_begun && !isProviderError(error, NSFileProviderErrorSyncAnchorExpired))) {
+  // A first state is not waited for.
+  if (final || !_begun) {
     end(error);
-    return;
+  } else {
+    openLater(_failures++, error);
   }
+}
+
+void ContainerWatch::openLater(unsigned tries, const NSErrorPtr& error) {
   _state = State::Waiting;
-  const auto pause = std::min<std::chrono::milliseconds>(
-      kFirstPause * (1U << std::min(_failures++, 10U)), kLongestPause);
+  const auto pause = std::min<std::chrono::milliseconds>(kFirstPause * (1U << std::min(tries, 10U)),
+                                                         kLongestPause);
   VL_NOTICE(_log, "[NOTICE] the watch of %@ will try again in %lld ms: %@", _container,
             static_cast<long long>(pause.count()), error);
   const std::uint64_t step = ++_step;
@@ -353,6 +397,8 @@ void ContainerWatch::didFail(const NSErrorPtr& error) {
 void ContainerWatch::end(const NSErrorPtr& error) {
   endStep();
   letGoOfEnumerator();
+  _newsOfOthers = nullptr;
+  _anchor.reset();
   _state = State::Ended;
   _begun = false;
   _failures = 0;
@@ -365,7 +411,6 @@ void ContainerWatch::end(const NSErrorPtr& error) {
 
 void ContainerWatch::letGoOfEnumerator() {
   _inRound = false;
-  _anchor.reset();
   if (const auto listing = std::exchange(_listing, nullptr)) listing->cancel();
   if (const auto enumerator = std::exchange(_enumerator, nullptr)) enumerator->invalidate();
 }

@@ -1,8 +1,11 @@
 #include "linux/host/ContentRequests.h"
 
+#include <cerrno>
 #include <utility>
 
+#include "linux/framework/EvictionOutcome.h"
 #include "platform/foundation/NSFileCoordinatorReadingOptions.h"
+#include "vellum/VLErrors.h"
 
 namespace skein {
 
@@ -19,7 +22,7 @@ std::shared_ptr<ContentRequests::Want> ContentRequests::provide(const NSURLPtr& 
     const auto [at, added] = _entries.try_emplace(path);
     Entry& entry = at->second;
     isFirst = added;
-    const bool joins = !entry.stopping && (!currentVersion || entry.running.currentVersion);
+    const bool joins = !entry.takesNobody && (!currentVersion || entry.running.currentVersion);
     Round& round = isFirst || joins ? entry.running : entry.next;
     if (isFirst) entry.url = url;
     round.currentVersion = round.currentVersion || currentVersion;
@@ -34,24 +37,12 @@ std::shared_ptr<ContentRequests::Want> ContentRequests::provide(const NSURLPtr& 
 }
 
 void ContentRequests::start(const std::string& path, const NSURLPtr& url, const Round& round) {
-  {
-    const RequestProgressScope scope(round.progress);
-    _extension.startProvidingItemAtURL(
-        url, round.currentVersion ? NSFileCoordinatorReadingAlwaysFetches : 0,
-        [self = shared_from_this(), path](const NSErrorPtr& error) {
-          self->didProvide(path, error);
-        });
-  }
-  bool stop = false;
-  {
-    MutexLock lock(_mutex);
-    const auto at = _entries.find(path);
-    // A round that is over, or another one by now, is not this call's to stop.
-    if (at == _entries.end() || at->second.running.progress != round.progress) return;
-    at->second.started = true;
-    stop = at->second.stopping;
-  }
-  if (stop) _extension.stopProvidingItemAtURL(url);
+  const RequestProgressScope scope(round.progress);
+  _extension.startProvidingItemAtURL(
+      url, round.currentVersion ? NSFileCoordinatorReadingAlwaysFetches : 0,
+      [self = shared_from_this(), path](const NSErrorPtr& error) {
+        self->didProvide(path, error);
+      });
 }
 
 void ContentRequests::didProvide(const std::string& path, const NSErrorPtr& error) {
@@ -62,25 +53,59 @@ void ContentRequests::didProvide(const std::string& path, const NSErrorPtr& erro
     MutexLock lock(_mutex);
     const auto at = _entries.find(path);
     if (at == _entries.end()) return;
-    Entry& entry = at->second;
-    answered = std::move(entry.running.wants);
-    if (entry.next.wants.empty()) {
-      _entries.erase(at);
-    } else {
-      url = entry.url;
-      entry.running = std::exchange(entry.next, {});
-      entry.started = entry.stopping = false;
-      toStart.currentVersion = entry.running.currentVersion;
-      toStart.progress = entry.running.progress;
-    }
+    answered = std::move(at->second.running.wants);
+    url = beginNext(at, toStart);
   }
   for (auto& [number, done] : answered) done(error);
   if (url) start(path, url, toStart);
 }
 
+NSURLPtr ContentRequests::beginNext(std::map<std::string, Entry>::iterator at, Round& toStart) {
+  Entry& entry = at->second;
+  if (entry.next.wants.empty()) {
+    _entries.erase(at);
+    return nullptr;
+  }
+  entry.running = std::exchange(entry.next, {});
+  entry.takesNobody = false;
+  toStart.currentVersion = entry.running.currentVersion;
+  toStart.progress = entry.running.progress;
+  return entry.url;
+}
+
+NSErrorPtr ContentRequests::evict(const NSURLPtr& url) {
+  const std::string path = url->path();
+  const auto busy = [&path] {
+    return vl_errorWithPOSIXCode(EBUSY, path +
+                                            " is being fetched or given up just now; wait for "
+                                            "that or interrupt it, then try again.");
+  };
+  {
+    MutexLock lock(_mutex);
+    const auto [at, isFree] = _entries.try_emplace(path);
+    if (!isFree) return busy();
+    at->second.url = url;
+    at->second.takesNobody = true;
+  }
+  NSErrorPtr error;
+  {
+    const EvictionOutcomeScope outcome;
+    _extension.stopProvidingItemAtURL(url);
+    error = outcome.wasAsked() ? outcome.error() : busy();
+  }
+  NSURLPtr next;
+  Round toStart;
+  {
+    MutexLock lock(_mutex);
+    next = beginNext(_entries.find(path), toStart);
+  }
+  if (next) start(path, next, toStart);
+  return error;
+}
+
 void ContentRequests::giveUp(const std::string& path, std::uint64_t number) {
   Done dropped;
-  NSURLPtr toStop;
+  std::shared_ptr<RequestProgress> toCancel;
   {
     MutexLock lock(_mutex);
     const auto at = _entries.find(path);
@@ -92,11 +117,11 @@ void ContentRequests::giveUp(const std::string& path, std::uint64_t number) {
         round->wants.erase(want);
       }
     }
-    if (!dropped || entry.stopping || !entry.running.wants.empty()) return;
-    entry.stopping = true;
-    if (entry.started) toStop = entry.url;
+    if (!dropped || entry.takesNobody || !entry.running.wants.empty()) return;
+    entry.takesNobody = true;
+    toCancel = entry.running.progress;
   }
-  if (toStop) _extension.stopProvidingItemAtURL(toStop);
+  toCancel->cancel();
 }
 
 }  // namespace skein

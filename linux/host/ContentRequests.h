@@ -12,9 +12,11 @@
 
 namespace skein {
 
-// Who wants which file's contents. The extension hears of a file once, however many want it,
-// and is told to stop when nobody does any more: to stop a file that it is not providing
-// would evict it. Any thread.
+// Who wants which file's contents. The extension hears of a file once, however many want it.
+// When nobody does any more, the transfer that was begun for them is cancelled by its own
+// progress. The extension is told to stop only to give a file up: it would find the transfer by
+// the file's path, and in a transfer's last instant find none and evict the file, or find that
+// of somebody who came since. Any thread.
 class ContentRequests final : public std::enable_shared_from_this<ContentRequests> {
  public:
   using Done = UniqueFunction<void(NSErrorPtr)>;
@@ -29,6 +31,10 @@ class ContentRequests final : public std::enable_shared_from_this<ContentRequest
   std::shared_ptr<Want> provide(const NSURLPtr& url, bool currentVersion, Done done)
       SKEIN_EXCLUDES(_mutex);
 
+  // Has the extension give the file up; returns when it has, with null, or why it has not: not
+  // while somebody wants it. Who comes meanwhile is served when this is over. Waits for vald.
+  NSErrorPtr evict(const NSURLPtr& url) SKEIN_EXCLUDES(_mutex);
+
  private:
   // Wants that the extension serves with one call.
   struct Round {
@@ -39,14 +45,18 @@ class ContentRequests final : public std::enable_shared_from_this<ContentRequest
   struct Entry {
     NSURLPtr url;
     Round running;
-    bool started = false;  // the extension's call has returned
-    bool stopping = false;
+    // It is being cancelled, or is an eviction.
+    bool takesNobody = false;
     Round next;  // wants that came too late for the running one
   };
 
   void start(const std::string& path, const NSURLPtr& url, const Round& round)
       SKEIN_EXCLUDES(_mutex);
   void didProvide(const std::string& path, const NSErrorPtr& error) SKEIN_EXCLUDES(_mutex);
+  // The next round takes the place of the one that has ended: answers the URL to start it
+  // with. Null, and the path is forgotten, when nobody waits for one.
+  NSURLPtr beginNext(std::map<std::string, Entry>::iterator at, Round& toStart)
+      SKEIN_REQUIRES(_mutex);
   void giveUp(const std::string& path, std::uint64_t number) SKEIN_EXCLUDES(_mutex);
 
   NSFileProviderExtension& _extension;

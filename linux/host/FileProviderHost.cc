@@ -63,12 +63,21 @@ FileProviderHost::FileProviderHost(HostTools tools, std::unique_ptr<WorkingSetNe
 
 FileProviderHost::~FileProviderHost() = default;
 
-void FileProviderHost::setExtension(std::shared_ptr<NSFileProviderExtension> extension) {
+void FileProviderHost::setExtension(std::shared_ptr<NSFileProviderExtension> extension,
+                                    bool supportsEnumeration) {
   _extension = std::move(extension);
+  _supportsEnumeration = supportsEnumeration;
 }
 
 std::shared_ptr<NSFileProviderEnumerator> FileProviderHost::makeEnumerator(
     const NSFileProviderItemIdentifier& container, NSErrorOut error) {
+  if (!_supportsEnumeration) {
+    error.store(NSError::errorWithDomain(
+        NSCocoaErrorDomain, NSFeatureUnsupportedError,
+        {{NSLocalizedDescriptionKey,
+          "The extension's attributes say that its folders cannot be listed."}}));
+    return nullptr;
+  }
   NSErrorPtr problem;
   auto enumerator = _extension->enumeratorForContainerItemIdentifier(container, &problem);
   if (!enumerator) {
@@ -102,33 +111,46 @@ void FileProviderHost::list(const NSFileProviderItemIdentifier& container,
 std::shared_ptr<FileProviderHost::Subscription> FileProviderHost::watch(
     const NSFileProviderItemIdentifier& container, std::shared_ptr<ContainerWatcher> watcher) {
   std::shared_ptr<ContainerWatch> watch;
-  bool startNews = false;
   {
     MutexLock lock(_mutex);
     Watched& watched = _watched[container];
-    if (!watched.watch) {
-      watched.watch = std::make_shared<ContainerWatch>(
-          container,
-          [weak = weak_from_this(),
-           container](NSErrorOut error) -> std::shared_ptr<NSFileProviderEnumerator> {
-            const auto self = weak.lock();
-            return self ? self->makeEnumerator(container, error) : nullptr;
-          },
-          _tools, _log);
-      startNews = _news && container == NSFileProviderWorkingSetContainerItemIdentifier;
-    }
+    if (!watched.watch) watched.watch = makeWatch(container);
     ++watched.watchers;
     watch = watched.watch;
-  }
-  // Before the first round, so that nothing falls between.
-  if (startNews) {
-    _news->start([weak = std::weak_ptr(watch)] {
-      if (const auto current = weak.lock()) current->signal();
-    });
   }
   watch->addWatcher(watcher);
   return std::make_shared<Subscription>(shared_from_this(), container, std::move(watch),
                                         std::move(watcher));
+}
+
+ContainerWatch::Opened FileProviderHost::open(const NSFileProviderItemIdentifier& container,
+                                              NSErrorOut error) {
+  ContainerWatch::Opened opened{makeEnumerator(container, error), container};
+  if (!opened.enumerator || isReserved(container)) return opened;
+  // An alias has the URL of what it leads to.
+  if (const NSURLPtr url = _extension->URLForItemWithPersistentIdentifier(container)) {
+    const auto folder = _extension->persistentIdentifierForItemAtURL(url);
+    if (folder) opened.folder = *folder;
+  }
+  return opened;
+}
+
+std::shared_ptr<ContainerWatch> FileProviderHost::makeWatch(
+    const NSFileProviderItemIdentifier& container) {
+  ContainerWatch::BeginNews beginNews;
+  if (_news && container == NSFileProviderWorkingSetContainerItemIdentifier) {
+    beginNews = [weak = weak_from_this()](std::function<void()> handler) -> std::shared_ptr<void> {
+      const auto self = weak.lock();
+      return self ? self->_news->begin(std::move(handler)) : nullptr;
+    };
+  }
+  return std::make_shared<ContainerWatch>(
+      container,
+      [weak = weak_from_this(), container](NSErrorOut error) {
+        const auto self = weak.lock();
+        return self ? self->open(container, error) : ContainerWatch::Opened();
+      },
+      std::move(beginNews), _tools, _log);
 }
 
 void FileProviderHost::leave(const NSFileProviderItemIdentifier& container,
@@ -141,7 +163,6 @@ void FileProviderHost::leave(const NSFileProviderItemIdentifier& container,
     if (watched == _watched.end() || --watched->second.watchers > 0) return;
     _watched.erase(watched);
   }
-  if (_news && container == NSFileProviderWorkingSetContainerItemIdentifier) _news->stop();
 }
 
 void FileProviderHost::workingSetChanges(std::optional<NSFileProviderSyncAnchor> fromSyncAnchor,
@@ -175,10 +196,10 @@ void FileProviderHost::signalEnumeratorForContainerItemIdentifier(
   bool known = false;
   {
     MutexLock lock(_mutex);
-    known = isReserved(identifier) || _known.contains(identifier);
     if (const auto watched = _watched.find(identifier); watched != _watched.end()) {
       watch = watched->second.watch;
     }
+    known = watch || isReserved(identifier) || _known.contains(identifier);
   }
   if (watch) watch->signal();
   if (!completionHandler) return;

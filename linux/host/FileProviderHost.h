@@ -21,9 +21,9 @@ namespace skein {
 class WorkingSetNews {
  public:
   virtual ~WorkingSetNews() = default;
-  // From now on `handler` runs, on any thread, whenever something may have changed.
-  virtual void start(std::function<void()> handler) = 0;
-  virtual void stop() = 0;
+  // From now on `handler` runs, on any thread, whenever something may have changed, until what
+  // is answered is let go of. Asks without waiting.
+  virtual std::shared_ptr<void> begin(std::function<void()> handler) = 0;
 };
 
 // The platform's part around one extension: makes enumerators, asks them for pages and
@@ -39,8 +39,10 @@ class FileProviderHost final : public NSFileProviderManager,
   FileProviderHost(HostTools tools, std::unique_ptr<WorkingSetNews> news, Log& log);
   ~FileProviderHost() override;
 
-  // Before the first request; the extension needs the host as its manager to be made.
-  void setExtension(std::shared_ptr<NSFileProviderExtension> extension);
+  // Before the first request; the extension needs the host as its manager to be made. One
+  // that does not support enumeration is never asked for an enumerator.
+  void setExtension(std::shared_ptr<NSFileProviderExtension> extension,
+                    bool supportsEnumeration = true);
   NSFileProviderExtension& extension() const { return *_extension; }
   const HostTools& tools() const { return _tools; }
 
@@ -59,7 +61,8 @@ class FileProviderHost final : public NSFileProviderManager,
                          Reply<HostChangeBatch, NSErrorPtr> reply);
 
   // signalEnumeratorForContainerItemIdentifier:completionHandler:
-  // A container that this host never made an enumerator for is unknown.
+  // A container that this host never made an enumerator for is unknown, one that is watched
+  // never.
   void signalEnumeratorForContainerItemIdentifier(const NSFileProviderItemIdentifier& identifier,
                                                   Completion<NSErrorPtr> completionHandler) override
       SKEIN_EXCLUDES(_mutex);
@@ -74,6 +77,8 @@ class FileProviderHost final : public NSFileProviderManager,
 
   std::shared_ptr<NSFileProviderEnumerator> makeEnumerator(
       const NSFileProviderItemIdentifier& container, NSErrorOut error) SKEIN_EXCLUDES(_mutex);
+  ContainerWatch::Opened open(const NSFileProviderItemIdentifier& container, NSErrorOut error);
+  std::shared_ptr<ContainerWatch> makeWatch(const NSFileProviderItemIdentifier& container);
   void leave(const NSFileProviderItemIdentifier& container,
              const std::shared_ptr<ContainerWatch>& watch,
              const std::shared_ptr<ContainerWatcher>& watcher) SKEIN_EXCLUDES(_mutex);
@@ -82,6 +87,7 @@ class FileProviderHost final : public NSFileProviderManager,
   const std::unique_ptr<WorkingSetNews> _news;
   Log& _log;
   std::shared_ptr<NSFileProviderExtension> _extension;
+  bool _supportsEnumeration = true;
   mutable Mutex _mutex;
   std::unordered_map<NSFileProviderItemIdentifier, Watched> _watched SKEIN_GUARDED_BY(_mutex);
   // Containers that an enumerator was made for. Forgotten all at once when they get many:

@@ -172,10 +172,16 @@ void HostFileRequests::contents(HostTarget target, bool currentVersion,
 }
 
 void HostFileRequests::evict(HostTarget target, Reply<NSErrorPtr> reply) {
-  askDaemon(std::move(target), std::move(reply),
-            [](LocalFiles& files, const NSURLPtr& url, Reply<NSErrorPtr> done) {
-              files.evict(url, std::move(done));
-            });
+  _drive->withDrive<>(
+      std::move(reply),
+      [drive = _drive, contents = _contents,
+       target = std::move(target)](const std::shared_ptr<TimedReply<>>& timed) {
+        NSErrorPtr error;
+        const NSURLPtr url = urlOf(*drive, target, &error);
+        if (url) error = contents->evict(url);
+        (*timed)(error);
+      },
+      kChangeDeadline);
 }
 
 void HostFileRequests::setPinned(HostTarget target, bool pinned, Reply<NSErrorPtr> reply) {

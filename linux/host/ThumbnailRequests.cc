@@ -40,6 +40,12 @@ void begin(const DriveRequests& drive, const std::vector<HostTarget>& targets, N
     }
   }
   stream->expect(std::move(expected));
+  // A folder without a picture like any other. The extension takes it for an unknown item, as
+  // its name is no identifier of the daemon's.
+  const std::string root = NSFileProviderRootContainerItemIdentifier;
+  if (std::erase(identifiers, root) > 0) {
+    stream->thumbnailDidCome(root, std::nullopt, std::nullopt, nullptr);
+  }
   const DocumentURLScope urls(drive.daemon(), *drive.tools().executor, documents);
   stream->setProgress(drive.extension().fetchThumbnailsForItemIdentifiersWithType(
       identifiers, size,

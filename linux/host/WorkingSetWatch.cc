@@ -3,6 +3,8 @@
 #include <utility>
 #include <vector>
 
+#include "base/Mutex.h"
+
 namespace skein {
 namespace {
 
@@ -110,28 +112,10 @@ class WorkingSetWatch::Link final : public VLItemNotificationReceiving,
   bool _waiting SKEIN_GUARDED_BY(_mutex) = false;
 };
 
-WorkingSetWatch::WorkingSetWatch(DaemonProxies daemon, std::shared_ptr<Timers> timers)
-    : _daemon(std::move(daemon)), _timers(std::move(timers)) {}
-
-WorkingSetWatch::~WorkingSetWatch() { stop(); }
-
-void WorkingSetWatch::start(std::function<void()> handler) {
-  stop();
-  auto link = std::make_shared<Link>(_daemon, _timers, std::move(handler));
-  {
-    MutexLock lock(_mutex);
-    _link = link;
-  }
+std::shared_ptr<void> WorkingSetWatch::begin(std::function<void()> handler) {
+  const auto link = std::make_shared<Link>(_daemon, _timers, std::move(handler));
   link->begin();
-}
-
-void WorkingSetWatch::stop() {
-  std::shared_ptr<Link> link;
-  {
-    MutexLock lock(_mutex);
-    link = std::exchange(_link, nullptr);
-  }
-  if (link) link->end();
+  return {link.get(), [link](void*) { link->end(); }};
 }
 
 }  // namespace skein

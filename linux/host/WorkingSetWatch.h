@@ -2,8 +2,8 @@
 
 #include <functional>
 #include <memory>
+#include <utility>
 
-#include "base/Mutex.h"
 #include "linux/host/FileProviderHost.h"
 #include "linux/host/Timers.h"
 #include "linux/protocol/LocalDaemon.h"
@@ -14,23 +14,21 @@ namespace skein {
 using DaemonProxies =
     std::function<std::shared_ptr<LocalDaemon>(std::function<void(NSErrorPtr)> errorHandler)>;
 
-// News of the working set: what vald pushes about the whole drive, taken as a hint alone.
-// While the link to vald is broken it is made anew, with pauses. Any thread.
+// News of the working set: what vald pushes about the whole drive, the app containers with
+// it, taken as a hint alone. While the link to vald is broken it is made anew, with pauses.
+// Any thread.
 class WorkingSetWatch final : public WorkingSetNews {
  public:
-  WorkingSetWatch(DaemonProxies daemon, std::shared_ptr<Timers> timers);
-  ~WorkingSetWatch() override;
+  WorkingSetWatch(DaemonProxies daemon, std::shared_ptr<Timers> timers)
+      : _daemon(std::move(daemon)), _timers(std::move(timers)) {}
 
-  void start(std::function<void()> handler) override SKEIN_EXCLUDES(_mutex);
-  void stop() override SKEIN_EXCLUDES(_mutex);
+  std::shared_ptr<void> begin(std::function<void()> handler) override;
 
  private:
   class Link;
 
   const DaemonProxies _daemon;
   const std::shared_ptr<Timers> _timers;
-  Mutex _mutex;
-  std::shared_ptr<Link> _link SKEIN_GUARDED_BY(_mutex);
 };
 
 }  // namespace skein

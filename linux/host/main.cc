@@ -175,10 +175,6 @@ int serve(const Arguments& arguments, const DrivePaths& paths, const FileDescrip
   log->setEnabled(LogType::Info, arguments.logLevel != "notice");
   log->setEnabled(LogType::Debug, arguments.logLevel == "debug");
 
-  const auto attributes = readExtensionAttributes(
-      arguments.attributes.empty() ? attributesPath() : arguments.attributes, &error);
-  if (!attributes) return fail(kExitExtension, error->localizedDescription());
-
   const std::shared_ptr<Executor> executor = std::make_shared<ThreadPool>(4, "host");
   // Clients decide how many requests there are. However many of them wait, threads are left for
   // what ends a wait; deadlines have their own besides.
@@ -227,13 +223,11 @@ int serve(const Arguments& arguments, const DrivePaths& paths, const FileDescrip
        [&environment](std::shared_ptr<const NSExtensionAttributes> given) {
          return VLFileProviderExtension::init(std::move(given), environment);
        }}};
-  auto extension = NSExtensionInstantiatePrincipalClass(attributes, classes, &error);
-  if (!extension) {
+  if (!NSExtensionMain(arguments.attributes.empty() ? attributesPath() : arguments.attributes,
+                       classes, *host, &error)) {
     VL_ERROR(*log, "[ERROR] %s", error->localizedDescription());
     return fail(kExitExtension, error->localizedDescription());
   }
-  host->setExtension(std::move(extension));
-
   const auto drive = std::make_shared<DriveRequests>(host, daemon, framework.containers());
   const auto requests =
       std::make_shared<HostRequests>(drive, std::make_unique<HostFileRequests>(drive), *log);

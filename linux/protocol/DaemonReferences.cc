@@ -3,6 +3,7 @@
 #include <utility>
 
 #include "linux/protocol/Answer.h"
+#include "linux/protocol/DocumentURL.h"
 #include "linux/protocol/LinkBreaking.h"
 #include "vellum/VLErrors.h"
 
@@ -134,7 +135,8 @@ kj::Promise<void> SenderObject::boostPriority(BoostPriorityContext context) {
 
 kj::Promise<void> SenderObject::watchItem(WatchItemContext context) {
   const auto params = context.getParams();
-  const NSURLPtr url = urlFromClient(params.getUrl());
+  NSURLPtr url = urlFromClient(params.getUrl());
+  if (url && params.hasItem()) url = documentURL(url->path(), codec::decode(params.getItem()));
   const std::uint64_t options = params.getOptions();
   return answer(
       _service, context,

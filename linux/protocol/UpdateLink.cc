@@ -4,6 +4,8 @@
 
 #include <utility>
 
+#include "linux/protocol/DocumentURL.h"
+
 namespace skein {
 namespace {
 
@@ -45,6 +47,9 @@ class SendingProxy final : public VLItemNotificationSender {
           auto request = sender.watchItemRequest();
           if (url) request.setUrl(codec::bytes(url->path()));
           request.setOptions(options);
+          if (const auto item = fileObjectIDOfDocumentURL(url)) {
+            codec::encode(request.initItem(), *item);
+          }
           return request.send().then([reply = std::move(reply)](auto&& results) mutable -> Task {
             return [reply = std::move(reply), error = codec::errorOf(results)]() mutable {
               reply(std::move(error));

@@ -93,7 +93,8 @@ interface Daemon extends(Cloud.Cloud, Files.Files, Records.Records, Shares.Share
 # vald's end of one watch; vald lets go of it with the last reference.
 interface Sender {
   boostPriority @0 ();
-  watchItem @1 (url :Data, options :UInt64) -> (error :Types.Error);
+  # The item, wherever it is; where none is named, what is at the URL.
+  watchItem @1 (url :Data, options :UInt64, item :Types.ObjectID) -> (error :Types.Error);
   invalidate @2 ();
 }
 

@@ -4,7 +4,9 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <cstdlib>
 #include <cstring>
+#include <memory>
 #include <unordered_map>
 
 #include "base/Numbers.h"
@@ -190,15 +192,32 @@ Page FolderStore::list(const FolderRow& folder, SortOrder order, std::uint64_t o
   return page;
 }
 
+std::optional<VLFileObjectID> FolderStore::targetOfAlias(VLFileObjectID id) {
+  const VLQueryItemPtr alias = itemWithID(id, nullptr);
+  if (!alias || alias->properties().kind != VLQueryItem::Kind::Alias) return std::nullopt;
+  const auto path = pathForID(id, nullptr);
+  if (!path) return std::nullopt;
+  const std::unique_ptr<char, decltype(&std::free)> target(realpath(path->c_str(), nullptr),
+                                                           &std::free);
+  if (!target) return std::nullopt;
+  const VLQueryItemPtr folder = itemAtPath(target.get(), false, nullptr);
+  return folder && folder->isFolder() ? std::optional(folder->fileObjectID()) : std::nullopt;
+}
+
 Page FolderStore::listFolder(std::optional<VLFileObjectID> folder, SortOrder order,
                              std::uint64_t offset, std::uint64_t limit, NSErrorOut error) {
   if (!rootIsThere(error)) return {};
   std::optional<FolderRow> row;
-  {
+  const auto find = [&](const std::optional<VLFileObjectID>& id) {
     auto reader = _readers.lease();
-    if (storeFailure(reader, error)) return {};
-    row = folder ? reader->folderWithID(*folder) : reader->folder(kDriveFolder);
-    if (storeFailure(reader, error)) return {};
+    if (storeFailure(reader, error)) return false;
+    row = id ? reader->folderWithID(*id) : reader->folder(kDriveFolder);
+    return !storeFailure(reader, error);
+  };
+  if (!find(folder)) return {};
+  if (!row) {
+    const auto target = folder ? targetOfAlias(*folder) : std::nullopt;
+    if (target && !find(target)) return {};
   }
   if (!row) {
     error.store(noSuchFile("There is no folder " + (folder ? folder->asString() : "") + "."));

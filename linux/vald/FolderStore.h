@@ -93,6 +93,8 @@ class FolderStore final : public Store {
   // Looks at a folder that was not read yet, or is not watched. False with an error when
   // it cannot be read.
   bool ensureRead(const FolderRow& folder, bool isFirstPage, NSErrorOut error);
+  // Of the folder that an alias of this identifier leads to; nil when there is none.
+  std::optional<VLFileObjectID> targetOfAlias(VLFileObjectID id);
   Page list(const FolderRow& folder, SortOrder order, std::uint64_t offset, std::uint64_t limit,
             NSErrorOut error);
   // The root, or its trash, that a path lies in, and the way from there.

@@ -3,7 +3,9 @@
 #include <string>
 #include <utility>
 
+#include "linux/protocol/DocumentURL.h"
 #include "linux/vald/WatchScope.h"
+#include "platform/fileprovider/NSFileProviderItem.h"
 #include "vellum/VLErrors.h"
 
 namespace skein::vald {
@@ -18,6 +20,15 @@ NSErrorPtr changesLost() {
   return vellumError(VLVellumErrorChangesLost,
                      "Too many changes came at once to tell them one by one; list the folder "
                      "again.");
+}
+
+NSErrorPtr watchFailed(const NSURLPtr& url, const NSErrorPtr& reason) {
+  return NSError::errorWithDomain(
+      VLVellumErrorDomain, VLVellumErrorChangesLost,
+      {{NSLocalizedDescriptionKey,
+        url->path() + " cannot be watched, so list the folder again: " +
+            (reason ? reason->localizedDescription() : "there is no item.")},
+       {NSUnderlyingErrorKey, reason}});
 }
 
 NSErrorPtr invalidated() {
@@ -91,14 +102,16 @@ void ItemUpdateSender::watchItemAtURL(const NSURLPtr& url, std::uint64_t options
 
 void ItemUpdateSender::gather(const NSURLPtr& url, Reply<NSErrorPtr> gatherReply) {
   NSErrorPtr error;
-  const VLQueryItemPtr item = _store.itemAtPath(url->path(), true, &error);
+  const auto id = fileObjectIDOfDocumentURL(url);
+  const VLQueryItemPtr item =
+      id ? _store.itemWithID(*id, &error) : _store.itemAtPath(url->path(), true, &error);
   if (!item) {
     {
       MutexLock lock(_mutex);
       if (_state == State::Gathering) _state = State::Idle;
       _undecided.clear();
     }
-    gatherReply(error);
+    gatherReply(watchFailed(url, error));
     return;
   }
 
@@ -109,6 +122,7 @@ void ItemUpdateSender::gather(const NSURLPtr& url, Reply<NSErrorPtr> gatherReply
     if (_state == State::Gathering) {
       _state = State::Watching;
       _folder = folder;
+      _everything = _subtree && item->itemIdentifier() == NSFileProviderRootContainerItemIdentifier;
       _retainsFolderWatch = item->isFolder();
       schedule();
     } else {
@@ -154,11 +168,12 @@ void ItemUpdateSender::storeDidChange(const std::vector<StoreChange>& changes) {
   {
     MutexLock lock(_mutex);
     if (_state != State::Gathering && _state != State::Watching) return;
-    const bool decideLater = _state == State::Gathering || _subtree || !_undecided.empty();
+    const bool decideLater =
+        _state == State::Gathering || (_subtree && !_everything) || !_undecided.empty();
     for (const StoreChange& change : changes) {
       if (decideLater) {
         _undecided.push_back(change);
-      } else if (VLQueryItemPtr seen = seenByChildrenWatch(*_folder, change)) {
+      } else if (VLQueryItemPtr seen = seenWithoutAsking(change)) {
         _pending.add(std::move(seen));
       }
       tooMuch = hasTooMuch();
@@ -172,13 +187,15 @@ void ItemUpdateSender::storeDidChange(const std::vector<StoreChange>& changes) {
 void ItemUpdateSender::storeDidOverflow(const VLFileObjectID& folder) {
   std::optional<VLFileObjectID> watched;
   bool subtree = false;
+  bool everything = false;
   {
     MutexLock lock(_mutex);
     if (_state != State::Gathering && _state != State::Watching) return;
     watched = _folder;
     subtree = _subtree;
+    everything = _everything;
   }
-  if (watched && *watched != folder) {
+  if (watched && *watched != folder && !everything) {
     const auto path = _store.pathForID(folder, nullptr);
     const auto watchedPath = _store.pathForID(*watched, nullptr);
     // Where either cannot be told any more, nothing may be taken for untouched.
@@ -221,13 +238,11 @@ bool ItemUpdateSender::decideSome() {
   {
     MutexLock lock(_mutex);
     if (_state != State::Watching || _undecided.empty()) return false;
-    if (!_subtree) {
+    if (!_subtree || _everything) {
       // What came while gathering. The lock is kept, so that the next change finds
       // nothing undecided before it.
       for (const StoreChange& change : _undecided) {
-        if (VLQueryItemPtr seen = seenByChildrenWatch(*_folder, change)) {
-          _pending.add(std::move(seen));
-        }
+        if (VLQueryItemPtr seen = seenWithoutAsking(change)) _pending.add(std::move(seen));
       }
       _undecided.clear();
       return false;
@@ -283,6 +298,10 @@ void ItemUpdateSender::schedule() {
   _executor->post([weak = weak_from_this()] {
     if (const auto self = weak.lock()) self->run();
   });
+}
+
+VLQueryItemPtr ItemUpdateSender::seenWithoutAsking(const StoreChange& change) const {
+  return _everything ? change.item : seenByChildrenWatch(*_folder, change);
 }
 
 bool ItemUpdateSender::hasTooMuch() const {

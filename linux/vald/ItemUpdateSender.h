@@ -44,8 +44,12 @@ class ItemUpdateSender final : public VLItemNotificationSender,
 
   // What changes from this very call on is pushed, so that a client may list the folder
   // without waiting for the reply. One watch in a sender's life; after a failed one it may
-  // try again. An item that leaves the folder is pushed as dead. A folder that is moved
-  // into or out of a watched subtree is pushed as one item, without what it holds.
+  // try again. A URL that says whose place it is watches that item, wherever it is now. A
+  // watch that cannot begin answers VLVellumErrorChangesLost, whatever kept it from it: the
+  // client has listed by then, and only an error of that domain makes it ask again. The drive
+  // with its subtree has the app containers with it. An item that leaves the folder is pushed as
+  // dead. A folder that is moved into or out of a watched subtree is pushed as one item, without
+  // what it holds.
   void watchItemAtURL(const NSURLPtr& url, std::uint64_t options,
                       Reply<NSErrorPtr> gatherReply) override SKEIN_EXCLUDES(_mutex);
   void invalidate() override SKEIN_EXCLUDES(_mutex);
@@ -79,6 +83,8 @@ class ItemUpdateSender final : public VLItemNotificationSender,
   void push() SKEIN_EXCLUDES(_mutex);
   void pushWasAnswered() SKEIN_EXCLUDES(_mutex);
   void schedule() SKEIN_REQUIRES(_mutex);
+  // What a watch sees of a change that need not ask the store; null: nothing.
+  VLQueryItemPtr seenWithoutAsking(const StoreChange& change) const SKEIN_REQUIRES(_mutex);
   bool hasTooMuch() const SKEIN_REQUIRES(_mutex);
   // Ends with `reason`, once, and gives out the handlers that hear of a broken link.
   Handlers end(NSErrorPtr reason, bool linkBroke) SKEIN_EXCLUDES(_mutex);
@@ -91,6 +97,7 @@ class ItemUpdateSender final : public VLItemNotificationSender,
   State _state SKEIN_GUARDED_BY(_mutex) = State::Idle;
   bool _boosted SKEIN_GUARDED_BY(_mutex) = false;
   bool _subtree SKEIN_GUARDED_BY(_mutex) = false;
+  bool _everything SKEIN_GUARDED_BY(_mutex) = false;  // the drive with its subtree
   bool _scheduled SKEIN_GUARDED_BY(_mutex) = false;
   bool _pushUnderWay SKEIN_GUARDED_BY(_mutex) = false;
   bool _retainsFolderWatch SKEIN_GUARDED_BY(_mutex) = false;

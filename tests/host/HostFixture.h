@@ -139,9 +139,40 @@ class FakeExtension final : public NSFileProviderExtension {
     return enumerators.back();
   }
 
+  // An alias has the URL of what it leads to.
+  NSURLPtr URLForItemWithPersistentIdentifier(
+      const NSFileProviderItemIdentifier& identifier) override {
+    const auto target = aliases.find(identifier);
+    return NSURL::fileURLWithPath('/' + (target != aliases.end() ? target->second : identifier));
+  }
+  std::optional<NSFileProviderItemIdentifier> persistentIdentifierForItemAtURL(
+      const NSURLPtr& url) override {
+    return url->lastPathComponent();
+  }
+
   NSErrorPtr error;
+  std::map<std::string, std::string> aliases;
   std::vector<std::string> calls;
   std::vector<std::shared_ptr<FakeEnumerator>> enumerators;
+};
+
+// News that a test tells; counts who listens.
+class FakeNews final : public WorkingSetNews {
+ public:
+  std::shared_ptr<void> begin(std::function<void()> handler) override {
+    handlers.push_back(std::move(handler));
+    return std::make_shared<Listening>(listeners);
+  }
+
+  std::vector<std::function<void()>> handlers;
+  int listeners = 0;
+
+ private:
+  struct Listening {
+    explicit Listening(int& count) : listeners(count) { ++listeners; }
+    ~Listening() { --listeners; }
+    int& listeners;
+  };
 };
 
 // Keeps what it hears as words: "+id name", "~id name", "-id name", "begin", "end code".
@@ -189,8 +220,9 @@ class HostTest : public testing::Test {
   FakeEnumerator& enumerator(std::size_t index = 0) { return *extension->enumerators.at(index); }
   // Watches a folder that holds `items`, and has it go live.
   std::shared_ptr<FileProviderHost::Subscription> watchLive(const std::shared_ptr<Watcher>& watcher,
-                                                            const NSFileProviderItems& items) {
-    auto subscription = host->watch("i1", watcher);
+                                                            const NSFileProviderItems& items,
+                                                            const std::string& container = "i1") {
+    auto subscription = host->watch(container, watcher);
     run();
     enumerator().givePage(items);
     run();
@@ -206,8 +238,9 @@ class HostTest : public testing::Test {
   const std::shared_ptr<ManualTimers> timers = std::make_shared<ManualTimers>(executor);
   NoLog log;
   const std::shared_ptr<FakeExtension> extension = std::make_shared<FakeExtension>();
-  const std::shared_ptr<FileProviderHost> host =
-      std::make_shared<FileProviderHost>(HostTools{executor, timers}, nullptr, log);
+  FakeNews* const news = new FakeNews;  // the host's
+  const std::shared_ptr<FileProviderHost> host = std::make_shared<FileProviderHost>(
+      HostTools{executor, timers}, std::unique_ptr<WorkingSetNews>(news), log);
   const std::shared_ptr<Watcher> watcher = std::make_shared<Watcher>();
 };
 

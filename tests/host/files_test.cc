@@ -1,7 +1,9 @@
 // What is asked about documents: in whose name, how transfers are followed and given up, and
 // what becomes of answers that say nothing.
+#include <cerrno>
 #include <map>
 
+#include "linux/framework/EvictionOutcome.h"
 #include "linux/framework/RequestOrigin.h"
 #include "linux/framework/RequestProgress.h"
 #include "linux/host/HostFileRequests.h"
@@ -53,7 +55,10 @@ class FileExtension final : public NSFileProviderExtension {
     note("start " + url->path() + (options != 0 ? " current" : ""));
     transfers.push_back({RequestProgressScope::current(), std::move(done), nullptr});
   }
-  void stopProvidingItemAtURL(const NSURLPtr& url) override { note("stop " + url->path()); }
+  void stopProvidingItemAtURL(const NSURLPtr& url) override {
+    note("stop " + url->path());
+    if (whileStopping) whileStopping();
+  }
   void importDocumentAtURL(const NSURLPtr& url, const NSFileProviderItemIdentifier& parent,
                            ItemCompletion done) override {
     note("import " + url->path() + " to " + parent);
@@ -106,6 +111,7 @@ class FileExtension final : public NSFileProviderExtension {
   std::pair<NSFileProviderItemPtr, NSErrorPtr> answered;
   std::vector<std::string> calls;
   std::deque<Transfer> transfers;
+  std::function<void()> whileStopping;
 
  private:
   void note(std::string call) {
@@ -309,7 +315,7 @@ TEST_F(FileRequests, LettingGoOfAnImportCancelsItNowOrWhenItBegins) {
   EXPECT_EQ(heard, Words());
 }
 
-TEST_F(FileRequests, AFileThatSeveralWantIsAskedForOnceAndStoppedWithTheLast) {
+TEST_F(FileRequests, AFileThatSeveralWantIsAskedForOnceAndCancelledWithTheLast) {
   auto first = get("a");
   auto second = get("a");
   EXPECT_EQ(calls(), (Words{"start /drive/a"}));
@@ -319,18 +325,26 @@ TEST_F(FileRequests, AFileThatSeveralWantIsAskedForOnceAndStoppedWithTheLast) {
   take().provided(nullptr);
   run();
   EXPECT_EQ(heard, (Words{"finished a"}));
-  // It is there: a stop would give it up again.
   second = nullptr;
   EXPECT_EQ(calls(), Words());
 
+  // By its own progress: told to stop, the extension would go by the path, and evict the file
+  // when the download has just ended.
   auto third = get("a");
+  const auto progress = NSProgress::progressWithTotalUnitCount(10);
+  extension->transfers.front().progress->follow(progress);
+  EXPECT_FALSE(progress->isCancelled());
   third = nullptr;
-  EXPECT_EQ(calls(), (Words{"start /drive/a", "stop /drive/a"}));
-  // Who comes while it stops gets a download of their own.
+  EXPECT_TRUE(progress->isCancelled());
+  EXPECT_EQ(calls(), (Words{"start /drive/a"}));
+  // Who comes while it ends gets a download of their own.
   auto fourth = get("a");
   EXPECT_EQ(calls(), Words());
   take().provided(cancelled());
   EXPECT_EQ(calls(), (Words{"start /drive/a"}));
+  const auto its = NSProgress::progressWithTotalUnitCount(10);
+  extension->transfers.front().progress->follow(its);
+  EXPECT_FALSE(its->isCancelled());
   // So does who wants more than is under way.
   auto newest = get("a", true);
   EXPECT_EQ(calls(), Words());
@@ -345,8 +359,45 @@ TEST_F(FileRequests, AFileThatSeveralWantIsAskedForOnceAndStoppedWithTheLast) {
   EXPECT_EQ(heard.back(), "error -1005");
 }
 
+// The extension's stop answers nothing; what came of it is asked beside it.
+TEST_F(FileRequests, AFileIsGivenUpThroughTheExtensionAndOnlyWhenNobodyWantsIt) {
+  const auto evict = [&] {
+    files->evict(HostTarget::path("/a"), errorReply());
+    run();
+  };
+  extension->whileStopping = [] { EvictionOutcomeScope::note(nullptr); };
+  evict();
+  extension->whileStopping = [] {
+    EvictionOutcomeScope::note(NSError::errorWithDomain("SkeinEvictionErrorDomain", 3));
+  };
+  evict();
+  EXPECT_EQ(heard, (Words{"done", "error 3"}));
+  EXPECT_EQ(calls(), (Words{"stop /drive/a", "stop /drive/a"}));
+
+  heard.clear();
+  auto wanted = get("a");
+  evict();
+  EXPECT_EQ(heard, (Words{"error " + std::to_string(EBUSY)}));
+  EXPECT_EQ(calls(), (Words{"start /drive/a"}));
+  take().provided(nullptr);
+  run();
+
+  // Who comes during an eviction is served after it.
+  std::shared_ptr<HostTransfer> meanwhile;
+  extension->whileStopping = [&] {
+    meanwhile = get("a");
+    EvictionOutcomeScope::note(nullptr);
+  };
+  heard.clear();
+  evict();
+  EXPECT_EQ(calls(), (Words{"stop /drive/a", "start /drive/a"}));
+  next(*meanwhile);
+  take().provided(nullptr);
+  run();
+  EXPECT_EQ(heard, (Words{"done", "finished a"}));
+}
+
 TEST_F(FileRequests, WhatTheExtensionDoesNotOfferGoesToVald) {
-  files->evict(HostTarget::path("/a"), errorReply());
   files->setPinned(HostTarget::path("/a"), true, errorReply());
   daemon->fakeFiles.url = NSURL::fileURLWithPath("/drive/link");
   daemon->item = std::dynamic_pointer_cast<const VLQueryItem>(extension->items["b"]);
@@ -365,13 +416,11 @@ TEST_F(FileRequests, WhatTheExtensionDoesNotOfferGoesToVald) {
   run();
   Words asked;
   while (daemon->fakeFiles.asked.count() > 0) asked.push_back(*daemon->fakeFiles.asked.take());
-  EXPECT_EQ(asked,
-            (Words{"evict /drive/a", "setPinned /drive/a yes", "makeAlias /drive link /drive/a me",
-                   "makeAlias /drive link /etc me", "history /drive/a a 5",
-                   "history /drive/gone  5", "history /drive/gone a 5"}));
+  EXPECT_EQ(asked, (Words{"setPinned /drive/a yes", "makeAlias /drive link /drive/a me",
+                          "makeAlias /drive link /etc me", "history /drive/a a 5",
+                          "history /drive/gone  5", "history /drive/gone a 5"}));
   // Paths in the drive are shown as the drive's, but for where an import came from.
-  EXPECT_EQ(heard,
-            (Words{"done", "done", "b at /b", "b at /b", "/a -> /elsewhere/a", "/drive/x -> /a"}));
+  EXPECT_EQ(heard, (Words{"done", "b at /b", "b at /b", "/a -> /elsewhere/a", "/drive/x -> /a"}));
 }
 
 TEST_F(FileRequests, TheTrashComesInPages) {

@@ -88,43 +88,66 @@ TEST(ItemPaths, NormalisesAndRefuses) {
   }
 }
 
-TEST(NSExtensionMain, InstantiatesTheClassThatTheAttributesName) {
+using NSExtensionMainTest = HostTest;
+
+TEST_F(NSExtensionMainTest, ReadsInstantiatesAndHandsOver) {
   const std::string path = testing::TempDir() + "skein-attributes-test";
-  const auto attributesOf = [&](const std::string& text) {
-    std::ofstream(path) << text;
-    NSErrorPtr error;
-    auto attributes = readExtensionAttributes(path, &error);
-    return std::pair(attributes, error);
-  };
   std::shared_ptr<const NSExtensionAttributes> seen;
   const NSExtensionPrincipalClasses classes{
       {"Known",
        [&](auto attributes) -> std::shared_ptr<NSFileProviderExtension> {
          seen = attributes;
-         return std::make_shared<FakeExtension>();
+         return extension;
        }},
       {"Refusing", [](auto) { return nullptr; }}};
-  const auto failureOf = [&](const std::string& text) {
+  const auto enter = [&](const std::string& from) {
     NSErrorPtr error;
-    EXPECT_EQ(NSExtensionInstantiatePrincipalClass(attributesOf(text).first, classes, &error),
-              nullptr);
+    const bool isEntered = NSExtensionMain(from, classes, *host, &error);
+    EXPECT_EQ(isEntered, error == nullptr);
     return error ? error->localizedDescription() : "";
   };
+  const auto enterWith = [&](const std::string& text) {
+    std::ofstream(path) << text;
+    return enter(path);
+  };
+  const std::string point = "NSExtensionPointIdentifier=com.tessel.fileprovider\n";
+  const std::string place = "NSExtensionFileProviderDocumentGroup=drive\n";
+  const std::string lists = "NSExtensionFileProviderSupportsEnumeration=YES\n";
+  const auto named = [](const std::string& name) {
+    return "NSExtensionPrincipalClass = " + name + "\n";
+  };
 
-  const auto [good, none] =
-      attributesOf("# words\n\nNSExtensionPrincipalClass = Known\nOther=a=b\n");
-  ASSERT_TRUE(good);
-  EXPECT_TRUE(NSExtensionInstantiatePrincipalClass(good, classes, nullptr));
-  EXPECT_EQ(seen, good);
-  EXPECT_EQ(good->values.at("Other"), "a=b");
+  ASSERT_EQ(enterWith("# words\n\n" + point + named("Known") + place + lists), "");
+  ASSERT_TRUE(seen);
+  EXPECT_EQ(seen->principalClass, "Known");
+  const auto listed = [&] {
+    std::int64_t code = 0;
+    host->list("i1", NSFileProviderInitialPageSortedByName(),
+               [&](auto, const NSErrorPtr& error) { code = error ? error->code() : 0; });
+    run();
+    return code;
+  };
+  EXPECT_EQ(listed(), 0);
+  enumerator().givePage({});
+  ASSERT_EQ(
+      enterWith(point + named("Known") + place + "NSExtensionFileProviderSupportsEnumeration=NO\n"),
+      "");
+  EXPECT_EQ(listed(), NSFeatureUnsupportedError);
 
-  EXPECT_NE(failureOf("NSExtensionPrincipalClass=Nobody\n").find("\"Nobody\""), std::string::npos);
-  EXPECT_NE(failureOf("NSExtensionPrincipalClass=Refusing\n").find("refused"), std::string::npos);
-  EXPECT_NE(failureOf("Other=1\n").find("missing"), std::string::npos);
-  EXPECT_NE(attributesOf("a=b\nwords alone\n").second->localizedDescription().find(":2:"),
-            std::string::npos);
+  const auto says = [](const std::string& failure, const std::string& words) {
+    return failure.find(words) != std::string::npos;
+  };
+  EXPECT_TRUE(says(enterWith(point + named("Nobody") + place + lists), "\"Nobody\""));
+  EXPECT_TRUE(says(enterWith(point + named("Refusing") + place + lists), "refused"));
+  EXPECT_TRUE(says(enterWith(point + place + lists), "NSExtensionPrincipalClass is missing"));
+  EXPECT_TRUE(says(enterWith(named("Known") + place + lists), "PointIdentifier is missing"));
+  EXPECT_TRUE(says(enterWith(point + "words alone\n"), ":2: a line is KEY=VALUE"));
+  EXPECT_TRUE(says(enterWith(point + "Other=1\n"), ":2: there is no such key"));
+  EXPECT_TRUE(says(enterWith("NSExtensionPointIdentifier=other\n"), ":1: NSExtensionPoint"));
+  EXPECT_TRUE(says(enterWith(std::string(70'000, '#')), "too large"));
+  EXPECT_TRUE(says(enter(testing::TempDir()), "it is no file"));
   std::remove(path.c_str());
-  EXPECT_EQ(readExtensionAttributes(path, nullptr), nullptr);
+  EXPECT_TRUE(says(enter(path), "No such file"));
 }
 
 }  // namespace

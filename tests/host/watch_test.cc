@@ -65,38 +65,67 @@ TEST_F(HostTest, ExpiryIsFollowedByAListingAndTheDifference) {
       watchLive(watcher, {item(1, "one"), item(2, "two"), item(3, "three"), item(4, "four")});
   signal();
   run();
-  enumerator().anchor = "b0";
   enumerator().failChanges(expired());
-  EXPECT_EQ(calls(), (Words{"changes a0", "anchor", "list start"}));
-  enumerator().givePage({item(1, "one"), item(2, "zwei"), item(3, "three", 7), item(5, "five")});
+  // By a new enumerator: the folder may be elsewhere by now.
+  EXPECT_EQ(calls(), (Words{"changes a0", "invalidate", "open i1", "anchor", "list start"}));
+  enumerator(1).givePage({item(1, "one"), item(2, "zwei"), item(3, "three", 7), item(5, "five")});
   run();
   EXPECT_EQ(watcher->take(), Words{});
   // The round after the listing counts before anything is told.
-  enumerator().giveChanges({item(5, "five", 1)}, {idOf(1)}, "b0.1");
+  enumerator(1).giveChanges({item(5, "five", 1)}, {idOf(1)}, "a1.1");
   run();
   auto heard = watcher->take();
   std::sort(heard.begin(), heard.end());
   EXPECT_EQ(heard, (Words{"+five", "-four", "-one", "~three", "~zwei was two"}));
   signal();
-  EXPECT_EQ(calls(), (Words{"changes b0", "changes b0.1"}));
+  EXPECT_EQ(calls(), (Words{"changes a1", "changes a1.1"}));
 }
 
 TEST_F(HostTest, EndlessExpiryPausesInsteadOfSpinning) {
-  const auto subscription = watchLive(watcher, {item(1, "one")});
-  signal();
-  for (int i = 0; i < 3; ++i) {
+  // A folder that changes faster than it is listed, and one that is listed and cannot be
+  // watched: that one is live in between.
+  for (const bool isLiveBetween : {false, true}) {
+    extension->enumerators.clear();
+    auto subscription = watchLive(watcher, {item(1, "one")});
+    signal();
+    for (std::size_t i = 0; i < 3; ++i) {
+      run();
+      enumerator(i).failChanges(expired());
+      run();
+      enumerator(i + 1).givePage({item(1, "one")});
+      run();
+      if (!isLiveBetween) continue;
+      enumerator(i + 1).giveChanges({}, {}, enumerator(i + 1).anchor);
+      run();
+      signal();
+    }
     run();
-    enumerator().failChanges(expired());
+    extension->calls.clear();
+    for (const auto pause : {100, 200}) {
+      extension->enumerators.back()->failChanges(expired());
+      EXPECT_EQ(calls(), (Words{"invalidate"}));
+      timers->advance(std::chrono::milliseconds(pause - 1));
+      EXPECT_EQ(calls(), Words{});
+      timers->advance(std::chrono::milliseconds(1));
+      EXPECT_EQ(calls(), (Words{"open i1", "anchor", "list start"}));
+      extension->enumerators.back()->givePage({item(1, "one")});
+      EXPECT_EQ(calls(), (Words{"changes " + extension->enumerators.back()->anchor}));
+    }
+    EXPECT_EQ(watcher->take(), Words{});
+    // A round of a live watch ends the series.
+    extension->enumerators.back()->giveChanges({}, {}, "b");
+    signal();
     run();
-    enumerator().givePage({item(1, "one")});
+    extension->enumerators.back()->giveChanges({}, {}, "c");
+    signal();
+    run();
+    extension->enumerators.back()->failChanges(expired());
+    EXPECT_EQ(calls(),
+              (Words{"changes b", "changes c", "invalidate", "open i1", "anchor", "list start"}));
+    subscription.reset();
+    calls();
+    for (const auto& held : extension->enumerators) held->listings.clear();
   }
-  run();
-  extension->calls.clear();
-  enumerator().failChanges(expired());
-  EXPECT_EQ(calls(), (Words{"invalidate"}));
-  timers->advance(std::chrono::milliseconds(200));
-  EXPECT_EQ(calls(), (Words{"open i1", "anchor", "list start"}));
-  EXPECT_EQ(watcher->take(), Words{});
 }
 
 TEST_F(HostTest, WatchersShareAnEnumeratorUntilTheLastLeaves) {
@@ -132,12 +161,71 @@ TEST_F(HostTest, TheWatchSurvivesADaemonThatDies) {
   EXPECT_EQ(calls(), (Words{"open i1"}));
   extension->error = nullptr;
   timers->advance(std::chrono::milliseconds(200));
+  EXPECT_EQ(calls(), (Words{"open i1", "changes a0"}));
+  // Another enumerator's anchor: this one is new, and lists.
+  enumerator(1).failChanges(expired());
+  EXPECT_EQ(calls(), (Words{"anchor", "list start"}));
+  // It dies again before that is complete: the listing's anchor is of no use.
+  enumerator(1).givePage({item(2, "two")}, "p2");
+  EXPECT_EQ(calls(), (Words{"list p2"}));
+  timers->advance(std::chrono::milliseconds(4500));
+  EXPECT_EQ(calls(), (Words{"invalidate"}));
+  timers->advance(std::chrono::milliseconds(400));
   EXPECT_EQ(calls(), (Words{"open i1", "anchor", "list start"}));
-  enumerator(1).givePage({item(2, "two"), item(3, "three")});
+  enumerator(2).givePage({item(2, "two"), item(3, "three")});
   run();
-  enumerator(1).giveChanges({}, {}, "a1");
+  enumerator(2).giveChanges({}, {}, "a2");
   run();
   EXPECT_EQ(watcher->take(), (Words{"-one", "+three"}));
+}
+
+// Its anchors are vald's own: what was heard is not asked for again.
+TEST_F(HostTest, TheWorkingSetGoesOnFromItsAnchorAfterAFailure) {
+  const std::string workingSet = NSFileProviderWorkingSetContainerItemIdentifier;
+  auto subscription = watchLive(watcher, {}, workingSet);
+  ASSERT_EQ(news->listeners, 1);
+  news->handlers[0]();
+  run();
+  enumerator().giveChanges({item(1, "one")}, {}, "t1");
+  news->handlers[0]();
+  EXPECT_EQ(calls(), (Words{"changes a0", "changes t1"}));
+  enumerator().failChanges(vl_errorDaemonUnreachable("vald closed the connection"));
+  EXPECT_EQ(calls(), (Words{"invalidate"}));
+  timers->advance(std::chrono::milliseconds(100));
+  EXPECT_EQ(calls(), (Words{"open " + workingSet, "changes t1"}));
+  enumerator(1).giveChanges({item(2, "two")}, {}, "t2", true);
+  EXPECT_EQ(calls(), (Words{"changes t2"}));
+  enumerator(1).giveChanges({}, {idOf(1)}, "t3");
+  run();
+  EXPECT_EQ(watcher->take(), (Words{"+one", "+two", "-one"}));
+  EXPECT_EQ(news->handlers.size(), 1U);
+
+  // Who joins while the last one leaves has news, too.
+  const auto second = std::make_shared<Watcher>();
+  auto other = host->watch(workingSet, second);
+  subscription.reset();
+  run();
+  EXPECT_EQ(news->listeners, 1);
+  other.reset();
+  const auto third = host->watch(workingSet, std::make_shared<Watcher>());
+  run();
+  EXPECT_EQ(news->listeners, 1);
+}
+
+// The target's own changes are none of what it holds; with the target it ends.
+TEST_F(HostTest, AnAliasIsWatchedAsTheFolderThatItLeadsTo) {
+  extension->aliases["i1"] = idOf(5);
+  const auto subscription = watchLive(watcher, {item(1, "one")});
+  signal();
+  run();
+  enumerator().giveChanges({item(5, "target"), item(2, "two")}, {}, "a0.1");
+  run();
+  EXPECT_EQ(watcher->take(), (Words{"+two"}));
+  signal();
+  run();
+  enumerator().giveChanges({}, {idOf(5)}, "a0.2");
+  run();
+  EXPECT_EQ(watcher->take(), (Words{"end -1005"}));
 }
 
 TEST_F(HostTest, LogoutAndDeletionEndTheWatch) {
@@ -156,7 +244,7 @@ TEST_F(HostTest, LogoutAndDeletionEndTheWatch) {
   run();
   enumerator(1).givePage({});
   run();
-  enumerator(1).giveChanges({}, {"i1"}, "a1.1");
+  enumerator(1).giveChanges({}, {}, "a1.1");
   run();
   EXPECT_EQ(again->take(), (Words{"begin"}));
   signal();
@@ -164,6 +252,17 @@ TEST_F(HostTest, LogoutAndDeletionEndTheWatch) {
   enumerator(1).giveChanges({}, {"i1"}, "a1.2");
   run();
   EXPECT_EQ(again->take(), (Words{"end -1005"}));
+  EXPECT_EQ(calls().back(), "invalidate");
+
+  // Gone between its listing and the first round: nothing more would come of it.
+  const auto third = std::make_shared<Watcher>();
+  const auto late = host->watch("i1", third);
+  run();
+  enumerator(2).givePage({});
+  run();
+  enumerator(2).giveChanges({}, {"i1"}, "a2.1");
+  run();
+  EXPECT_EQ(third->take(), (Words{"end -1005"}));
 }
 
 TEST_F(HostTest, ALostAnswerFailsTheFirstWatchAndIsIgnoredWhenItComesLate) {

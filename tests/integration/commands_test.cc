@@ -171,6 +171,34 @@ TEST(Commands, ChangesGoOnFromTheTokenPrintedLast) {
   EXPECT_FALSE(std::count(second.begin(), second.end(), "changed  one.txt"));
 }
 
+// The link of a watch breaks while the folder's name is already another folder's.
+TEST(Commands, AWatchOfARenamedFolderHearsOnAfterItsLinkBroke) {
+  Drive drive;
+  const std::string store = drive.store();
+  std::filesystem::create_directory(store + "/a");
+  drive.write("/a/old.txt", "");
+  ASSERT_EQ(symlink("a", (store + "/alias").c_str()), 0);
+  EXPECT_EQ(drive.list("/alias"), (Lines{"old.txt"}));
+  const auto watch = drive.start({"watch", "/a", "--ready-fd", "1"});
+  ASSERT_EQ(watch->readLine(20s), "ready") << watch->errors;
+  const auto ofAlias = drive.start({"watch", "/alias", "--json", "--ready-fd", "1"});
+  ASSERT_EQ(ofAlias->readLine(20s), "ready") << ofAlias->errors;
+  drive.write("/a/first.txt", "");
+  EXPECT_EQ(watch->readLine(10s), "created  first.txt");
+  EXPECT_NE(ofAlias->readLine(10s).value_or("").find("\"path\":\"/a/first.txt\""),
+            std::string::npos);
+
+  std::filesystem::rename(store + "/a", store + "/b");
+  std::filesystem::create_directory(store + "/a");
+  ASSERT_EQ(drive.run({"account", "login", "other"}).code, 0);
+  drive.write("/b/new.txt", "");
+  auto next = watch->readLine(10s);
+  while (next && firstWord(*next) == "changed") next = watch->readLine(10s);
+  EXPECT_EQ(next, "created  new.txt");
+  std::filesystem::remove_all(store + "/b");
+  EXPECT_NE(watch->finish(10s), 0);
+}
+
 TEST(Commands, DoctorFindsNothingInAHealthyDrive) {
   Drive drive;
   std::filesystem::create_directories(drive.store() + "/a/b");
@@ -247,6 +275,18 @@ TEST(Commands, LogShowsOneRequestsSection) {
   ASSERT_GE(lines.size(), 3U);
   EXPECT_NE(lines.front().find("┏" + section + " asked properties"), std::string::npos);
   EXPECT_NE(lines.back().find("┗" + section), std::string::npos);
+
+  // One that begins as if it went on, and never closes.
+  ASSERT_EQ(drive.run({"get", "/letter.txt"}).code, 0);
+  for (const std::string& line : drive.run({"log", "-n", "1000"}).lines()) {
+    const auto at = line.find("┣");
+    if (at != std::string::npos && line.find("start providing") != std::string::npos) {
+      section = firstWord(line.substr(at + std::string("┣").size()));
+    }
+  }
+  const Lines open = drive.run({"log", "--section", section}).lines();
+  ASSERT_EQ(open.size(), 2U);
+  EXPECT_NE(open.back().find("url exists, granting the read"), std::string::npos);
 }
 
 }  // namespace

@@ -10,6 +10,7 @@
 
 #include "base/Executor.h"
 #include "base/Mutex.h"
+#include "linux/protocol/DocumentURL.h"
 #include "linux/protocol/LinkBreaking.h"
 #include "linux/protocol/LocalDaemon.h"
 #include "tests/protocol/FakeCloud.h"
@@ -29,7 +30,7 @@ class FakeSender final : public VLItemNotificationSender, public LinkBreaking {
   void boostPriority(Reply<> reply) override { boosts.add(std::move(reply)); }
   void watchItemAtURL(const NSURLPtr& url, std::uint64_t options,
                       Reply<NSErrorPtr> gatherReply) override {
-    watches.add({url->path(), options, std::move(gatherReply)});
+    watches.add({url->path(), options, fileObjectIDOfDocumentURL(url), std::move(gatherReply)});
   }
   void invalidate() override { invalidations.add(1); }
   std::shared_ptr<VLItemNotificationSending> remoteObjectProxyWithErrorHandler(
@@ -43,6 +44,7 @@ class FakeSender final : public VLItemNotificationSender, public LinkBreaking {
   struct Watch {
     std::string path;
     std::uint64_t options;
+    std::optional<VLFileObjectID> item;
     Reply<NSErrorPtr> reply;
   };
   const std::shared_ptr<VLItemNotificationReceiving> receiver;

@@ -91,6 +91,14 @@ TEST_F(Links, MessagesOfTheSenderReachVald) {
   auto watch = served->watches.take();
   EXPECT_EQ(watch->path, "/s/\xff");
   EXPECT_EQ(watch->options, 23U);
+  EXPECT_EQ(watch->item, std::nullopt);
+  const auto folder = VLFileObjectID::folderOrAliasWithRawID(7);
+  Outcome<NSErrorPtr> again;
+  watching->watchItemAtURL(documentURL("/s/d", folder), 19, again.reply());
+  auto known = served->watches.take();
+  EXPECT_EQ(known->item, folder);
+  known->reply(nullptr);
+  EXPECT_FALSE(std::get<0>(again.value()));
   watch->reply(NSError::errorWithDomain(NSPOSIXErrorDomain, 2));
   EXPECT_EQ(std::get<0>(watched.value())->code(), 2);
 

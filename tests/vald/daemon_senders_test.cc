@@ -5,6 +5,7 @@
 #include <map>
 
 #include "base/ThreadPool.h"
+#include "linux/protocol/DocumentURL.h"
 #include "linux/vald/ClosableExecutor.h"
 #include "tests/protocol/Waiting.h"
 #include "tests/vald/TestDaemon.h"
@@ -148,7 +149,10 @@ TEST_F(Senders, RefuseOtherOptionsAndPlacesAndASecondWatch) {
   ASSERT_EQ(gathered.size(), 3u);
   EXPECT_NE(gathered[0]->localizedDescription().find("options"), std::string::npos);
   EXPECT_NE(gathered[1]->localizedDescription().find("url"), std::string::npos);
-  EXPECT_EQ(gathered[2]->code(), NSFileNoSuchFileError);
+  // Of the one domain whose errors make a client that has listed already ask again.
+  EXPECT_EQ(gathered[2]->domain(), VLVellumErrorDomain);
+  EXPECT_EQ(gathered[2]->code(), VLVellumErrorChangesLost);
+  EXPECT_EQ(gathered[2]->underlyingError()->code(), NSFileNoSuchFileError);
 
   watch(sender, folder);  // a failed watch may be tried again
   watch(sender, other);
@@ -156,6 +160,47 @@ TEST_F(Senders, RefuseOtherOptionsAndPlacesAndASecondWatch) {
   ASSERT_EQ(gathered.size(), 5u);
   EXPECT_FALSE(gathered[3]);
   ASSERT_TRUE(gathered[4]);
+}
+
+TEST_F(Senders, WatchTheItemThatTheURLWasOfWhereverItIs) {
+  const SenderPtr sender = make();
+  const std::string path = *store.pathForID(folder, nullptr);
+  store.remove(other);
+  // Its place was taken while the client still had the URL.
+  const auto imposter = store.addFolder("a", store.addFolder("c", store.root()));
+  const auto watchOf = [&](VLFileObjectID id) {
+    make()->watchItemAtURL(documentURL(path, id), 19,
+                           [this](NSErrorPtr error) { gathered.push_back(std::move(error)); });
+    d.executor->runAll();
+  };
+  sender->watchItemAtURL(documentURL(path, imposter), 19,
+                         [this](NSErrorPtr error) { gathered.push_back(std::move(error)); });
+  d.executor->runAll();
+  store.addFile("not this", folder);
+  const auto file = store.addFile("file", imposter);
+  EXPECT_EQ(pushed(), (Names{file.asString()}));
+  watchOf(other);
+  ASSERT_EQ(gathered.size(), 2u);
+  EXPECT_FALSE(gathered[0]);
+  ASSERT_TRUE(gathered[1]);
+  EXPECT_EQ(gathered[1]->code(), VLVellumErrorChangesLost);
+}
+
+// App containers lie beside the drive and are shown in it.
+TEST_F(Senders, ADriveWithItsSubtreeIsEverythingThereIs) {
+  const SenderPtr sender = make();
+  watch(sender, store.root(), 23);
+  d.executor->runAll();
+  StoreChange change;
+  VLQueryItem::Properties elsewhere;
+  elsewhere.fileObjectID = VLFileObjectID::documentWithRawID(99);
+  change.item = std::make_shared<const VLQueryItem>(elsewhere);
+  change.folder = change.previousFolder = VLFileObjectID::folderOrAliasWithRawID(77);
+  d.senders.storeDidChange({change});
+  EXPECT_EQ(pushed(), (Names{elsewhere.fileObjectID.asString()}));
+  receiver->reply();
+  const auto file = store.addFile("file", folder);
+  EXPECT_EQ(pushed(), (Names{file.asString()}));
 }
 
 TEST_F(Senders, PushNothingAfterInvalidateOrTheLastReference) {
@@ -248,6 +293,7 @@ TEST_F(BoundedSenders, BreakWhatTheStoresOverflowConcerns) {
   EXPECT_TRUE(broke(folder, 19, std::nullopt));
   EXPECT_FALSE(broke(folder, 19, deep));
   EXPECT_FALSE(broke(other, 23, folder));
+  EXPECT_TRUE(broke(store.root(), 23, VLFileObjectID::folderOrAliasWithRawID(77)));
 }
 
 // Replies from another thread, a little later, as a client does.

@@ -146,6 +146,31 @@ TEST_F(StoreListing, OnlyFilesFoldersAndAliasesAndNothingBehindAnAlias) {
   EXPECT_EQ(std::distance(std::filesystem::recursive_directory_iterator(root), {}), 7);
 }
 
+TEST_F(StoreListing, AnAliasListsTheFolderThatItLeadsTo) {
+  makeFolder("folder/deep");
+  write("folder/deep/inside");
+  ASSERT_EQ(symlink("deep", at("folder/alias").c_str()), 0);
+  ASSERT_EQ(symlink("folder/alias", at("second").c_str()), 0);
+  ASSERT_EQ(symlink(".", at("self").c_str()), 0);
+  ASSERT_EQ(symlink("folder/deep/inside", at("file").c_str()), 0);
+  ASSERT_EQ(symlink("/", at("out").c_str()), 0);
+  ASSERT_EQ(symlink("nothing", at("broken").c_str()), 0);
+  open();
+  const auto listed = [&](const std::string& alias) {
+    return names(item(alias)->fileObjectID(), SortOrder::Name, 10);
+  };
+  const std::vector<std::string> inside{"inside"};
+  EXPECT_EQ(listed("folder/alias"), inside);
+  EXPECT_EQ(listed("second"), inside);
+  EXPECT_EQ(listed("self"), names(std::nullopt, SortOrder::Name, 10));
+  for (const char* nowhere : {"file", "out", "broken"}) {
+    NSErrorPtr error;
+    store->listFolder(item(nowhere)->fileObjectID(), SortOrder::Name, 0, 10, &error);
+    ASSERT_TRUE(error) << nowhere;
+    EXPECT_EQ(error->code(), NSFileNoSuchFileError);
+  }
+}
+
 TEST_F(StoreListing, ContainersAreListedAtTheRootAndJournalled) {
   write("doc");
   const std::string container = root + "-app";
