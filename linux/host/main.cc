@@ -176,8 +176,8 @@ int serve(const Arguments& arguments, const DrivePaths& paths, const FileDescrip
   log->setEnabled(LogType::Debug, arguments.logLevel == "debug");
 
   const std::shared_ptr<Executor> executor = std::make_shared<ThreadPool>(4, "host");
-  // Clients decide how many requests there are. However many of them wait, threads are left for
-  // what ends a wait; deadlines have their own besides.
+  // Clients decide how many requests there are, so their starts are bounded. What a request goes on
+  // with in a reply runs on the pool itself and is not. Deadlines have threads of their own.
   const auto requestsExecutor = std::make_shared<BoundedExecutor>(executor, kMostRunningRequests);
   const std::shared_ptr<Timers> timers =
       std::make_shared<SteadyTimers>(std::make_shared<ThreadPool>(2, "deadlines"));
