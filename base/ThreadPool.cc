@@ -15,15 +15,17 @@
 namespace skein {
 namespace {
 
-// How long a spare thread stays for the next wait.
-constexpr auto kSparePatience = std::chrono::seconds(5);
+// A pool whose workers all wait may grow, but not without end.
+constexpr std::size_t kMostThreads = 256;
 
 }  // namespace
 
 // Held by the pool and by each worker, so that a worker may outlive the pool.
 struct ThreadPool::State : std::enable_shared_from_this<State> {
-  State(std::size_t runningWorkers, std::string threadName)
-      : width(std::max<std::size_t>(runningWorkers, 1)), name(std::move(threadName)) {}
+  State(std::size_t runningWorkers, std::string threadName, std::chrono::milliseconds patience)
+      : width(std::max<std::size_t>(runningWorkers, 1)),
+        name(std::move(threadName)),
+        sparePatience(patience) {}
 
   void run() SKEIN_EXCLUDES(mutex);
   void addThreadIfNeeded() SKEIN_REQUIRES(mutex);
@@ -32,6 +34,7 @@ struct ThreadPool::State : std::enable_shared_from_this<State> {
 
   const std::size_t width;
   const std::string name;
+  const std::chrono::milliseconds sparePatience;
   Mutex mutex;
   CondVar workArrived;
   std::deque<Task> tasks SKEIN_GUARDED_BY(mutex);
@@ -56,7 +59,7 @@ std::optional<Task> ThreadPool::State::nextTask() {
     if (stopping) return std::nullopt;
     ++idle;
     const bool woken =
-        workArrived.waitUntil(mutex, std::chrono::steady_clock::now() + kSparePatience);
+        workArrived.waitUntil(mutex, std::chrono::steady_clock::now() + sparePatience);
     --idle;
     if (woken || !tasks.empty() || stopping || threads.size() <= width + waiting) continue;
     const auto own = std::find_if(threads.begin(), threads.end(), [](const std::thread& thread) {
@@ -77,8 +80,8 @@ void ThreadPool::State::run() {
   while (std::optional<Task> task = nextTask()) (*task)();
 }
 
-ThreadPool::ThreadPool(std::size_t width, std::string name)
-    : _state(std::make_shared<State>(width, name.substr(0, 15))) {}
+ThreadPool::ThreadPool(std::size_t width, std::string name, std::chrono::milliseconds sparePatience)
+    : _state(std::make_shared<State>(width, name.substr(0, 15), sparePatience)) {}
 
 ThreadPool::~ThreadPool() {
   {

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <chrono>
 #include <cstddef>
 #include <memory>
 #include <string>
@@ -10,15 +11,13 @@ namespace skein {
 
 // A fixed number of running workers. While some of them wait (beginWait), as many
 // spare threads as there are waiters keep the rest going, so that a wait never
-// starves the work that would end it. There are at most kMostThreads; whoever lets others
-// decide how many tasks wait bounds them below that (BoundedExecutor). A spare thread that had
-// nothing to do for some seconds ends.
+// starves the work that would end it. There are at most 256 threads; when all wait, nothing
+// more runs. A spare thread that had nothing to do for `sparePatience` ends.
 class ThreadPool final : public Executor {
  public:
-  static constexpr std::size_t kMostThreads = 256;
-
   // `width`: running workers, at least 1. `name`: shown by debuggers, cut at 15 bytes.
-  ThreadPool(std::size_t width, std::string name);
+  ThreadPool(std::size_t width, std::string name,
+             std::chrono::milliseconds sparePatience = std::chrono::seconds(5));
 
   // Runs what was posted before, then joins. When a worker drops the last reference,
   // that worker is left to end by itself.

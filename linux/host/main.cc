@@ -15,7 +15,6 @@
 #include <string_view>
 #include <thread>
 
-#include "base/BoundedExecutor.h"
 #include "base/ThreadPool.h"
 #include "extension/VLFileProviderExtension.h"
 #include "linux/framework/LocalFramework.h"
@@ -55,10 +54,6 @@ Exit codes: 0 ended as asked, or another skein-host serves the drive already; 1 
 constexpr int kExitFailure = 1;
 constexpr int kExitUsage = 2;
 constexpr int kExitExtension = 3;
-
-// Each may wait on a thread of its own.
-constexpr std::size_t kMostRunningRequests = 128;
-static_assert(kMostRunningRequests <= ThreadPool::kMostThreads / 2);
 
 struct Arguments {
   std::string store;
@@ -176,9 +171,7 @@ int serve(const Arguments& arguments, const DrivePaths& paths, const FileDescrip
   log->setEnabled(LogType::Debug, arguments.logLevel == "debug");
 
   const std::shared_ptr<Executor> executor = std::make_shared<ThreadPool>(4, "host");
-  // Clients decide how many requests there are, so their starts are bounded. What a request goes on
-  // with in a reply runs on the pool itself and is not. Deadlines have threads of their own.
-  const auto requestsExecutor = std::make_shared<BoundedExecutor>(executor, kMostRunningRequests);
+  // Deadlines have threads of their own, however many of the pool's wait.
   const std::shared_ptr<Timers> timers =
       std::make_shared<SteadyTimers>(std::make_shared<ThreadPool>(2, "deadlines"));
   const std::shared_ptr<RpcLoop> loop = RpcLoop::start("host-io");
@@ -235,8 +228,8 @@ int serve(const Arguments& arguments, const DrivePaths& paths, const FileDescrip
       host, [drive](HostTarget target, Reply<std::string, NSErrorPtr> reply) {
         drive->findIdentifier(std::move(target), std::move(reply));
       });
-  auto server = HostServer::listen(loop, requestsExecutor, requests, services, paths.hostSocket,
-                                   *log, &error);
+  auto server =
+      HostServer::listen(loop, executor, requests, services, paths.hostSocket, *log, &error);
   // At once, as at the end below: what was made above refers to each other.
   if (!server) std::_Exit(fail(kExitFailure, error->localizedDescription()));
   VL_NOTICE(*log, "[NOTICE] serving %s", paths.store);

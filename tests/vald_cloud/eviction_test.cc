@@ -211,7 +211,10 @@ TEST_F(EvictionTest, OnlyAMarkerThatWasMadeHereIsServed) {
     return changed;
   };
   EXPECT_EQ(served(text), "none");
-  EXPECT_EQ(served(with("mode 6", "mode 7")), "NSCocoaErrorDomain 259");
+  // The key that it was sealed with is lost: its document's record vouches for it.
+  const std::string seal = "seal " + EvictionMarker::parse(text)->seal->asString();
+  const std::string otherSeal = "seal " + std::string(seal.size() - 5, '0');
+  EXPECT_EQ(served(with(seal, otherSeal)), "none");
   EXPECT_EQ(served(with("size 8", "size 9")), "NSCocoaErrorDomain 259");
   EXPECT_EQ(served(with("end\n", "mode 777\nend\n")), "NSCocoaErrorDomain 259");
   // One without a seal needs the record that it speaks of.
@@ -222,6 +225,8 @@ TEST_F(EvictionTest, OnlyAMarkerThatWasMadeHereIsServed) {
   EXPECT_EQ(served(endless), "NSCocoaErrorDomain 259");
   ASSERT_EQ(brief(rig.records->remove(kDocument)), "none");
   EXPECT_EQ(served(bare), "NSCocoaErrorDomain 259");
+  EXPECT_EQ(served(with(seal, otherSeal)), "NSCocoaErrorDomain 259");
+  EXPECT_EQ(served(with("mode 6", "mode 7")), "NSCocoaErrorDomain 259");
   EXPECT_EQ(served(text), "none");
   if (geteuid() != 0) return;
   std::ofstream(marker) << text;
@@ -344,6 +349,15 @@ TEST_F(EvictionTest, RecoveryComparesContentsAndFindsTheMovedFolder) {
   note((rig.top / "drive").string());
   ASSERT_EQ(brief(recoverUnfinishedWork(rig.places())), "none");
   EXPECT_EQ(rig.names(), std::vector<std::string>{});
+
+  // There is a marker that is not believed: the file comes back, and stays.
+  rig.write(".a.skein-old", "the document");
+  rig.write(".a.skein", "no marker");
+  note((rig.top / "drive").string());
+  ASSERT_EQ(brief(recoverUnfinishedWork(rig.places())), "none");
+  EXPECT_EQ(contentsOf(path), "the document");
+  std::filesystem::remove(path);
+  std::filesystem::remove(rig.top / "drive/.a.skein");
 
   // The folder was renamed since, and another has its name.
   std::filesystem::create_directory(rig.top / "drive/f");

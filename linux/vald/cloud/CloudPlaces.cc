@@ -31,7 +31,9 @@ NSErrorPtr CloudPlaces::refusalOf(const EvictionMarker& marker, const std::strin
   if (marker.seal && contents.seal(marker.sealed) == *marker.seal) return nullptr;
   const auto record = records.record(marker.document);
   if (!record) return record.error();
-  if (!marker.seal && *record && (*record)->contents.hash == marker.contents.hash) return nullptr;
+  // Also one whose seal was made with a key that is lost: refused, the only way to its contents
+  // would go with the key.
+  if (*record && (*record)->contents.hash == marker.contents.hash) return nullptr;
   return fileErrorWithWords(NSFileReadCorruptFileError, 0,
                             "the marker of \"" + printable(path) +
                                 "\" was not made by this drive's cloud, or was changed since; "

@@ -81,7 +81,8 @@ class PlaceRecovery {
   NSErrorPtr putBack() {
     const auto same = isWhatTheMarkerStandsFor(_names.aside);
     if (!same) return same.error();
-    if (!_marker && _noted) {
+    // One that is there and not believed says nothing: then the file stays.
+    if (!_place.folder.exists(_names.marker) && _noted) {
       // The marker was on the disk before the file was set aside: it was moved, or removed,
       // by whoever found the document evicted. Only somebody's late words are put back.
       const auto isKept = isSafeInTheCloud();

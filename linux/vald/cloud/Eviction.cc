@@ -276,7 +276,7 @@ NSErrorPtr Eviction::writeMarker(Subject& subject) {
   // The marker must be on the disk before the file goes.
   if (code == 0) code = _places.files.sync(folder);
   return code == 0 ? nullptr : fileError(code, "can't write the marker of", path);
-}  // namespace skein::vald
+}
 
 NSErrorPtr Eviction::setAside(Subject& subject) {
   const std::string& path = subject.request.path;
