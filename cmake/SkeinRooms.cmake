@@ -1,8 +1,8 @@
-# skein_room(DIR LINKS TARGETS... [MAIN PROGRAM]): one static library of the room's
-# sources, named skein_ and the folder's path, and with MAIN a program of its main.cc.
-# A .capnp file in the room is compiled into it.
+# skein_room(DIR LINKS TARGETS... [MAIN PROGRAM] [PRECOMPILE HEADERS...]): one static
+# library of the room's sources, named skein_ and the folder's path, and with MAIN a program
+# of its main.cc. A .capnp file in the room is compiled into it.
 function(skein_room dir)
-  cmake_parse_arguments(ROOM "" "MAIN" "LINKS" ${ARGN})
+  cmake_parse_arguments(ROOM "" "MAIN" "LINKS;PRECOMPILE" ${ARGN})
   string(REPLACE "/" "_" name "skein_${dir}")
   file(GLOB_RECURSE sources CONFIGURE_DEPENDS "${CMAKE_SOURCE_DIR}/${dir}/*.cc")
   list(REMOVE_ITEM sources "${CMAKE_SOURCE_DIR}/${dir}/main.cc")
@@ -29,6 +29,7 @@ function(skein_room dir)
     add_library(${name} STATIC ${sources})
     target_include_directories(${name} PUBLIC "${CMAKE_SOURCE_DIR}")
     target_link_libraries(${name} PUBLIC ${ROOM_LINKS})
+    skein_precompile(${name} ${ROOM_PRECOMPILE})
   endif()
   if(ROOM_MAIN AND EXISTS "${CMAKE_SOURCE_DIR}/${dir}/main.cc")
     add_executable(${ROOM_MAIN} "${CMAKE_SOURCE_DIR}/${dir}/main.cc")
