@@ -10,7 +10,7 @@
 
 namespace skein {
 
-// A leaf lock: never held while calling out.
+// Its holder must not take it again; where it is held while calling out, that is said there.
 class SKEIN_CAPABILITY("mutex") Mutex {
  public:
   void lock() SKEIN_ACQUIRE() { _mutex.lock(); }

@@ -52,8 +52,9 @@ void VLFileEnumerator::_setupNotificationReceivingIfNeededWithCompletion(
   const auto daemon = _environment.daemonConnection.remoteObjectProxyWithErrorHandler(
       [finish](const NSErrorPtr& error) { (*finish)(error); });
   daemon->getItemUpdateSenderWithReceiver(
-      shared_from_this(), [self = shared_from_this(), finish](
-                              std::shared_ptr<VLItemNotificationSender> sender, NSErrorPtr error) {
+      shared_from_this(),
+      [self = shared_from_this(), finish](std::shared_ptr<VLItemNotificationSender> sender,
+                                          const auto& /*dictionary*/, NSErrorPtr error) {
         self->_queue.async([self, finish, sender = std::move(sender), error = std::move(error)] {
           self->_queue.assumeCurrent();
           if (!error) self->_linkToSender(sender);
@@ -173,7 +174,7 @@ void VLFileEnumerator::receiveUpdates(const VLQueryItems& items, const std::vect
         _updatedItemsByIDs.insert_or_assign(id, item);
       }
     }
-    if (pendingCount() > kMostPendingChanges) _invalidateChangeTokenWithLock();
+    if (_pendingCount() > kMostPendingChanges) _invalidateChangeTokenWithLock();
   }
   // Also after a reset: asking for changes is how the host learns that its anchor expired.
   _signalChange();
@@ -200,26 +201,26 @@ void VLFileEnumerator::_invalidateChangeToken() {
   // Before the lock, which may be held for as long as an observer takes.
   VL_DEBUG(_environment.log, "[DEBUG] invalidating change token");
   MonitorLock lock(_lock);
-  resetChangeState();
+  _resetChangeState();
 }
 
 void VLFileEnumerator::_invalidateChangeTokenWithLock() {
   VL_DEBUG(_environment.log, "[DEBUG] invalidating change token");
-  resetChangeState();
+  _resetChangeState();
 }
 
-void VLFileEnumerator::resetChangeState() {
+void VLFileEnumerator::_resetChangeState() {
   _deletedItemsIdentifiers.clear();
   _updatedItemsByIDs.clear();
   _rank = 0;
-  drawUUID();
+  _drawUUID();
 }
 
 void VLFileEnumerator::currentSyncAnchorWithCompletionHandler(
     UniqueFunction<void(std::optional<NSFileProviderSyncAnchor>)> completionHandler) {
   // Rank 0 whatever _rank is: this anchor stands for the state's beginning, so once a batch
   // was handed out a host that starts from it is made to list again.
-  const NSFileProviderSyncAnchor anchor = vl_changeTokenFromRank(0, uuid());
+  const NSFileProviderSyncAnchor anchor = vl_changeTokenFromRank(0, _currentUUID());
   if (completionHandler) completionHandler(anchor);
 }
 
@@ -235,7 +236,7 @@ void VLFileEnumerator::enumerateChangesForObserver(
   NSFileProviderSyncAnchor anchor;
   {
     MonitorLock lock(_lock);
-    const std::int64_t rank = vl_changeTokenRankWithUUID(fromSyncAnchor, uuid());
+    const std::int64_t rank = vl_changeTokenRankWithUUID(fromSyncAnchor, _currentUUID());
     VL_DEBUG(log, "[DEBUG] requested rank: %lld", rank);
 
     if (rank < 0 || static_cast<std::uint64_t>(rank) != _rank) {
@@ -245,7 +246,7 @@ void VLFileEnumerator::enumerateChangesForObserver(
       _invalidateChangeTokenWithLock();
       return;
     }
-    if (pendingCount() == 0) {
+    if (_pendingCount() == 0) {
       VL_DEBUG(log, "[DEBUG] no update to send back");
       observer->finishEnumeratingChangesUpToSyncAnchor(*fromSyncAnchor, false);
       return;
@@ -255,7 +256,7 @@ void VLFileEnumerator::enumerateChangesForObserver(
     deleted = _deletedItemsIdentifiers.strings();
     _updatedItemsByIDs.clear();
     _deletedItemsIdentifiers.clear();
-    anchor = vl_changeTokenFromRank(++_rank, uuid());
+    anchor = vl_changeTokenFromRank(++_rank, _currentUUID());
   }
   // Both lists, also when one of them is empty.
   observer->didUpdateItems(updated);
@@ -263,21 +264,21 @@ void VLFileEnumerator::enumerateChangesForObserver(
   observer->finishEnumeratingChangesUpToSyncAnchor(std::move(anchor), false);
 }
 
-std::size_t VLFileEnumerator::pendingCount() const {
+std::size_t VLFileEnumerator::_pendingCount() const {
   return _updatedItemsByIDs.size() + _deletedItemsIdentifiers.count();
 }
 
 std::size_t VLFileEnumerator::pendingChangeCount() {
   MonitorLock lock(_lock);
-  return pendingCount();
+  return _pendingCount();
 }
 
-uuid_t VLFileEnumerator::uuid() const {
+uuid_t VLFileEnumerator::_currentUUID() const {
   MutexLock lock(_uuidMutex);
   return _uuid;
 }
 
-void VLFileEnumerator::drawUUID() {
+void VLFileEnumerator::_drawUUID() {
   uuid_t fresh;
   uuid_generate(fresh);
   MutexLock lock(_uuidMutex);

@@ -53,9 +53,9 @@ VLFileEnumerator::VLFileEnumerator(std::optional<VLFileObjectID> fileObjectID, N
       _itemIdentifier(std::move(itemIdentifier)),
       _fileObjectID(fileObjectID),
       _url(std::move(url)),
-      _queue("file-enumerator", environment.executor),
-      _isRecursive(recursive) {
-  drawUUID();
+      _isRecursive(recursive),
+      _queue("file-enumerator", environment.executor) {
+  _drawUUID();
 }
 
 void VLFileEnumerator::enumerateItemsForObserver(

@@ -101,21 +101,19 @@ class VLFileEnumerator final : public NSFileProviderEnumerator,
   // Begins a new change state. The second form is for callers that hold the lock.
   void _invalidateChangeToken() SKEIN_EXCLUDES(_lock);
   void _invalidateChangeTokenWithLock() SKEIN_REQUIRES(_lock);
-  void resetChangeState() SKEIN_REQUIRES(_lock);
-  std::size_t pendingCount() const SKEIN_REQUIRES(_lock);
-  uuid_t uuid() const SKEIN_EXCLUDES(_uuidMutex);
-  void drawUUID() SKEIN_EXCLUDES(_uuidMutex);
+  void _resetChangeState() SKEIN_REQUIRES(_lock);
+  std::size_t _pendingCount() const SKEIN_REQUIRES(_lock);
+  uuid_t _currentUUID() const SKEIN_EXCLUDES(_uuidMutex);
+  void _drawUUID() SKEIN_EXCLUDES(_uuidMutex);
 
   Environment& _environment;
-  const NSFileProviderItemIdentifier _itemIdentifier;
-  const std::optional<VLFileObjectID> _fileObjectID;
-  const NSURLPtr _url;
-
-  SerialQueue _queue;
   Monitor _lock;
   // A leaf: lets the current anchor be read while _lock is held elsewhere.
   mutable Mutex _uuidMutex;
 
+  const NSFileProviderItemIdentifier _itemIdentifier;
+  const std::optional<VLFileObjectID> _fileObjectID;
+  const NSURLPtr _url;
   std::shared_ptr<VLItemNotificationSending> _remoteNotificationSender SKEIN_GUARDED_BY(_queue);
   std::unordered_map<VLFileObjectID, VLQueryItemPtr> _updatedItemsByIDs SKEIN_GUARDED_BY(_lock);
   PendingDeletions _deletedItemsIdentifiers SKEIN_GUARDED_BY(_lock);
@@ -126,6 +124,7 @@ class VLFileEnumerator final : public NSFileProviderEnumerator,
   // Set on _queue; cleared there or on a reply thread.
   std::atomic<bool> _isSettingUpNotificationReceiving{false};
   bool _isObservingAccountChanges SKEIN_GUARDED_BY(_queue) = false;
+  SerialQueue _queue;
 };
 
 }  // namespace skein

@@ -35,7 +35,7 @@ void Contents::startProvidingItemAtURL(std::shared_ptr<Contents> self, const NSU
   } else if ((readingOptions & NSFileCoordinatorReadingAlwaysFetches) == 0 &&
              environment.fileOperations.checkResourceIsReachable(url, nullptr)) {
     VL_DEBUG(log, "[DEBUG] url exists, granting the read");
-    // The section stays open: a read that was granted has no end that we hear of.
+    // The section stays open on purpose: no closing line tells a granted read in the log.
     completionHandler(nullptr);
     return;
   }
@@ -44,23 +44,23 @@ void Contents::startProvidingItemAtURL(std::shared_ptr<Contents> self, const NSU
   operation->setFileProvidingCompletion(
       [self, path, section,
        completionHandler = std::move(completionHandler)](const NSErrorPtr& error) mutable {
-        self->operationDidComplete(path, section, error, completionHandler);
+        self->_operationDidComplete(path, section, error, completionHandler);
       });
-  self->store(path, operation);
+  self->_store(path, operation);
   // Queued even when a stop has cancelled it in between: an operation reports, also a
   // cancelled one, only when it is started.
   queue.addOperation(operation);
 }
 
-void Contents::operationDidComplete(const std::string& path, std::uint64_t section,
-                                    const NSErrorPtr& error, ErrorCompletion& completionHandler) {
+void Contents::_operationDidComplete(const std::string& path, std::uint64_t section,
+                                     const NSErrorPtr& error, ErrorCompletion& completionHandler) {
   VL_DEBUG(_environment.log, "[DEBUG] ┳%llx item providing completion; %@", section, error);
-  remove(path);
+  _remove(path);
   completionHandler(vl_fileProviderError(error));
   vlc_closeLogSection(_environment.log, section);
 }
 
-void Contents::store(const std::string& path, Operation operation) {
+void Contents::_store(const std::string& path, Operation operation) {
   MonitorLock lock(_lock);
   Operation& entry = _downloadOperationByPath[path];
   if (entry) {
@@ -71,7 +71,7 @@ void Contents::store(const std::string& path, Operation operation) {
   entry.swap(operation);
 }
 
-void Contents::remove(const std::string& path) {
+void Contents::_remove(const std::string& path) {
   Operation removed;
   MonitorLock lock(_lock);
   const auto found = _downloadOperationByPath.find(path);
@@ -84,7 +84,7 @@ void Contents::remove(const std::string& path) {
   _downloadOperationByPath.erase(found);
 }
 
-Contents::Operation Contents::operationForPath(const std::string& path) {
+Contents::Operation Contents::_operationForPath(const std::string& path) {
   MonitorLock lock(_lock);
   const auto found = _downloadOperationByPath.find(path);
   return found != _downloadOperationByPath.end() ? found->second : nullptr;
@@ -96,7 +96,7 @@ void Contents::stopProvidingItemAtURL(const NSURLPtr& url) {
   if (url) path = url->path();
   VL_DEBUG(log, "[DEBUG] stop providing %@", path);
 
-  if (const Operation operation = path ? operationForPath(*path) : nullptr) {
+  if (const Operation operation = path ? _operationForPath(*path) : nullptr) {
     // Its completion removes the entry and answers whoever started it.
     operation->cancel();
     return;

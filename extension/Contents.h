@@ -46,11 +46,12 @@ class Contents {
  private:
   using Operation = std::shared_ptr<VLFileProvidingOperation>;
 
-  void store(const std::string& path, Operation operation) SKEIN_EXCLUDES(_lock);
-  void remove(const std::string& path) SKEIN_EXCLUDES(_lock);
-  Operation operationForPath(const std::string& path) SKEIN_EXCLUDES(_lock);
-  void operationDidComplete(const std::string& path, std::uint64_t section, const NSErrorPtr& error,
-                            ErrorCompletion& completionHandler) SKEIN_EXCLUDES(_lock);
+  void _store(const std::string& path, Operation operation) SKEIN_EXCLUDES(_lock);
+  void _remove(const std::string& path) SKEIN_EXCLUDES(_lock);
+  Operation _operationForPath(const std::string& path) SKEIN_EXCLUDES(_lock);
+  void _operationDidComplete(const std::string& path, std::uint64_t section,
+                             const NSErrorPtr& error, ErrorCompletion& completionHandler)
+      SKEIN_EXCLUDES(_lock);
 
   Environment& _environment;
   Monitor _lock;

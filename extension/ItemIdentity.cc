@@ -7,18 +7,13 @@
 
 namespace skein {
 
-bool ItemIdentity::isInSyncedLocation(const NSURLPtr& url) const {
+bool ItemIdentity::_isInSyncedLocation(const NSURLPtr& url) const {
   return url && _environment.documents.vl_isInSyncedLocation(url);
 }
 
 NSURLPtr ItemIdentity::URLForItemWithPersistentIdentifier(
     const NSFileProviderItemIdentifier& identifier) {
   return _URLForItemWithPersistentIdentifier(identifier, true);
-}
-
-NSURLPtr ItemIdentity::_URLForItemWithPersistentIdentifier(
-    const NSFileProviderItemIdentifier& identifier, bool resolvingVLAliases) {
-  return _URLForItemWithPersistentIdentifier(identifier, resolvingVLAliases, false);
 }
 
 NSURLPtr ItemIdentity::_URLForItemWithPersistentIdentifier(
@@ -51,14 +46,14 @@ NSURLPtr ItemIdentity::_URLForItemWithPersistentIdentifier(
   } else {
     VL_ERROR(log, "[ERROR] returning nil, there was an error: %@", error);
   }
-  if (!isInSyncedLocation(url)) return nullptr;
+  if (!_isInSyncedLocation(url)) return nullptr;
   if (attachPhysical) documents.vl_addPhysicalProperty(url);
   return url;
 }
 
 std::optional<NSFileProviderItemIdentifier> ItemIdentity::persistentIdentifierForItemAtURL(
     const NSURLPtr& url) {
-  if (!isInSyncedLocation(url)) return std::nullopt;
+  if (!_isInSyncedLocation(url)) return std::nullopt;
 
   Log& log = _environment.log;
   const VLLogSection section(log, _environment.logSections);
@@ -126,7 +121,7 @@ NSFileProviderItemPtr ItemIdentity::_propertiesForNewItemAtURL(const NSURLPtr& u
 
 NSFileProviderItemPtr ItemIdentity::_propertiesForItemAtURL(const NSURLPtr& url, bool forceScan,
                                                             NSErrorOut error) {
-  if (!isInSyncedLocation(url)) {
+  if (!_isInSyncedLocation(url)) {
     error.store(NSError::errorWithDomain(NSFileProviderErrorDomain, NSFileProviderErrorNoSuchItem));
     return nullptr;
   }

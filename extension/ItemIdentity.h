@@ -8,19 +8,16 @@ namespace skein {
 // The principal class's lookups: item identifier to URL and back, the item of either, and
 // the log-in test before them.
 //
-// All synchronous, on the host's threads, several at once; they may ask the daemon. Each
-// traces itself as a log section, under the principal class's name.
-class ItemIdentity final : public VLItemLookup {
+// All synchronous, on the host's threads, several at once; they may ask the daemon. Lookups
+// open a log section each; the log-in test opens none.
+class ItemIdentity : public VLItemLookup {
  public:
   explicit ItemIdentity(Environment& environment) : _environment(environment) {}
 
   NSURLPtr URLForItemWithPersistentIdentifier(
       const NSFileProviderItemIdentifier& identifier) override;
 
-  // _URLForItemWithPersistentIdentifier:resolvingVLAliases:
-  NSURLPtr _URLForItemWithPersistentIdentifier(const NSFileProviderItemIdentifier& identifier,
-                                               bool resolvingVLAliases);
-
+  using VLItemLookup::_URLForItemWithPersistentIdentifier;
   // _URLForItemWithPersistentIdentifier:resolvingVLAliases:attachPhysical:
   // The root's URL comes as it is: neither flag applies to it, nor the log-in test.
   NSURLPtr _URLForItemWithPersistentIdentifier(const NSFileProviderItemIdentifier& identifier,
@@ -42,7 +39,7 @@ class ItemIdentity final : public VLItemLookup {
   // _propertiesForItemAtURL:forceScan:error:
   NSFileProviderItemPtr _propertiesForItemAtURL(const NSURLPtr& url, bool forceScan,
                                                 NSErrorOut error);
-  bool isInSyncedLocation(const NSURLPtr& url) const;
+  bool _isInSyncedLocation(const NSURLPtr& url) const;
 
   Environment& _environment;
 };

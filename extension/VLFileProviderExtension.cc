@@ -17,7 +17,7 @@
 namespace skein {
 
 VLFileProviderExtension::VLFileProviderExtension(Environment& environment)
-    : _environment(environment), _identity(environment), _contents(environment) {}
+    : ItemIdentity(environment), ContainerThumbnails(environment.log), _environment(environment) {}
 
 std::shared_ptr<VLFileProviderExtension> VLFileProviderExtension::init(
     std::shared_ptr<const NSExtensionAttributes> attributes, Environment& environment) {
@@ -25,6 +25,7 @@ std::shared_ptr<VLFileProviderExtension> VLFileProviderExtension::init(
   if (!self->NSFileProviderExtension::init(std::move(attributes))) return nullptr;
 
   self->_operationQueue = std::make_shared<NSOperationQueue>(environment.executor);
+  self->_contents = std::make_unique<Contents>(environment);
   self->_queue = std::make_shared<SerialQueue>("fileprovider-portfolio", environment.executor);
   // Without this the process never hears of account changes, and the next line is in vain.
   environment.accounts.startAccountTokenChangeObserverIfNeeded();
@@ -52,21 +53,21 @@ void VLFileProviderExtension::_accountDidChange() {
 
 NSURLPtr VLFileProviderExtension::URLForItemWithPersistentIdentifier(
     const NSFileProviderItemIdentifier& identifier) {
-  return _identity.URLForItemWithPersistentIdentifier(identifier);
+  return ItemIdentity::URLForItemWithPersistentIdentifier(identifier);
 }
 
 std::optional<NSFileProviderItemIdentifier>
 VLFileProviderExtension::persistentIdentifierForItemAtURL(const NSURLPtr& url) {
-  return _identity.persistentIdentifierForItemAtURL(url);
+  return ItemIdentity::persistentIdentifierForItemAtURL(url);
 }
 
 NSFileProviderItemPtr VLFileProviderExtension::itemForIdentifier(
     const NSFileProviderItemIdentifier& identifier, NSErrorOut error) {
-  return _identity.itemForIdentifier(identifier, error);
+  return ItemIdentity::itemForIdentifier(identifier, error);
 }
 
 NSErrorPtr VLFileProviderExtension::fileProviderErrorFromFSError(const NSErrorPtr& error) {
-  return skein::fileProviderErrorFromFSError(error, _identity);
+  return skein::fileProviderErrorFromFSError(error, *this);
 }
 
 // Enumeration.
@@ -74,7 +75,7 @@ NSErrorPtr VLFileProviderExtension::fileProviderErrorFromFSError(const NSErrorPt
 std::shared_ptr<NSFileProviderEnumerator>
 VLFileProviderExtension::enumeratorForContainerItemIdentifier(
     const NSFileProviderItemIdentifier& identifier, NSErrorOut error) {
-  return skein::enumeratorForContainerItemIdentifier(identifier, error, _identity, _environment);
+  return skein::enumeratorForContainerItemIdentifier(identifier, error, *this, _environment);
 }
 
 // Contents.
@@ -87,8 +88,8 @@ void VLFileProviderExtension::providePlaceholderAtURL(const NSURLPtr& /*url*/,
 void VLFileProviderExtension::startProvidingItemAtURL(const NSURLPtr& url,
                                                       std::uint64_t readingOptions,
                                                       ErrorCompletion completionHandler) {
-  Contents::startProvidingItemAtURL(contents(), url, readingOptions, *_operationQueue,
-                                    std::move(completionHandler));
+  Contents::startProvidingItemAtURL({shared_from_this(), _contents.get()}, url, readingOptions,
+                                    *_operationQueue, std::move(completionHandler));
 }
 
 void VLFileProviderExtension::startProvidingItemAtURL(const NSURLPtr& url,
@@ -97,11 +98,11 @@ void VLFileProviderExtension::startProvidingItemAtURL(const NSURLPtr& url,
 }
 
 void VLFileProviderExtension::stopProvidingItemAtURL(const NSURLPtr& url) {
-  _contents.stopProvidingItemAtURL(url);
+  _contents->stopProvidingItemAtURL(url);
 }
 
 void VLFileProviderExtension::itemChangedAtURL(const NSURLPtr& url) {
-  _contents.itemChangedAtURL(url);
+  _contents->itemChangedAtURL(url);
 }
 
 // Item operations.
@@ -109,69 +110,70 @@ void VLFileProviderExtension::itemChangedAtURL(const NSURLPtr& url) {
 void VLFileProviderExtension::importDocumentAtURL(
     const NSURLPtr& url, const NSFileProviderItemIdentifier& toParentItemIdentifier,
     ItemCompletion completionHandler) {
-  skein::importDocumentAtURL(request(), url, toParentItemIdentifier, std::move(completionHandler));
+  skein::importDocumentAtURL(_itemRequest(), url, toParentItemIdentifier,
+                             std::move(completionHandler));
 }
 
 void VLFileProviderExtension::createDirectoryWithName(
     const std::string& name, const NSFileProviderItemIdentifier& inParentItemIdentifier,
     ItemCompletion completionHandler) {
-  skein::createDirectoryWithName(request(), name, inParentItemIdentifier,
+  skein::createDirectoryWithName(_itemRequest(), name, inParentItemIdentifier,
                                  std::move(completionHandler));
 }
 
 void VLFileProviderExtension::renameItemWithIdentifier(
     const NSFileProviderItemIdentifier& identifier, const std::string& toName,
     ItemCompletion completionHandler) {
-  skein::renameItemWithIdentifier(request(), identifier, toName, std::move(completionHandler));
+  skein::renameItemWithIdentifier(_itemRequest(), identifier, toName, std::move(completionHandler));
 }
 
 void VLFileProviderExtension::reparentItemWithIdentifier(
     const NSFileProviderItemIdentifier& identifier,
     const NSFileProviderItemIdentifier& toParentItemWithIdentifier,
     std::optional<std::string> newName, ItemCompletion completionHandler) {
-  skein::reparentItemWithIdentifier(request(), identifier, toParentItemWithIdentifier,
+  skein::reparentItemWithIdentifier(_itemRequest(), identifier, toParentItemWithIdentifier,
                                     std::move(newName), std::move(completionHandler));
 }
 
 void VLFileProviderExtension::trashItemWithIdentifier(
     const NSFileProviderItemIdentifier& identifier, ItemCompletion completionHandler) {
-  skein::trashItemWithIdentifier(request(), identifier, std::move(completionHandler));
+  skein::trashItemWithIdentifier(_itemRequest(), identifier, std::move(completionHandler));
 }
 
 void VLFileProviderExtension::untrashItemWithIdentifier(
     const NSFileProviderItemIdentifier& identifier,
     std::optional<NSFileProviderItemIdentifier> toParentItemIdentifier,
     ItemCompletion completionHandler) {
-  skein::untrashItemWithIdentifier(request(), identifier, std::move(toParentItemIdentifier),
+  skein::untrashItemWithIdentifier(_itemRequest(), identifier, std::move(toParentItemIdentifier),
                                    std::move(completionHandler));
 }
 
 void VLFileProviderExtension::deleteItemWithIdentifier(
     const NSFileProviderItemIdentifier& identifier, ErrorCompletion completionHandler) {
-  skein::deleteItemWithIdentifier(request(), identifier, std::move(completionHandler));
+  skein::deleteItemWithIdentifier(_itemRequest(), identifier, std::move(completionHandler));
 }
 
 void VLFileProviderExtension::setLastUsedDate(std::optional<NSDate> date,
                                               const NSFileProviderItemIdentifier& forItemIdentifier,
                                               ItemCompletion completionHandler) {
-  skein::setLastUsedDate(request(), date, forItemIdentifier, std::move(completionHandler));
+  skein::setLastUsedDate(_itemRequest(), date, forItemIdentifier, std::move(completionHandler));
 }
 
 void VLFileProviderExtension::setTagData(std::optional<NSData> tagData,
                                          const NSFileProviderItemIdentifier& forItemIdentifier,
                                          ItemCompletion completionHandler) {
-  skein::setTagData(request(), tagData, forItemIdentifier, std::move(completionHandler));
+  skein::setTagData(_itemRequest(), tagData, forItemIdentifier, std::move(completionHandler));
 }
 
 void VLFileProviderExtension::setFavoriteRank(std::optional<std::int64_t> rank,
                                               const NSFileProviderItemIdentifier& forItemIdentifier,
                                               ItemCompletion completionHandler) {
-  skein::setFavoriteRank(request(), rank, forItemIdentifier, std::move(completionHandler));
+  skein::setFavoriteRank(_itemRequest(), rank, forItemIdentifier, std::move(completionHandler));
 }
 
 void VLFileProviderExtension::_defaultApplicationContainerForBundleIdentifier(
     std::optional<std::string> bundleIdentifier, ItemCompletion completionHandler) {
-  skein::_defaultApplicationContainerForBundleIdentifier(request(), bundleIdentifier,
+  skein::_defaultApplicationContainerForBundleIdentifier(_itemRequest(), bundleIdentifier,
                                                          std::move(completionHandler));
 }
 
@@ -180,7 +182,7 @@ void VLFileProviderExtension::_defaultApplicationContainerForBundleIdentifier(
 std::shared_ptr<NSProgress> VLFileProviderExtension::fetchThumbnailsForItemIdentifiers(
     const std::vector<NSFileProviderItemIdentifier>& identifiers, NSSize requestedSize,
     ThumbnailHandler perThumbnailCompletionHandler, ErrorCompletion completionHandler) {
-  return skein::fetchThumbnailsForItemIdentifiers(thumbnailRequest(), identifiers, requestedSize,
+  return skein::fetchThumbnailsForItemIdentifiers(_thumbnailRequest(), identifiers, requestedSize,
                                                   std::move(perThumbnailCompletionHandler),
                                                   std::move(completionHandler));
 }
@@ -190,7 +192,7 @@ std::shared_ptr<NSProgress> VLFileProviderExtension::fetchThumbnailsForItemIdent
     ThumbnailWithTypeHandler perThumbnailCompletionHandlerWithType,
     ErrorCompletion completionHandler) {
   return skein::fetchThumbnailsForItemIdentifiersWithType(
-      thumbnailRequest(), identifiers, requestedSize,
+      _thumbnailRequest(), identifiers, requestedSize,
       std::move(perThumbnailCompletionHandlerWithType), std::move(completionHandler));
 }
 
@@ -198,8 +200,8 @@ std::shared_ptr<NSProgress> VLFileProviderExtension::fetchThumbnailsForItemIdent
 
 NSFileProviderServiceSources VLFileProviderExtension::supportedServiceSourcesForItemIdentifier(
     const NSFileProviderItemIdentifier& identifier, NSErrorOut /*error*/) {
-  return skein::supportedServiceSourcesForItemIdentifier(identifier, request().lookup,
-                                                         _operationQueue, _environment);
+  return skein::supportedServiceSourcesForItemIdentifier(identifier, _lookup(), _operationQueue,
+                                                         _environment);
 }
 
 }  // namespace skein

@@ -11,14 +11,18 @@
 #include "platform/fileprovider/NSFileProviderExtension.h"
 #include "platform/foundation/NSOperation.h"
 #include "support/Environment.h"
+#include "thumbnails/ContainerThumbnails.h"
 #include "thumbnails/ThumbnailBatch.h"
 
 namespace skein {
 
 // The extension's principal class: what a host instantiates by name and calls from its
 // own threads, several operations at once. Every operation is one line that hands it to
-// the room that does it; operations that are not named here behave as the platform's.
+// the room that does it; operations that are not named here behave as the platform's. What it
+// calls itself, it has from its private bases.
 class VLFileProviderExtension final : public NSFileProviderExtension,
+                                      private ItemIdentity,
+                                      private ContainerThumbnails,
                                       public std::enable_shared_from_this<VLFileProviderExtension> {
  public:
   // init
@@ -27,6 +31,7 @@ class VLFileProviderExtension final : public NSFileProviderExtension,
   // `environment` outlives the object.
   static std::shared_ptr<VLFileProviderExtension> init(
       std::shared_ptr<const NSExtensionAttributes> attributes, Environment& environment);
+  // dealloc
   ~VLFileProviderExtension() override;
 
   NSURLPtr URLForItemWithPersistentIdentifier(
@@ -97,17 +102,15 @@ class VLFileProviderExtension final : public NSFileProviderExtension,
 
   // The lookups and the contents, held together with this object: what an asynchronous
   // operation keeps until it has answered.
-  ItemRequest request() { return {{shared_from_this(), &_identity}, _environment}; }
-  ThumbnailRequest thumbnailRequest() {
-    return {{shared_from_this(), &_identity}, _environment, _queue};
-  }
-  std::shared_ptr<Contents> contents() { return {shared_from_this(), &_contents}; }
+  std::shared_ptr<VLItemLookup> _lookup() { return {shared_from_this(), this}; }
+  ItemRequest _itemRequest() { return {_lookup(), _environment}; }
+  ThumbnailRequest _thumbnailRequest() { return {_lookup(), *this, _environment, _queue}; }
 
   Environment& _environment;
-  ItemIdentity _identity;
 
-  // Destroyed from the last to the first: no queue may outlive what its work refers to.
-  Contents _contents;
+  // Released from the last to the first. Work that is under way holds this object, so none is
+  // left by then.
+  std::unique_ptr<Contents> _contents;  // with _downloadOperationByPath
   std::shared_ptr<NSOperationQueue> _operationQueue;
   std::shared_ptr<SerialQueue> _queue;
 };

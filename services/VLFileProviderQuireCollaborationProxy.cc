@@ -52,9 +52,8 @@ void VLFileProviderQuireCollaborationProxy::fetchVersionAndCapabilitiesWithCompl
 VLFileProviderQuireCollaborationProxy::Progress
 VLFileProviderQuireCollaborationProxy::fetchCollaborationTokenWithCompletionHandler(
     Completion<Text, Text, Text, std::optional<NSDate>, NSErrorPtr> handler) {
-  const NSURLPtr url =
-      _item.fileProviderExtension->URLForItemWithPersistentIdentifier(_item.itemIdentifier);
-  const auto operation = _item.environment.sharingOperations.copyShareTokenOperation(url);
+  const NSURLPtr url = _fileProviderExtension->URLForItemWithPersistentIdentifier(_itemIdentifier);
+  const auto operation = _environment.sharingOperations.copyShareTokenOperation(url);
   operation->setShareAndBaseTokenCompletionBlock(
       [handler = std::move(handler)](const Text& shareToken, const Text& baseToken,
                                      const NSErrorPtr& error) mutable {
@@ -65,22 +64,21 @@ VLFileProviderQuireCollaborationProxy::fetchCollaborationTokenWithCompletionHand
           handler(kFileProviderIdentifier, baseToken, shareToken, NSDateDistantFuture(), nullptr);
         }
       });
-  _item.operationQueue->addOperation(operation);
+  _operationQueue->addOperation(operation);
   return _newProgressWithCancellationHandler(cancelling(operation));
 }
 
 VLFileProviderQuireCollaborationProxy::Progress
 VLFileProviderQuireCollaborationProxy::fetchLatestRevisionWithCompletionHandler(
     Completion<NSErrorPtr> handler) {
-  const NSURLPtr url =
-      _item.fileProviderExtension->URLForItemWithPersistentIdentifier(_item.itemIdentifier);
-  VL_DEBUG(_item.environment.log, "[DEBUG] fetchLatestRevisionWithCompletionHandler: %@, %@",
-           _item.itemIdentifier, url);
-  const auto operation = _item.environment.operations.fileProvidingOperation(url, 0);
+  const NSURLPtr url = _fileProviderExtension->URLForItemWithPersistentIdentifier(_itemIdentifier);
+  VL_DEBUG(_environment.log, "[DEBUG] fetchLatestRevisionWithCompletionHandler: %@, %@",
+           _itemIdentifier, url);
+  const auto operation = _environment.operations.fileProvidingOperation(url, 0);
   operation->setWantsCurrentVersion(true);
   operation->setFileProvidingCompletion(
       [handler = std::move(handler)](NSErrorPtr error) mutable { handler(std::move(error)); });
-  _item.operationQueue->addOperation(operation);
+  _operationQueue->addOperation(operation);
   return _newProgressWithCancellationHandler(cancelling(operation));
 }
 
@@ -88,21 +86,20 @@ VLFileProviderQuireCollaborationProxy::Progress
 VLFileProviderQuireCollaborationProxy::refreshSharingStateWithCompletionHandler(
     Completion<NSErrorPtr> handler) {
   const auto answer = std::move(handler).share();
-  _item.environment.daemonConnection
+  _environment.daemonConnection
       .remoteObjectProxyWithErrorHandler(
           [answer](NSErrorPtr error) { (*answer)(std::move(error)); })
-      ->refreshSharingStateForItemIdentifier(
-          _item.itemIdentifier, [&log = _item.environment.log, identifier = _item.itemIdentifier,
-                                 answer](const NSErrorPtr& error) {
-            if (error) {
-              VL_DEBUG(log, "[DEBUG] error refreshing state for item identifier %@: %@", identifier,
-                       error);
-            } else {
-              VL_DEBUG(log, "[DEBUG] finished refreshing state for item identifier: %@",
-                       identifier);
-            }
-            (*answer)(error);
-          });
+      ->refreshSharingStateForItemIdentifier(_itemIdentifier, [&log = _environment.log,
+                                                               identifier = _itemIdentifier,
+                                                               answer](const NSErrorPtr& error) {
+        if (error) {
+          VL_DEBUG(log, "[DEBUG] error refreshing state for item identifier %@: %@", identifier,
+                   error);
+        } else {
+          VL_DEBUG(log, "[DEBUG] finished refreshing state for item identifier: %@", identifier);
+        }
+        (*answer)(error);
+      });
   return NSProgress::progressWithTotalUnitCount(0);
 }
 
@@ -116,14 +113,14 @@ void VLFileProviderQuireCollaborationProxy::fetchURLForSharingFileWithCompletion
   handler(nullptr, nullptr);
 }
 
-void VLFileProviderQuireCollaborationProxy::fetchShareOptions(
+void VLFileProviderQuireCollaborationProxy::_fetchShareOptions(
     Completion<bool, Text, NSErrorPtr> handler) {
   const auto answer = std::move(handler).share();
-  _item.environment.daemonConnection
+  _environment.daemonConnection
       .remoteObjectProxyWithErrorHandler(
           [answer](NSErrorPtr error) { (*answer)(false, std::nullopt, std::move(error)); })
       ->getShareOptionsOfItemIdentifier(
-          _item.itemIdentifier,
+          _itemIdentifier,
           [answer](std::int64_t ways, std::int64_t /*publicPermission*/, std::int64_t ownWays,
                    const Text& folderName, const NSErrorPtr& error) {
             // The values stand for themselves, also beside an error.
@@ -134,8 +131,8 @@ void VLFileProviderQuireCollaborationProxy::fetchShareOptions(
 VLFileProviderQuireCollaborationProxy::Progress
 VLFileProviderQuireCollaborationProxy::fetchFolderSharingStateWithCompletionHandler(
     Completion<bool, NSErrorPtr> handler) {
-  fetchShareOptions([handler = std::move(handler)](bool shared, const Text& /*folderName*/,
-                                                   NSErrorPtr error) mutable {
+  _fetchShareOptions([handler = std::move(handler)](bool shared, const Text& /*folderName*/,
+                                                    NSErrorPtr error) mutable {
     handler(shared, std::move(error));
   });
   return nullptr;
@@ -144,7 +141,7 @@ VLFileProviderQuireCollaborationProxy::fetchFolderSharingStateWithCompletionHand
 VLFileProviderQuireCollaborationProxy::Progress
 VLFileProviderQuireCollaborationProxy::fetchSharedFolderInfoWithCompletionHandler(
     Completion<bool, Text, NSErrorPtr> handler) {
-  fetchShareOptions(std::move(handler));
+  _fetchShareOptions(std::move(handler));
   return nullptr;
 }
 

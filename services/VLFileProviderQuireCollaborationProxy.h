@@ -1,6 +1,6 @@
 #pragma once
 
-#include "services/ServiceSource.h"
+#include "services/ServiceItem.h"
 #include "vellum/VLFileProviderQuireCollaboration.h"
 
 namespace skein {
@@ -11,10 +11,10 @@ namespace skein {
 // framework and the daemon are passed on as they are. There are no sections and no reply
 // lines here. setEnvironmentType:, fetchPrivacyStateWithCompletionHandler: and
 // documentIsInUseWithTimeout: are left out; a client asks before it calls them.
-class VLFileProviderQuireCollaborationProxy final : public VLFileProviderQuireCollaboration {
+class VLFileProviderQuireCollaborationProxy final : public VLFileProviderQuireCollaboration,
+                                                    public ServiceItem {
  public:
-  // initWithFileProviderExtension:itemIdentifier:operationQueue:
-  explicit VLFileProviderQuireCollaborationProxy(ServiceItem item) : _item(std::move(item)) {}
+  using ServiceItem::ServiceItem;
 
   bool respondsToSelector(std::string_view selector) const override;
 
@@ -43,9 +43,7 @@ class VLFileProviderQuireCollaborationProxy final : public VLFileProviderQuireCo
   // _newProgressWithCancellationHandler:
   static Progress _newProgressWithCancellationHandler(std::function<void()> handler);
   // What both answers about folder sharing are made of.
-  void fetchShareOptions(Completion<bool, Text, NSErrorPtr> handler);
-
-  const ServiceItem _item;
+  void _fetchShareOptions(Completion<bool, Text, NSErrorPtr> handler);
 };
 
 }  // namespace skein

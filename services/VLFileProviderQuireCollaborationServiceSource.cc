@@ -8,20 +8,21 @@ std::string VLFileProviderQuireCollaborationServiceSource::serviceName() const {
   return VLQuireCollaborationServiceName;
 }
 
-NSXPCInterface VLFileProviderQuireCollaborationServiceSource::exportedInterface() const {
+NSXPCInterface VLFileProviderQuireCollaborationServiceSource::_exportedInterface() const {
   return NSXPCInterface::interfaceWithProtocol(VLQuireCollaborationProtocolName);
 }
 
 std::shared_ptr<NSXPCExportedObject>
-VLFileProviderQuireCollaborationServiceSource::makeExportedObject(const ServiceItem& item) {
-  return std::make_shared<VLFileProviderQuireCollaborationProxy>(item);
+VLFileProviderQuireCollaborationServiceSource::_makeExportedObject() const {
+  return std::make_shared<VLFileProviderQuireCollaborationProxy>(
+      _fileProviderExtension, _itemIdentifier, _operationQueue, _environment);
 }
 
-void VLFileProviderQuireCollaborationServiceSource::logInvalidated(Log& log) const {
+void VLFileProviderQuireCollaborationServiceSource::_logInvalidated(Log& log) const {
   VL_DEBUG(log, "[DEBUG] collaboration service source connection invalidated");
 }
 
-void VLFileProviderQuireCollaborationServiceSource::logInterrupted(Log& log) const {
+void VLFileProviderQuireCollaborationServiceSource::_logInterrupted(Log& log) const {
   VL_DEBUG(log, "[DEBUG] collaboration service source connection interrupted");
 }
 

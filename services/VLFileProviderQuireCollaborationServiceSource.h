@@ -13,10 +13,10 @@ class VLFileProviderQuireCollaborationServiceSource final : public ServiceSource
   std::string serviceName() const override;
 
  protected:
-  NSXPCInterface exportedInterface() const override;
-  std::shared_ptr<NSXPCExportedObject> makeExportedObject(const ServiceItem& item) override;
-  void logInvalidated(Log& log) const override;
-  void logInterrupted(Log& log) const override;
+  NSXPCInterface _exportedInterface() const override;
+  std::shared_ptr<NSXPCExportedObject> _makeExportedObject() const override;
+  void _logInvalidated(Log& log) const override;
+  void _logInterrupted(Log& log) const override;
 };
 
 }  // namespace skein

@@ -7,17 +7,18 @@ namespace skein {
 
 std::string VLSharingClient::serviceName() const { return VLSharingServiceName; }
 
-NSXPCInterface VLSharingClient::exportedInterface() const { return getSharingServiceInterface(); }
+NSXPCInterface VLSharingClient::_exportedInterface() const { return getSharingServiceInterface(); }
 
-std::shared_ptr<NSXPCExportedObject> VLSharingClient::makeExportedObject(const ServiceItem& item) {
-  return std::make_shared<VLSharingProxy>(item);
+std::shared_ptr<NSXPCExportedObject> VLSharingClient::_makeExportedObject() const {
+  return std::make_shared<VLSharingProxy>(_fileProviderExtension, _itemIdentifier, _operationQueue,
+                                          _environment);
 }
 
-void VLSharingClient::logInvalidated(Log& log) const {
+void VLSharingClient::_logInvalidated(Log& log) const {
   VL_DEBUG(log, "[DEBUG] sharing service source connection invalidated");
 }
 
-void VLSharingClient::logInterrupted(Log& log) const {
+void VLSharingClient::_logInterrupted(Log& log) const {
   VL_DEBUG(log, "[DEBUG] sharing service source connection interrupted");
 }
 

@@ -4,7 +4,7 @@
 #include <string>
 
 #include "base/Mutex.h"
-#include "services/ServiceSource.h"
+#include "services/ServiceItem.h"
 #include "support/VLLogSection.h"
 #include "vellum/VLSharingServiceV1.h"
 
@@ -16,15 +16,15 @@ namespace skein {
 // not its reply has come; every reply is logged just before it is given. Methods come on
 // the transport's threads; replies of what asks the framework, on the framework's.
 class VLSharingProxy final : public VLSharingServiceV1,
+                             public ServiceItem,
                              public std::enable_shared_from_this<VLSharingProxy> {
  public:
-  // initWithFileProviderExtension:itemIdentifier:operationQueue:
-  explicit VLSharingProxy(ServiceItem item) : _item(std::move(item)) {}
+  using ServiceItem::ServiceItem;
 
-  void fetchSharingInfo(Completion<bool, NSFileProviderItemPtr, NSErrorPtr> reply) override;
+  void fetchSharingInfo(Completion<bool, VLFileProviderItemPtr, NSErrorPtr> reply) override;
   // Answers with the same flag: no other test is made.
   Progress preflightCheckIfCurrentlyShareableWithCompletion(
-      Completion<bool, NSFileProviderItemPtr, Items, Items, NSErrorPtr> completion) override;
+      Completion<bool, VLFileProviderItemPtr, Items, Items, NSErrorPtr> completion) override;
   Progress fetchParticipantListAndPublicPermission(
       Completion<Participants, std::int64_t, NSErrorPtr> reply) override;
   // Has no effect.
@@ -40,21 +40,20 @@ class VLSharingProxy final : public VLSharingServiceV1,
   Progress unshareWithCompletion(Completion<NSErrorPtr> completion) override;
 
  private:
-  VLLogSection openSection(const char* method) const;
+  VLLogSection _openSection(const char* method) const;
   // Whether the item is shared, or why that cannot be said.
-  bool isShared(NSErrorOut error) const;
-  NSURLPtr url() const;
+  bool _isShared(NSErrorOut error) const;
+  NSURLPtr _url() const;
 
   // unshareWithCompletion:, once the share is there.
-  void removeShare(const CKSharePtr& share, const std::shared_ptr<NSProgress>& progress,
-                   Completion<NSErrorPtr> reply);
+  void _removeShare(const CKSharePtr& share, const std::shared_ptr<NSProgress>& progress,
+                    Completion<NSErrorPtr> reply);
 
   // The last share known for the item, or nil. It is read and written at any time, by
   // framework threads too, without anyone waiting for a request to end.
-  CKSharePtr cachedShare() const SKEIN_EXCLUDES(_mutex);
-  void setCachedShare(CKSharePtr share) SKEIN_EXCLUDES(_mutex);
+  CKSharePtr _currentCachedShare() const SKEIN_EXCLUDES(_mutex);
+  void _setCachedShare(CKSharePtr share) SKEIN_EXCLUDES(_mutex);
 
-  const ServiceItem _item;
   mutable Mutex _mutex;
   CKSharePtr _cachedShare SKEIN_GUARDED_BY(_mutex);
 };

@@ -8,7 +8,7 @@
 #include "platform/foundation/NSNotificationCenter.h"
 #include "platform/launchservices/LSBundleProxy.h"
 #include "platform/log/Log.h"
-#include "platform/quicklook/QLThumbnails.h"
+#include "platform/quicklook/QLThumbnailStoreRetrievalOperation.h"
 #include "platform/xpc/NSXPCListener.h"
 #include "support/RootURL.h"
 #include "support/VLLogSection.h"
@@ -31,20 +31,20 @@ struct Environment {
   Log& log;  // vlc_default_log
   std::shared_ptr<Executor> executor;
   NSNotificationCenter& notificationCenter;
-  NSFileProviderManager& providerManager;
+  NSFileProviderManager& providerManager;  // defaultManager
   VLAccounts& accounts;
   VLContainers& containers;
-  VLDaemonConnection& daemonConnection;
+  VLDaemonConnection& daemonConnection;  // defaultConnection
   VLDocuments& documents;
   VLQueryItemLookup& queryItems;
   VLLogSections& logSections;
   RootURL& rootURL;
   VLFileOperations& fileOperations;
-  VLFileManager& fileManager;
+  VLFileManager& fileManager;  // NSFileManager's defaultManager
   VLOperations& operations;
   CKContainers& cloud;
-  QLThumbnails& systemThumbnails;
-  VLRemoteUserDefaults& remoteDefaults;
+  QLThumbnailStoreRetrievalOperation& systemThumbnails;
+  VLRemoteUserDefaults& remoteDefaults;  // sharedDefaults
   VLDownloads& downloads;
   LSBundles& bundles;
   VLSharingOperations& sharingOperations;

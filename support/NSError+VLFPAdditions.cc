@@ -15,8 +15,7 @@ struct Mapping {
 constexpr Mapping kCocoaMappings[] = {
     {NSUbiquitousFileUbiquityServerNotAvailable, NSFileProviderErrorServerUnreachable},
     {NSUbiquitousFileNotUploadedDueToQuotaError, NSFileProviderErrorInsufficientQuota},
-    // 14, and not NSFileNoSuchFileError (4): a plain missing file on disk is an error of
-    // its own to the host, which may retry it; "no such item" would make it drop the item.
+    // 14 as it stands. NSFileNoSuchFileError (4) has no counterpart: the host gets it as it is.
     {14, NSFileProviderErrorNoSuchItem},
 };
 

@@ -10,7 +10,7 @@ NSURLPtr RootURL::get(VLContainers& containers, Executor& executor) {
     isAsked = _isAsking;
     _isAsking = true;
   }
-  if (isAsked) return waitForAnswer(executor);
+  if (isAsked) return _waitForAnswer(executor);
 
   const VLContainersByID table = containers.allContainersByContainerID();
   const auto found = table.find(VLUbiquitousDefaultContainerID);
@@ -29,7 +29,7 @@ NSURLPtr RootURL::get(VLContainers& containers, Executor& executor) {
 
 // Whoever waited takes the answer as it is, also when there was none: to ask again one after
 // the other would make the last wait for all.
-NSURLPtr RootURL::waitForAnswer(Executor& executor) {
+NSURLPtr RootURL::_waitForAnswer(Executor& executor) {
   ScopedWait wait(executor);
   MutexLock lock(_mutex);
   const std::uint64_t before = _answers;

@@ -20,7 +20,7 @@ class RootURL {
   NSURLPtr get(VLContainers& containers, Executor& executor) SKEIN_EXCLUDES(_mutex);
 
  private:
-  NSURLPtr waitForAnswer(Executor& executor) SKEIN_EXCLUDES(_mutex);
+  NSURLPtr _waitForAnswer(Executor& executor) SKEIN_EXCLUDES(_mutex);
 
   Mutex _mutex;
   CondVar _answered;

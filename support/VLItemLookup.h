@@ -18,6 +18,12 @@ class VLItemLookup {
   virtual NSURLPtr URLForItemWithPersistentIdentifier(
       const NSFileProviderItemIdentifier& identifier) = 0;
 
+  // _URLForItemWithPersistentIdentifier:resolvingVLAliases: without the physical property.
+  NSURLPtr _URLForItemWithPersistentIdentifier(const NSFileProviderItemIdentifier& identifier,
+                                               bool resolvingVLAliases) {
+    return _URLForItemWithPersistentIdentifier(identifier, resolvingVLAliases, false);
+  }
+
   // _URLForItemWithPersistentIdentifier:resolvingVLAliases:attachPhysical:
   virtual NSURLPtr _URLForItemWithPersistentIdentifier(
       const NSFileProviderItemIdentifier& identifier, bool resolvingVLAliases,

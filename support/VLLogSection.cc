@@ -14,7 +14,7 @@ std::uint64_t VLLogSections::create(VLLogSectionLevel level) {
 
 void vlc_closeLogSection(Log& log, std::uint64_t section) {
   if (section == 0) return;
-  // Both texts end in one space: readers of the log match on it.
+  // Both texts end in one space, on purpose.
   if (section % 2 == 1) {
     VL_DEBUG(log, "[DEBUG] ┗%llx ", section);
   } else {

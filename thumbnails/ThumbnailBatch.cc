@@ -4,7 +4,6 @@
 
 #include "platform/fileprovider/NSFileProviderError.h"
 #include "support/NSError+VLFPAdditions.h"
-#include "thumbnails/ContainerThumbnail.h"
 #include "thumbnails/ZoneFetch.h"
 #include "vellum/VLDaemonSyncProxy.h"
 
@@ -29,10 +28,10 @@ std::vector<VLFileObjectID> answerLocally(
     const auto containerID =
         url ? environment.documents.vl_containerIDIfIsDocumentsContainerURL(url) : std::nullopt;
     if (containerID) {
-      const NSSize size = _properSizeForContainerThumbnail(requestedSize, environment.log);
+      const NSSize size = request.containers._properSizeForContainerThumbnail(requestedSize);
       if (!knownContainers) knownContainers = environment.containers.allContainersByContainerID();
-      _fetchThumbnailForContainerID(*containerID, identifier, size, *knownContainers, handler,
-                                    environment.log);
+      request.containers._fetchThumbnailForContainerID(*containerID, identifier, size,
+                                                       *knownContainers, handler);
       continue;
     }
     const auto fileObjectID = VLFileObjectID::fileObjectIDWithString(identifier);

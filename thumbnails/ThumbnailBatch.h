@@ -11,6 +11,7 @@
 #include "platform/fileprovider/NSFileProviderExtension.h"
 #include "support/Environment.h"
 #include "support/VLItemLookup.h"
+#include "thumbnails/ContainerThumbnails.h"
 
 namespace skein {
 
@@ -18,6 +19,7 @@ namespace skein {
 struct ThumbnailRequest {
   // The principal class's lookups; to hold them is to hold the principal object.
   std::shared_ptr<VLItemLookup> lookup;
+  const ContainerThumbnails& containers;
   Environment& environment;
   // Where the final completion runs, unless the batch ends before this call returns.
   std::shared_ptr<SerialQueue> queue;
@@ -26,8 +28,9 @@ struct ThumbnailRequest {
 // fetchThumbnailsForItemIdentifiers:requestedSize:perThumbnailCompletionHandlerWithType:completionHandler:
 // Blocks while the daemon finds out the records; the rest comes later. The per-thumbnail
 // handler is called once per item, several at once, on this thread or the cloud's, and may be
-// empty; an item that the daemon knows no record of gets no call. The completion handler is
-// called once, after all of these: with the daemon's error, when there are no records for that
+// empty; an item that the daemon knows no record of gets no call, and a record that was not
+// asked for comes under an empty identifier. The completion handler is called once, after all
+// of these: with the daemon's error, when there are no records for that
 // reason (documents get no call then), or the error of the last zone that failed, translated.
 // Cancelling the progress cancels every operation; they end through the same handlers.
 std::shared_ptr<NSProgress> fetchThumbnailsForItemIdentifiersWithType(

@@ -2,7 +2,6 @@
 
 #include <utility>
 
-#include "base/Fault.h"
 #include "platform/dispatch/DispatchSemaphore.h"
 #include "support/NSError+VLFPAdditions.h"
 
@@ -58,15 +57,10 @@ void recordDidArrive(ThumbnailFetch& fetch, const ZoneItems& items, const CKReco
   std::optional<NSData> data = NSData::dataWithContentsOfURL(thumbnailURL(record));
   const std::int64_t size = sizeOf(record);
 
-  const auto found = items.find(recordID);
+  // nil for a record that was not asked for, which is told of like any other.
+  std::optional<NSFileProviderItemIdentifier> identifier;
+  if (const auto found = items.find(recordID); found != items.end()) identifier = found->second;
   VL_DEBUG(log, "[DEBUG] ┳%llx received a thumbnail callback for %@", fetch.section, recordID);
-  // A database names only records that it was asked for.
-  if (found == items.end()) {
-    reportFault("a record that was not asked for: " + description(recordID));
-    vlc_closeLogSection(log, fetch.section);
-    return;
-  }
-  const NSFileProviderItemIdentifier& identifier = found->second;
   if (data) {
     VL_DEBUG(log, "[DEBUG] received a thumbnail of %lu bytes for %@", data->length(), identifier);
   } else if (error) {
@@ -76,12 +70,12 @@ void recordDidArrive(ThumbnailFetch& fetch, const ZoneItems& items, const CKReco
   } else {
     VL_DEBUG(log, "[DEBUG] no thumbnail found for a non-empty file");
     if (size <= fetch.environment.remoteDefaults.minFileSizeForThumbnailTransfer()) {
-      downloadIfRenderable(fetch, identifier, error);
+      downloadIfRenderable(fetch, identifier.value_or(""), error);
     }
   }
   // Also a file that is being downloaded has no data here: whoever asked draws it himself.
   if (fetch.perThumbnailCompletionHandler) {
-    fetch.perThumbnailCompletionHandler(identifier, std::move(data), std::nullopt,
+    fetch.perThumbnailCompletionHandler(identifier.value_or(""), std::move(data), std::nullopt,
                                         vl_fileProviderError(error));
   }
   vlc_closeLogSection(log, fetch.section);

@@ -2,7 +2,7 @@
 #pragma once
 
 #include <cstdint>
-#include <functional>
+#include <map>
 #include <memory>
 #include <optional>
 #include <string>
@@ -12,6 +12,7 @@
 #include "platform/foundation/NSData.h"
 #include "platform/foundation/NSError.h"
 #include "platform/foundation/NSURL.h"
+#include "platform/xpc/NSXPCProxyCreating.h"
 #include "vellum/VLContentRecords.h"
 #include "vellum/VLFileObjectID.h"
 #include "vellum/VLQueryItem.h"
@@ -54,14 +55,9 @@ class VLItemNotificationSending {
   virtual void invalidate() = 0;
 };
 
-// A sender as it comes from the daemon: makes proxies of itself, each with an error
-// handler of its own for the messages that are lost. Their errors come on a reply thread.
-class VLItemNotificationSender : public VLItemNotificationSending {
- public:
-  // Never null.
-  virtual std::shared_ptr<VLItemNotificationSending> remoteObjectProxyWithErrorHandler(
-      std::function<void(NSErrorPtr)> errorHandler) = 0;
-};
+// A sender as it comes from the daemon: makes proxies of itself.
+class VLItemNotificationSender : public VLItemNotificationSending,
+                                 public NSXPCProxyCreating<VLItemNotificationSending> {};
 
 // vald itself, as a proxy. Asynchronous: a call returns at once; its reply runs later,
 // once, on a reply thread, from where synchronous calls may be made, or the proxy's error
@@ -69,6 +65,8 @@ class VLItemNotificationSender : public VLItemNotificationSending {
 class VLDaemon {
  public:
   using ItemsReply = Reply<NSFileProviderItems, std::uint64_t, NSErrorPtr>;
+  using Dictionary = std::map<std::string, std::string>;
+  using SenderReply = Reply<std::shared_ptr<VLItemNotificationSender>, Dictionary, NSErrorPtr>;
 
   virtual ~VLDaemon() = default;
 
@@ -95,10 +93,10 @@ class VLDaemon {
       Reply<NSFileProviderItems, std::vector<VLFileObjectID>, std::optional<NSData>, NSErrorPtr>
           completion) = 0;
 
-  // getItemUpdateSenderWithReceiver:reply: the daemon holds `receiver` as said above.
+  // getItemUpdateSenderWithReceiver:reply: the daemon holds `receiver` as said above. The
+  // dictionary is what a daemon has to tell of the sender: this host's has nothing to tell.
   virtual void getItemUpdateSenderWithReceiver(
-      std::shared_ptr<VLItemNotificationReceiving> receiver,
-      Reply<std::shared_ptr<VLItemNotificationSender>, NSErrorPtr> reply) = 0;
+      std::shared_ptr<VLItemNotificationReceiving> receiver, SenderReply reply) = 0;
 
   // getContainerURLForID:recreateDocumentsIfNeeded:reply:
   // The documents folder of a container, made again when it is gone and that is wanted. The
@@ -138,15 +136,8 @@ class VLDaemon {
       Reply<std::optional<VLContentRecordIDs>, NSErrorPtr> reply);
 };
 
-// The process's connection to vald; it is made anew when it was lost. Any thread.
-class VLDaemonConnection {
- public:
-  virtual ~VLDaemonConnection() = default;
-
-  // remoteObjectProxyWithErrorHandler: never null. The handler runs once for each
-  // message that gets no reply because the connection failed, on a reply thread.
-  virtual std::shared_ptr<VLDaemon> remoteObjectProxyWithErrorHandler(
-      std::function<void(NSErrorPtr)> errorHandler) = 0;
-};
+// The process's connection to vald; it is made anew when it was lost. Any
+// thread.
+class VLDaemonConnection : public NSXPCProxyCreating<VLDaemon> {};
 
 }  // namespace skein

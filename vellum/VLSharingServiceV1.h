@@ -15,6 +15,10 @@
 
 namespace skein {
 
+// What the service calls an item.
+using VLFileProviderItem = NSFileProviderItem;
+using VLFileProviderItemPtr = std::shared_ptr<const VLFileProviderItem>;
+
 inline constexpr char VLSharingServiceName[] = "com.tessel.Vellum.SharingV1";
 
 // Sharing one item, as a client process meets it. Methods return soon; each reply comes
@@ -23,15 +27,15 @@ inline constexpr char VLSharingServiceName[] = "com.tessel.Vellum.SharingV1";
 class VLSharingServiceV1 : public NSXPCExportedObject {
  public:
   using Progress = std::shared_ptr<NSProgress>;
-  using Items = std::optional<NSFileProviderItems>;
+  using Items = std::optional<std::vector<VLFileProviderItemPtr>>;
   using Participants = std::optional<std::vector<CKShareParticipant>>;
 
   // fetchSharingInfo: whether the item is shared.
-  virtual void fetchSharingInfo(Completion<bool, NSFileProviderItemPtr, NSErrorPtr> reply) = 0;
+  virtual void fetchSharingInfo(Completion<bool, VLFileProviderItemPtr, NSErrorPtr> reply) = 0;
 
   // preflightCheckIfCurrentlyShareableWithCompletion:
   virtual Progress preflightCheckIfCurrentlyShareableWithCompletion(
-      Completion<bool, NSFileProviderItemPtr, Items, Items, NSErrorPtr> completion) = 0;
+      Completion<bool, VLFileProviderItemPtr, Items, Items, NSErrorPtr> completion) = 0;
 
   // fetchParticipantListAndPublicPermission:
   virtual Progress fetchParticipantListAndPublicPermission(

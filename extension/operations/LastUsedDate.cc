@@ -11,7 +11,7 @@ void setLastUsedDate(const ItemRequest& request, std::optional<NSDate> date,
            forItemIdentifier);
   // No physical property, unlike for the favourite rank: the date is the logical item's.
   const NSURLPtr url = request.lookup->_URLForItemWithPersistentIdentifier(
-      forItemIdentifier, /*resolvingVLAliases=*/false, /*attachPhysical=*/false);
+      forItemIdentifier, /*resolvingVLAliases=*/false);
   request.environment.fileManager.vl_setLastOpenDate(date, url);
   completeWithNewItemAtURL(*request.lookup, url, completionHandler);
 }

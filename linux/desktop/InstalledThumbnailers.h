@@ -6,14 +6,14 @@
 #include <vector>
 
 #include "base/Mutex.h"
-#include "platform/quicklook/QLThumbnails.h"
+#include "platform/quicklook/QLThumbnailStoreRetrievalOperation.h"
 
 namespace skein {
 
 // What this desktop can draw thumbnails of: the content types of the .thumbnailer entries
 // whose program is there, and their subtypes. An entry that comes or goes is noticed. Any
 // thread; reads folders.
-class InstalledThumbnailers final : public QLThumbnails {
+class InstalledThumbnailers final : public QLThumbnailStoreRetrievalOperation {
  public:
   // Entries of an earlier folder hide those of the same name in later ones.
   explicit InstalledThumbnailers(std::vector<std::string> folders) : _folders(std::move(folders)) {}

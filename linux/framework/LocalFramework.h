@@ -9,7 +9,7 @@
 #include "platform/cloudkit/CloudKit.h"
 #include "platform/launchservices/LSBundleProxy.h"
 #include "platform/log/Log.h"
-#include "platform/quicklook/QLThumbnails.h"
+#include "platform/quicklook/QLThumbnailStoreRetrievalOperation.h"
 #include "vellum/VLAccount.h"
 #include "vellum/VLContainer.h"
 #include "vellum/VLDaemonConnection.h"
@@ -49,7 +49,7 @@ class LocalFramework {
   VLFileManager& fileManager() { return *_fileManager; }
   VLOperations& operations() { return *_operations; }
   CKContainers& cloud() { return *_cloud; }
-  QLThumbnails& systemThumbnails() { return *_systemThumbnails; }
+  QLThumbnailStoreRetrievalOperation& systemThumbnails() { return *_systemThumbnails; }
   VLRemoteUserDefaults& remoteDefaults() { return *_remoteDefaults; }
   VLDownloads& downloads() { return *_downloads; }
   LSBundles& bundles() { return *_bundles; }
@@ -71,7 +71,7 @@ class LocalFramework {
   const std::unique_ptr<VLFileManager> _fileManager;
   const std::unique_ptr<VLOperations> _operations;
   const std::unique_ptr<CKContainers> _cloud;
-  const std::unique_ptr<QLThumbnails> _systemThumbnails;
+  const std::unique_ptr<QLThumbnailStoreRetrievalOperation> _systemThumbnails;
   const std::unique_ptr<VLRemoteUserDefaults> _remoteDefaults;
   const std::unique_ptr<VLDownloads> _downloads;
   const std::unique_ptr<LSBundles> _bundles;

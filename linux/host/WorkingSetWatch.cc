@@ -34,7 +34,7 @@ class WorkingSetWatch::Link final : public VLItemNotificationReceiving,
       self->_daemon(fail)->getItemUpdateSenderWithReceiver(
           self,
           [self, store = status.store](const std::shared_ptr<VLItemNotificationSender>& sender,
-                                       const NSErrorPtr& problem) {
+                                       const auto& /*dictionary*/, const NSErrorPtr& problem) {
             if (problem || !sender) {
               self->beginLater();
             } else {

@@ -137,9 +137,8 @@ class DaemonProxy final : public LocalDaemon {
         });
   }
 
-  void getItemUpdateSenderWithReceiver(
-      std::shared_ptr<VLItemNotificationReceiving> receiver,
-      Reply<std::shared_ptr<VLItemNotificationSender>, NSErrorPtr> reply) override {
+  void getItemUpdateSenderWithReceiver(std::shared_ptr<VLItemNotificationReceiving> receiver,
+                                       SenderReply reply) override {
     auto link = std::make_shared<UpdateLink>(_calls.socket(), std::move(receiver));
     call(
         [link](wire::Daemon::Client& daemon) {
@@ -157,7 +156,7 @@ class DaemonProxy final : public LocalDaemon {
           }
           return [reply = std::move(reply), sender = std::move(sender),
                   error = codec::errorOf(results)]() mutable {
-            reply(std::move(sender), std::move(error));
+            reply(std::move(sender), {}, std::move(error));
           };
         });
   }

@@ -124,9 +124,9 @@ class DaemonObject : public wire::Daemon::Server,
         _service, context,
         [&](auto reply) {
           daemon().getItemUpdateSenderWithReceiver(
-              receiver,
-              [reply = std::move(reply), executor = _service->executor](
-                  std::shared_ptr<VLItemNotificationSender> sender, NSErrorPtr error) mutable {
+              receiver, [reply = std::move(reply), executor = _service->executor](
+                            std::shared_ptr<VLItemNotificationSender> sender,
+                            const auto& /*dictionary*/, NSErrorPtr error) mutable {
                 if (sender) sender = invalidatedAtTheEnd(std::move(sender), std::move(executor));
                 reply(std::move(sender), std::move(error));
               });

@@ -127,9 +127,8 @@ void Daemon::enumerateWorkingSetChangesFromChangeToken(
       });
 }
 
-void Daemon::getItemUpdateSenderWithReceiver(
-    std::shared_ptr<VLItemNotificationReceiving> receiver,
-    Reply<std::shared_ptr<VLItemNotificationSender>, NSErrorPtr> reply) {
+void Daemon::getItemUpdateSenderWithReceiver(std::shared_ptr<VLItemNotificationReceiving> receiver,
+                                             SenderReply reply) {
   answerLoggedIn(
       std::move(reply), [receiver = std::move(receiver)](Daemon& self, auto& answered) mutable {
         if (!receiver)
@@ -140,7 +139,7 @@ void Daemon::getItemUpdateSenderWithReceiver(
         if (!self._parts.accounts.current()) {
           return answerError(answered, vlc_errorLoggedOut());
         }
-        answered(std::move(sender), error);
+        answered(std::move(sender), {}, error);
       });
 }
 

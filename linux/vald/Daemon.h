@@ -61,9 +61,8 @@ class Daemon final : public LocalDaemon, public std::enable_shared_from_this<Dae
       std::optional<NSData> changeToken, std::uint64_t limit,
       Reply<NSFileProviderItems, std::vector<VLFileObjectID>, std::optional<NSData>, NSErrorPtr>
           completion) override;
-  void getItemUpdateSenderWithReceiver(
-      std::shared_ptr<VLItemNotificationReceiving> receiver,
-      Reply<std::shared_ptr<VLItemNotificationSender>, NSErrorPtr> reply) override;
+  void getItemUpdateSenderWithReceiver(std::shared_ptr<VLItemNotificationReceiving> receiver,
+                                       SenderReply reply) override;
 
   void getContainerURLForID(
       const std::string& containerID, bool recreateDocumentsIfNeeded,

@@ -30,8 +30,10 @@ struct NSExtensionAttributes {
 // its own threads, several at once. A completion handler is called exactly once, on
 // any thread, unless the operation says otherwise; an empty one is allowed.
 //
-// Every operation here has the platform's default behaviour: lookups answer nil, the
-// others answer NSFeatureUnsupportedError in NSCocoaErrorDomain ("not supported").
+// What stands here is the platform's default behaviour. Lookups of URLs and identifiers
+// answer nil; fileProviderErrorFromFSError answers the error that it got;
+// stopProvidingItemAtURL and itemChangedAtURL do nothing. All others answer
+// NSFeatureUnsupportedError in NSCocoaErrorDomain, beside nil where they answer a value.
 class NSFileProviderExtension {
  public:
   using ItemCompletion = Completion<NSFileProviderItemPtr, NSErrorPtr>;

@@ -128,16 +128,15 @@ class FakeDaemon final : public LocalDaemon {
               ' ' + std::to_string(limit));
     completion(provided(), deletions, token, error);
   }
-  void getItemUpdateSenderWithReceiver(
-      std::shared_ptr<VLItemNotificationReceiving> receiver,
-      Reply<std::shared_ptr<VLItemNotificationSender>, NSErrorPtr> reply) override {
+  void getItemUpdateSenderWithReceiver(std::shared_ptr<VLItemNotificationReceiving> receiver,
+                                       SenderReply reply) override {
     if (error) {
-      reply(nullptr, error);
+      reply(nullptr, {}, error);
       return;
     }
     auto sender = std::make_shared<FakeSender>(std::move(receiver), sendersGone);
     senders.add(sender);
-    reply(std::move(sender), nullptr);
+    reply(std::move(sender), {}, nullptr);
   }
   void URLForFileObjectID(VLFileObjectID fileObjectID, Reply<NSURLPtr, NSErrorPtr> reply) override {
     asked.add("url " + fileObjectID.asString());

@@ -347,10 +347,11 @@ TEST_F(Faults, ReachTheSendersThatAnAnswerCarried) {
                         const std::vector<std::string>&, Reply<>) override {}
     void receiveProgressUpdates(const VLQueryItems&, Reply<>) override {}
   };
-  const auto [sender, error] = ask<std::shared_ptr<VLItemNotificationSender>, NSErrorPtr>(
-      *client, [](LocalDaemon& to, auto reply) {
-        to.getItemUpdateSenderWithReceiver(std::make_shared<Nobody>(), std::move(reply));
-      });
+  const auto [sender, dictionary, error] =
+      ask<std::shared_ptr<VLItemNotificationSender>, VLDaemon::Dictionary, NSErrorPtr>(
+          *client, [](LocalDaemon& to, auto reply) {
+            to.getItemUpdateSenderWithReceiver(std::make_shared<Nobody>(), std::move(reply));
+          });
   const auto fake = daemon->senders.take().value();
   plan("watchItem", FaultInjection::Action::AnswerError);
   Outcome<NSErrorPtr> watched;

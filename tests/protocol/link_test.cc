@@ -42,10 +42,11 @@ class Links : public ProtocolTest {
  protected:
   // Sets a watch up and takes both its ends.
   void link() {
-    auto [got, error] = ask<std::shared_ptr<VLItemNotificationSender>, NSErrorPtr>(
-        *client, [&](LocalDaemon& proxy, auto reply) {
-          proxy.getItemUpdateSenderWithReceiver(receiver, std::move(reply));
-        });
+    auto [got, dictionary, error] =
+        ask<std::shared_ptr<VLItemNotificationSender>, VLDaemon::Dictionary, NSErrorPtr>(
+            *client, [&](LocalDaemon& proxy, auto reply) {
+              proxy.getItemUpdateSenderWithReceiver(receiver, std::move(reply));
+            });
     ASSERT_TRUE(got);
     sender = std::move(got);
     served = *daemon->senders.take();
@@ -111,10 +112,11 @@ TEST_F(Links, MessagesOfTheSenderReachVald) {
 
 TEST_F(Links, ValdsRefusalComesAsAnError) {
   daemon->error = NSError::errorWithDomain(VLVellumErrorDomain, 2);
-  const auto [got, error] = ask<std::shared_ptr<VLItemNotificationSender>, NSErrorPtr>(
-      *client, [&](LocalDaemon& proxy, auto reply) {
-        proxy.getItemUpdateSenderWithReceiver(receiver, std::move(reply));
-      });
+  const auto [got, dictionary, error] =
+      ask<std::shared_ptr<VLItemNotificationSender>, VLDaemon::Dictionary, NSErrorPtr>(
+          *client, [&](LocalDaemon& proxy, auto reply) {
+            proxy.getItemUpdateSenderWithReceiver(receiver, std::move(reply));
+          });
   EXPECT_EQ(got, nullptr);
   EXPECT_EQ(error->code(), 2);
   receiver.reset();

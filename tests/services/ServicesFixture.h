@@ -102,7 +102,7 @@ struct LookupByTable final : VLItemLookup {
 template <class Proxy>
 struct ProxyFixture : ServicesFixture {
   std::shared_ptr<Proxy> makeProxy(const std::string& identifier) {
-    return std::make_shared<Proxy>(ServiceItem{lookup, identifier, queue, env.environment});
+    return std::make_shared<Proxy>(lookup, identifier, queue, env.environment);
   }
   // Writes "answer: " and the values.
   template <class... Words>

@@ -8,7 +8,7 @@
 
 #include "base/Mutex.h"
 #include "platform/cloudkit/CloudKit.h"
-#include "platform/quicklook/QLThumbnails.h"
+#include "platform/quicklook/QLThumbnailStoreRetrievalOperation.h"
 #include "tests/support/HeldCalls.h"
 #include "tests/support/Transcript.h"
 #include "vellum/VLThumbnailTransfer.h"
@@ -68,7 +68,7 @@ class ScriptedCloud final : public CKContainers {
 
 // What decides whether a file is downloaded for its thumbnail, and the download. Starts are
 // answered at once, on the asking thread, unless the test holds them.
-class ScriptedThumbnailTransfer final : public QLThumbnails,
+class ScriptedThumbnailTransfer final : public QLThumbnailStoreRetrievalOperation,
                                         public VLRemoteUserDefaults,
                                         public VLDownloads {
  public:

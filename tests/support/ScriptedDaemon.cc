@@ -81,9 +81,8 @@ class ScriptedDaemon::Proxy final : public VLDaemon {
         std::to_string(limit));
     _daemon.workingSetChanges.hold(std::move(completion), _errorHandler);
   }
-  void getItemUpdateSenderWithReceiver(
-      std::shared_ptr<VLItemNotificationReceiving> receiver,
-      Reply<std::shared_ptr<VLItemNotificationSender>, NSErrorPtr> reply) override {
+  void getItemUpdateSenderWithReceiver(std::shared_ptr<VLItemNotificationReceiving> receiver,
+                                       SenderReply reply) override {
     say("sender");
     _daemon.senders.hold(
         [receiver = std::move(receiver), reply = std::move(reply)](
@@ -91,7 +90,7 @@ class ScriptedDaemon::Proxy final : public VLDaemon {
           if (auto* own = dynamic_cast<ScriptedSender*>(sender.get())) {
             own->holdReceiver(std::move(receiver));
           }
-          reply(std::move(sender), std::move(error));
+          reply(std::move(sender), {{"protocol", "1"}}, std::move(error));
         },
         _errorHandler);
   }

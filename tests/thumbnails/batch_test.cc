@@ -134,6 +134,11 @@ TEST_F(ThumbnailBatches, ARecordWithoutAPicture) {
         "3", {{kVLRecordKeyThumbnail1024x1024, std::make_shared<const CKAsset>(CKAsset{url})}});
     EXPECT_EQ(take()[1], "[DEBUG] empty record for " + documentID(3));
   }
+  // A record that was not asked for is told of as well.
+  operation->perRecordCompletionBlock(nullptr, recordID(7, own), nullptr);
+  const Lines stray = take();
+  EXPECT_EQ(stray[1], "[DEBUG] empty record for (null)");
+  EXPECT_EQ(stray[2], "thumbnail of : no data, no type, no error");
   operation->finish();
   EXPECT_EQ(takeCalls(), Lines{"completed: no error"});
 }

@@ -3,14 +3,14 @@
 
 #include "support/NSString+PortfolioAdditions.h"
 #include "tests/thumbnails/ThumbnailFixture.h"
-#include "thumbnails/ContainerThumbnail.h"
+#include "thumbnails/ContainerThumbnails.h"
 #include "vellum/VLErrors.h"
 
 namespace skein {
 namespace {
 
-struct ContainerThumbnails : ThumbnailFixture {
-  ContainerThumbnails() {
+struct ContainerIcons : ThumbnailFixture {
+  ContainerIcons() {
     add("plain", NSData("icon"), false);
     add("app", NSData("icon"), true);
     add("bare", std::nullopt, true);
@@ -28,10 +28,11 @@ struct ContainerThumbnails : ThumbnailFixture {
     framework.documents.urls[id] = storeURL("/" + name);
     return id.asString();
   }
+  const ContainerThumbnails icons{env.log};
 };
 
-TEST_F(ContainerThumbnails, SizesAreCutToASquareOfAtMost120) {
-  const auto proper = [&](NSSize size) { return _properSizeForContainerThumbnail(size, env.log); };
+TEST_F(ContainerIcons, SizesAreCutToASquareOfAtMost120) {
+  const auto proper = [&](NSSize size) { return icons._properSizeForContainerThumbnail(size); };
   EXPECT_EQ(proper({200, 80}), (NSSize{80, 80}));
   EXPECT_EQ(env.run(), (Lines{"[DEBUG] width (200.00) is greater than max width (120.00)",
                               "[DEBUG] width (120.00) and height (80.00) should be equal for "
@@ -50,11 +51,11 @@ TEST_F(ContainerThumbnails, SizesAreCutToASquareOfAtMost120) {
   EXPECT_EQ(vl_stringWithSize({1, 2.345}), "{1.00, 2.35}");
 }
 
-TEST_F(ContainerThumbnails, AnIconAndWhetherItIsAnAppsOrWhyThereIsNone) {
+TEST_F(ContainerIcons, AnIconAndWhetherItIsAnAppsOrWhyThereIsNone) {
   const auto ask = [&](const std::string& containerID, bool handled = true) {
-    _fetchThumbnailForContainerID(
+    icons._fetchThumbnailForContainerID(
         containerID, "i7", {64, 64}, framework.containers.table,
-        handled ? perThumbnail() : NSFileProviderExtension::ThumbnailWithTypeHandler(), env.log);
+        handled ? perThumbnail() : NSFileProviderExtension::ThumbnailWithTypeHandler());
     return env.run();
   };
   EXPECT_EQ(ask("plain"),
@@ -69,9 +70,9 @@ TEST_F(ContainerThumbnails, AnIconAndWhetherItIsAnAppsOrWhyThereIsNone) {
   EXPECT_EQ(ask("bare"),
             (Lines{bare[0], bare[1], "thumbnail of i7: no data, no type, VLVellumErrorDomain 15"}));
   NSErrorPtr noImage;
-  _fetchThumbnailForContainerID(
+  icons._fetchThumbnailForContainerID(
       "bare", "i7", {64, 64}, framework.containers.table,
-      [&](auto&, auto&&, auto&&, const NSErrorPtr& error) { noImage = error; }, env.log);
+      [&](auto&, auto&&, auto&&, const NSErrorPtr& error) { noImage = error; });
   ASSERT_TRUE(noImage);
   EXPECT_EQ(noImage->localizedDescription(),
             vlc_errorInvalidParameter("size", "{64.00, 64.00}")->localizedDescription());
@@ -79,16 +80,16 @@ TEST_F(ContainerThumbnails, AnIconAndWhetherItIsAnAppsOrWhyThereIsNone) {
   EXPECT_EQ(ask("gone", false), Lines{"[ERROR] can't find container with ID gone"});
   // The error is the item's, not the container's.
   NSErrorPtr missing;
-  _fetchThumbnailForContainerID(
+  icons._fetchThumbnailForContainerID(
       "gone", "i7", {64, 64}, {},
-      [&](auto&, auto&&, auto&&, const NSErrorPtr& error) { missing = error; }, env.log);
+      [&](auto&, auto&&, auto&&, const NSErrorPtr& error) { missing = error; });
   ASSERT_EQ(brief(missing), "NSFileProviderErrorDomain -1005");
   EXPECT_EQ(std::get<std::string>(
                 missing->userInfo().at(NSFileProviderErrorNonExistentItemIdentifierKey)),
             "i7");
 }
 
-TEST_F(ContainerThumbnails, ABatchAsksForTheTableOnceAndForDocumentsAndDesktopToo) {
+TEST_F(ContainerIcons, ABatchAsksForTheTableOnceAndForDocumentsAndDesktopToo) {
   add(VLUbiquitousDocumentsContainerID, NSData("icon"), false);
   const std::string documents = folder(1, VLUbiquitousDocumentsContainerID);
   const std::string app = folder(2, "app");
@@ -104,7 +105,7 @@ TEST_F(ContainerThumbnails, ABatchAsksForTheTableOnceAndForDocumentsAndDesktopTo
                    "completed: no error"}));
 }
 
-TEST_F(ContainerThumbnails, ThreeArgumentsCarryTheTypeWhereAnErrorIsLookedFor) {
+TEST_F(ContainerIcons, ThreeArgumentsCarryTheTypeWhereAnErrorIsLookedFor) {
   const std::string app = folder(1, "app");
   const std::string bare = folder(2, "bare");
   const auto third = [](const std::variant<std::monostate, NSErrorPtr, std::string>& value) {

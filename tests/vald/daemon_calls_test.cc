@@ -201,7 +201,7 @@ TEST_F(DaemonCalls, AnAccountSurvivesAReopeningAndChangesAreTold) {
 TEST_F(DaemonCalls, LoggedOutEndsListingsAndLinksButNoLookups) {
   auto receiver = std::make_shared<Receiver>();
   const auto getSender = [&] {
-    return d.call<std::shared_ptr<VLItemNotificationSender>, NSErrorPtr>(
+    return d.call<std::shared_ptr<VLItemNotificationSender>, VLDaemon::Dictionary, NSErrorPtr>(
         [&](LocalDaemon& daemon, auto reply) {
           daemon.getItemUpdateSenderWithReceiver(receiver, std::move(reply));
         });
@@ -211,7 +211,7 @@ TEST_F(DaemonCalls, LoggedOutEndsListingsAndLinksButNoLookups) {
   dynamic_cast<LinkBreaking&>(*sender).setLinkBrokenHandler([&](NSErrorPtr e) { broken = e; });
   logOut();
   EXPECT_TRUE(isLoggedOut(broken));
-  EXPECT_TRUE(isLoggedOut(std::get<1>(getSender())));
+  EXPECT_TRUE(isLoggedOut(std::get<2>(getSender())));
   EXPECT_TRUE(isLoggedOut(std::get<2>(list(std::nullopt, 0, 0, 200))));
   EXPECT_TRUE(isLoggedOut(changes(std::nullopt).error));
   EXPECT_TRUE(isLoggedOut(

@@ -22,9 +22,10 @@ class Senders : public testing::Test {
   explicit Senders(SenderLimits limits = {}) : d(limits) {}
 
   SenderPtr make() {
-    auto [sender, error] = d.call<SenderPtr, NSErrorPtr>([this](LocalDaemon& daemon, auto reply) {
-      daemon.getItemUpdateSenderWithReceiver(receiver, std::move(reply));
-    });
+    auto [sender, dictionary, error] = d.call<SenderPtr, VLDaemon::Dictionary, NSErrorPtr>(
+        [this](LocalDaemon& daemon, auto reply) {
+          daemon.getItemUpdateSenderWithReceiver(receiver, std::move(reply));
+        });
     EXPECT_FALSE(error);
     return sender;
   }

@@ -1,4 +1,4 @@
-#include "thumbnails/ContainerThumbnail.h"
+#include "thumbnails/ContainerThumbnails.h"
 
 #include <algorithm>
 #include <utility>
@@ -15,18 +15,18 @@ constexpr double kMostSide = 120.0;
 
 }  // namespace
 
-NSSize _properSizeForContainerThumbnail(NSSize size, Log& log) {
+NSSize ContainerThumbnails::_properSizeForContainerThumbnail(NSSize size) const {
   auto [width, height] = size;
   if (width > kMostSide) {
-    VL_DEBUG(log, "[DEBUG] width (%.2f) is greater than max width (%.2f)", width, kMostSide);
+    VL_DEBUG(_log, "[DEBUG] width (%.2f) is greater than max width (%.2f)", width, kMostSide);
     width = kMostSide;
   }
   if (height > kMostSide) {
-    VL_DEBUG(log, "[DEBUG] height (%.2f) is greater than max height (%.2f)", height, kMostSide);
+    VL_DEBUG(_log, "[DEBUG] height (%.2f) is greater than max height (%.2f)", height, kMostSide);
     height = kMostSide;
   }
   if (width > height || height > width) {
-    VL_DEBUG(log,
+    VL_DEBUG(_log,
              "[DEBUG] width (%.2f) and height (%.2f) should be equal for container's thumbnail",
              width, height);
     width = height = std::min(width, height);
@@ -34,12 +34,11 @@ NSSize _properSizeForContainerThumbnail(NSSize size, Log& log) {
   return {width, height};
 }
 
-void _fetchThumbnailForContainerID(
+void ContainerThumbnails::_fetchThumbnailForContainerID(
     const std::string& containerID,
     const NSFileProviderItemIdentifier& representedByItemWithIdentifer, NSSize size,
     const VLContainersByID& knownContainers,
-    const NSFileProviderExtension::ThumbnailWithTypeHandler& perThumbnailCompletionHandler,
-    Log& log) {
+    const NSFileProviderExtension::ThumbnailWithTypeHandler& perThumbnailCompletionHandler) const {
   const auto answer = [&](std::optional<NSData> data, std::optional<std::string> type,
                           NSErrorPtr error) {
     if (!perThumbnailCompletionHandler) return;
@@ -49,7 +48,7 @@ void _fetchThumbnailForContainerID(
 
   const auto found = knownContainers.find(containerID);
   if (found == knownContainers.end() || !found->second) {
-    VL_ERROR(log, "[ERROR] can't find container with ID %@", containerID);
+    VL_ERROR(_log, "[ERROR] can't find container with ID %@", containerID);
     answer(std::nullopt, std::nullopt,
            fileProviderErrorForNonExistentItemWithIdentifier(representedByItemWithIdentifer));
     return;
@@ -58,7 +57,7 @@ void _fetchThumbnailForContainerID(
   std::optional<NSData> image = found->second->bestFittingImageDataForSize(size, isAppIcon);
   if (!image) {
     const std::string sizeText = vl_stringWithSize(size);
-    VL_ERROR(log, "[ERROR] can't find image with size %@ for %@", sizeText, containerID);
+    VL_ERROR(_log, "[ERROR] can't find image with size %@ for %@", sizeText, containerID);
     answer(std::nullopt, std::nullopt,
            vl_fileProviderError(vlc_errorInvalidParameter("size", sizeText)));
     return;

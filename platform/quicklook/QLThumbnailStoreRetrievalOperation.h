@@ -7,9 +7,9 @@ namespace skein {
 
 // Whether the system can draw a content type's thumbnail by itself. Optional at run time:
 // where the system has no such service, the answer is NO. Any thread.
-class QLThumbnails {
+class QLThumbnailStoreRetrievalOperation {
  public:
-  virtual ~QLThumbnails() = default;
+  virtual ~QLThumbnailStoreRetrievalOperation() = default;
   // canMostRecentClientsGenerateThumbnailsForUTI: NO for nil.
   virtual bool canMostRecentClientsGenerateThumbnailsForUTI(
       const std::optional<std::string>& typeIdentifier) = 0;
