@@ -460,7 +460,7 @@ void FolderStore::retainFolderWatch(VLFileObjectID folder) {
 }
 
 void FolderStore::releaseFolderWatch(VLFileObjectID folder) {
-  _writer->perform([this, folder] { _writer->retain(folder, false); });
+  _writer->post([this, folder] { _writer->retain(folder, false); });
 }
 
 void FolderStore::setContainers(std::vector<StoreRoot> containers) {

@@ -328,9 +328,7 @@ ItemUpdateSender::Handlers ItemUpdateSender::end(NSErrorPtr reason, bool linkBro
     if (_linkBrokenHandler) handlers.push_back(std::exchange(_linkBrokenHandler, nullptr));
     if (_retainsFolderWatch) retained = _folder;
   }
-  if (retained) {
-    _executor->post([&store = _store, folder = *retained] { store.releaseFolderWatch(folder); });
-  }
+  if (retained) _store.releaseFolderWatch(*retained);
   return handlers;
 }
 

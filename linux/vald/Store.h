@@ -105,6 +105,7 @@ class Store {
 
   // Prefers a watch on this folder when the budget does not cover all of them.
   virtual void retainFolderWatch(VLFileObjectID folder) = 0;
+  // Waits for nothing, and may be called from within a listener.
   virtual void releaseFolderWatch(VLFileObjectID folder) = 0;
 
   // Replaces the app containers' roots; items that come or go are journalled.
