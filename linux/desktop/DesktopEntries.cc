@@ -31,6 +31,8 @@ constexpr std::array<std::pair<const char*, const char*>, 4> kEntitlementKeys = 
     {"X-Skein-Ubiquity-Containers", VLUbiquityContainerIdentifiersEntitlement},
 }};
 constexpr std::size_t kLongestID = 128;
+// So that a name that is told apart by the container's identifier is one still.
+constexpr std::size_t kLongestName = 255 - kLongestID - 3;
 constexpr std::size_t kMostContainers = 1000;
 constexpr std::uintmax_t kLargestEntry = 1 << 20;
 constexpr int kDeepestFolder = 8;
@@ -90,10 +92,11 @@ std::map<std::string, fs::path> entriesInFolder(const std::string& folder) {
   return entries;
 }
 
-// A display name is a name in the drive's root.
+// A display name is a name in the drive's root: the identifier where the app's cannot be one.
 std::string asFileName(std::string name, const std::string& containerID) {
   std::replace(name.begin(), name.end(), '/', '-');
-  return name.empty() || name.front() == '.' ? containerID : name;
+  const bool isName = !name.empty() && name.front() != '.' && name.size() <= kLongestName;
+  return isName ? name : containerID;
 }
 
 }  // namespace
@@ -146,10 +149,10 @@ std::vector<AppContainer> appContainersInFolders(const std::vector<std::string>&
   std::vector<AppContainer> containers;
   std::set<std::string> seenNames;
   for (auto& [id, container] : byID) {
-    // Two apps of one name, or one app with two containers, are told apart.
-    if (!seenNames.insert(container.displayName).second) {
+    // Two apps of one name, or one app with two containers, are told apart, also where
+    // another app has the very name that this makes.
+    while (!seenNames.insert(container.displayName).second) {
       container.displayName += " (" + id + ")";
-      seenNames.insert(container.displayName);
     }
     containers.push_back(std::move(container));
   }

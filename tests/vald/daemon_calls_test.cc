@@ -229,6 +229,9 @@ TEST_F(DaemonCalls, ContainersComeFromTheDriveAndFromDesktopEntries) {
   writeEntry("c.desktop", "Name=Later\nX-Skein-Containers=org.b;com.tessel.Skein.default\n");
   writeEntry("d.desktop", "Name=Gone\nHidden=true\nX-Skein-Containers=org.d\n");
   writeEntry("e.desktop", "Name=No more\nX-Skein-Containers");
+  // Names that another one is given, and that no folder may have.
+  writeEntry("f.desktop", "Name=Notes (org.c)\nX-Skein-Containers=org.a;\n");
+  writeEntry("g.desktop", "Name=" + std::string(200, 'n') + "\nX-Skein-Containers=org.f;\n");
   std::filesystem::create_directory(d.drive.path + "/Documents");
   std::filesystem::create_directory_symlink("Documents", d.drive.path + "/Desktop");
   auto events = std::make_shared<Events>();
@@ -241,31 +244,33 @@ TEST_F(DaemonCalls, ContainersComeFromTheDriveAndFromDesktopEntries) {
   const auto found = containers();
   EXPECT_EQ(events->containerChanges, 1);
 
-  ASSERT_EQ(found.size(), 5u);
+  ASSERT_EQ(found.size(), 7u);
   EXPECT_EQ(found[0].documentsURL->path(), d.drive.path);
   EXPECT_EQ(found[1].documentsURL->path(), d.drive.path + "/Documents");
   EXPECT_FALSE(found[2].documentsURL);  // a link is no folder of the drive
-  EXPECT_EQ(found[3].containerID, "org.b");
-  EXPECT_EQ(found[3].displayName, "Notes");
-  EXPECT_EQ(found[3].icon, "notes");
-  EXPECT_EQ(found[3].documentsURL->path(), d.state.path + "/org.b/Documents");
+  EXPECT_EQ(found[3].displayName, "Notes (org.c)");
+  EXPECT_EQ(found[4].containerID, "org.b");
+  EXPECT_EQ(found[4].displayName, "Notes");
+  EXPECT_EQ(found[4].icon, "notes");
+  EXPECT_EQ(found[4].documentsURL->path(), d.state.path + "/org.b/Documents");
   EXPECT_TRUE(std::filesystem::is_directory(d.state.path + "/org.b/Documents"));
-  EXPECT_EQ(found[4].displayName, "Notes (org.c)");
-  ASSERT_EQ(d.store->containers.size(), 2u);
-  EXPECT_EQ(d.store->containers[1].containerID, "org.c");
+  EXPECT_EQ(found[5].displayName, "Notes (org.c) (org.c)");
+  EXPECT_EQ(found[6].displayName, "org.f");
+  ASSERT_EQ(d.store->containers.size(), 4u);
+  EXPECT_EQ(d.store->containers[2].containerID, "org.c");
 
   std::filesystem::create_directory(d.state.path + "/aside");
   std::filesystem::rename(d.drive.path + "/Documents", d.state.path + "/aside/Documents");
   d.daemon->refreshDriveFolders();
   d.executor->runAll();
   EXPECT_FALSE(containers()[1].documentsURL);
-  EXPECT_EQ(containers().size(), 5u);
+  EXPECT_EQ(containers().size(), 7u);
   EXPECT_EQ(events->containerChanges, 2);
 
   std::filesystem::remove(d.applications.path + "/b.desktop");
   d.daemon->refreshContainers();
   d.executor->runAll();
-  EXPECT_EQ(containers()[3].displayName, "Later");
+  EXPECT_EQ(containers()[4].displayName, "Later");
   EXPECT_EQ(events->containerChanges, 3);
   EXPECT_TRUE(std::filesystem::is_directory(d.state.path + "/org.c/Documents"));
 }

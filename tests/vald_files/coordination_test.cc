@@ -1,10 +1,11 @@
-// Who waits for whom, and tags in attributes.
+// Who waits for whom, and what files have in attributes.
 #include <sys/file.h>
 #include <sys/xattr.h>
 
 #include <future>
 #include <thread>
 
+#include "linux/vald/files/DocumentHint.h"
 #include "linux/vald/files/FileCoordinator.h"
 #include "tests/protocol/Waiting.h"
 #include "tests/vald_files/FilesFixture.h"
@@ -140,6 +141,22 @@ TEST(Tags, AreWhatFileManagersWriteAndStayWithTheDocument) {
   std::filesystem::create_symlink("folder", drive.at("link"));
   EXPECT_EQ(files.setTags(drive.at("link"), {"t"}).storage, TagStorage::Unsupported);
   EXPECT_EQ(codeOf(files.tags(drive.at("none")).error), 4);
+}
+
+TEST(Hints, AreReadOnlyAsTheyAreWritten) {
+  const std::string text = DocumentHint{0x75bcd15, 12, 4294967295U}.asText();
+  EXPECT_EQ(text, "1 00000000075bcd15 12 4294967295");
+  ASSERT_TRUE(DocumentHint::parse(text));
+  EXPECT_EQ(DocumentHint::parse(text)->asText(), text);
+  for (const char* other :
+       {"", "1", "2 00000000075bcd15 12 0", "1 75bcd15 12 0", "1 00000000075BCD15 12 0",
+        "1 0x0000000075bcd1 12 0", "1 00000000075bcd15  12 0", "1 00000000075bcd15 +12 0",
+        "1 00000000075bcd15 -1 0", "1 00000000075bcd15 99999999999999999999 0",
+        "1 00000000075bcd15 12 4294967296", "1 00000000075bcd15 12 0 ",
+        "1 0000000000000000 12 0"}) {
+    EXPECT_FALSE(DocumentHint::parse(other)) << other;
+  }
+  EXPECT_FALSE(DocumentHint::parse(text + '\0'));
 }
 
 }  // namespace

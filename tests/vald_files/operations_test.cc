@@ -256,6 +256,7 @@ TEST(Trash, BelievesNoInfoThatLeadsOut) {
   EXPECT_EQ(origin("../outside/b"), "");
   EXPECT_EQ(origin("/etc/passwd"), "");
   EXPECT_EQ(origin("b%00c"), "");
+  EXPECT_EQ(origin(std::string("b\0c", 3)), "");
   EXPECT_EQ(origin("b%2"), "");
   EXPECT_EQ(parseTrashInfo("Path=a\n"), std::nullopt);
 }

@@ -14,12 +14,11 @@ std::string DocumentHint::asText() const {
 
 std::optional<DocumentHint> DocumentHint::parse(const std::string& text) {
   DocumentHint hint;
-  int length = 0;
-  if (std::sscanf(text.c_str(), "1 %16" SCNx64 " %" SCNu64 " %" SCNu32 "%n", &hint.document,
-                  &hint.inode, &hint.generation, &length) != 3 ||
-      static_cast<std::size_t>(length) != text.size() || hint.document == 0) {
-    return std::nullopt;
-  }
+  // This reads much else too (signs, blanks, numbers cut to fit): what it made of the text must
+  // be written just so.
+  const int count = std::sscanf(text.c_str(), "1 %16" SCNx64 " %" SCNu64 " %" SCNu32,
+                                &hint.document, &hint.inode, &hint.generation);
+  if (count != 3 || hint.document == 0 || hint.asText() != text) return std::nullopt;
   return hint;
 }
 

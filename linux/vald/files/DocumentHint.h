@@ -18,6 +18,7 @@ struct DocumentHint {
   std::uint32_t generation = 0;  // 0: the file system tells none
 
   std::string asText() const;
+  // Nil for what asText() does not write, and for document 0.
   static std::optional<DocumentHint> parse(const std::string& text);
 };
 

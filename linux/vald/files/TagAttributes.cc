@@ -5,6 +5,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <string_view>
+#include <unordered_set>
 
 #include "linux/vald/files/FileErrors.h"
 
@@ -63,23 +64,22 @@ NSErrorPtr refusalOfTags(const std::vector<std::string>& names) {
 
 std::string joinTags(const std::vector<std::string>& names) {
   std::string value;
-  std::vector<std::string> seen;
+  std::unordered_set<std::string_view> seen;
   for (const std::string& name : names) {
-    if (name.empty() || std::find(seen.begin(), seen.end(), name) != seen.end()) continue;
-    seen.push_back(name);
-    value += (value.empty() ? "" : ",") + name;
+    if (name.empty() || !seen.insert(name).second) continue;
+    if (!value.empty()) value += ',';
+    value += name;
   }
   return value;
 }
 
 std::vector<std::string> splitTags(const std::string& value) {
   std::vector<std::string> names;
+  std::unordered_set<std::string_view> seen;
   for (std::size_t at = 0; at <= value.size();) {
     const std::size_t end = std::min(value.find(',', at), value.size());
-    std::string name = value.substr(at, end - at);
-    if (!name.empty() && std::find(names.begin(), names.end(), name) == names.end()) {
-      names.push_back(std::move(name));
-    }
+    const std::string_view name = std::string_view(value).substr(at, end - at);
+    if (!name.empty() && seen.insert(name).second) names.emplace_back(name);
     at = end + 1;
   }
   return names;

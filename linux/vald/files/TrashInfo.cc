@@ -45,6 +45,7 @@ std::string percentEncoded(const std::string& path) {
 std::optional<std::string> percentDecoded(const std::string& text) {
   std::string path;
   for (std::size_t at = 0; at < text.size(); ++at) {
+    if (text[at] == '\0') return std::nullopt;
     if (text[at] != '%') {
       path += text[at];
       continue;

@@ -16,7 +16,7 @@ struct TrashInfo {
 
 // Every byte but letters, digits and "-._~/" as "%XX".
 std::string percentEncoded(const std::string& path);
-// nil when a "%" is not followed by two hexadecimal digits, or a NUL comes out.
+// nil when a "%" is not followed by two hexadecimal digits, or a NUL would come out.
 std::optional<std::string> percentDecoded(const std::string& text);
 
 std::string localDeletionDate(std::time_t now);
