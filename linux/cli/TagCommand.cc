@@ -1,5 +1,6 @@
 // skein tag
-#include <algorithm>
+#include <string_view>
+#include <unordered_set>
 
 #include "linux/cli/Commands.h"
 #include "linux/cli/ExitCodes.h"
@@ -44,11 +45,9 @@ std::vector<std::string> tagsAfter(std::vector<std::string> tags, const TagOptio
   if (options.clear || !options.set.empty()) tags = options.set;
   tags.insert(tags.end(), options.add.begin(), options.add.end());
   std::vector<std::string> result;
-  const auto has = [](const std::vector<std::string>& names, const std::string& name) {
-    return std::find(names.begin(), names.end(), name) != names.end();
-  };
+  std::unordered_set<std::string_view> told(options.remove.begin(), options.remove.end());
   for (const std::string& tag : tags) {
-    if (!has(options.remove, tag) && !has(result, tag)) result.push_back(tag);
+    if (told.insert(tag).second) result.push_back(tag);
   }
   return result;
 }

@@ -7,9 +7,11 @@
 
 #include <cerrno>
 #include <cstring>
+#include <iterator>
 #include <map>
 #include <utility>
 
+#include "linux/protocol/AnswerRoom.h"
 #include "linux/protocol/FileDescriptor.h"
 #include "platform/fileprovider/NSFileProviderError.h"
 #include "vellum/VLQueryItem.h"
@@ -135,7 +137,9 @@ class StoreCheck::Work final : public std::enable_shared_from_this<Work> {
 
   void go() SKEIN_REQUIRES(_queue) {
     if (_busy || _waiting.empty()) return;
-    if (!std::exchange(_askedDaemon, true)) {
+    if (!_found.empty()) {
+      answer({}, nullptr);
+    } else if (!std::exchange(_askedDaemon, true)) {
       askDaemon();
     } else if (_folders.empty()) {
       HostCheckStep step;
@@ -150,8 +154,17 @@ class StoreCheck::Work final : public std::enable_shared_from_this<Work> {
     }
   }
 
+  // What was found and does not fit is told to the next who asks.
   void answer(HostCheckStep step, NSErrorPtr error) SKEIN_REQUIRES(_queue) {
     _busy = false;
+    std::move(step.differences.begin(), step.differences.end(), std::back_inserter(_found));
+    step.differences.clear();
+    AnswerRoom room;
+    while (!_found.empty() &&
+           room.take(_found.front().path.size() + _found.front().detail.size())) {
+      step.differences.push_back(std::move(_found.front()));
+      _found.pop_front();
+    }
     step.folders = _folderCount;
     step.items = _itemCount;
     auto reply = std::move(_waiting.front());
@@ -322,6 +335,7 @@ class StoreCheck::Work final : public std::enable_shared_from_this<Work> {
   bool _busy SKEIN_GUARDED_BY(_queue) = false;
   bool _stopped SKEIN_GUARDED_BY(_queue) = false;
   std::vector<Folder> _folders SKEIN_GUARDED_BY(_queue);
+  std::deque<HostDifference> _found SKEIN_GUARDED_BY(_queue);  // and not told of yet
   std::deque<StepReply> _waiting SKEIN_GUARDED_BY(_queue);
   std::uint64_t _folderCount SKEIN_GUARDED_BY(_queue) = 0;
   std::uint64_t _itemCount SKEIN_GUARDED_BY(_queue) = 0;

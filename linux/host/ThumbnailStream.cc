@@ -2,7 +2,6 @@
 
 #include <malloc.h>
 
-#include <algorithm>
 #include <utility>
 
 #include "vellum/VLFileObjectID.h"
@@ -53,18 +52,23 @@ void ThumbnailStream::fail(std::uint32_t index, NSErrorPtr error) {
 void ThumbnailStream::thumbnailDidCome(const NSFileProviderItemIdentifier& identifier,
                                        std::optional<NSData> data, std::optional<std::string> type,
                                        NSErrorPtr error) {
-  if (data) waitForRoom(data->length());
+  const std::size_t reserved = data ? data->length() : 0;
+  if (!waitForRoom(identifier, reserved)) return;
   HostThumbnail thumbnail{0, kindOf(identifier, data.has_value(), error != nullptr),
                           std::move(data), std::move(type), std::move(error)};
   {
     MutexLock lock(_mutex);
-    // An item that was named twice is told of twice, of one picture.
+    // An item that was named twice is told of twice, of one picture. Only what will be taken
+    // counts: another thread may have told of the item meanwhile.
+    _bytes -= reserved;
     const auto [first, last] = _expected.equal_range(identifier);
     for (auto one = first; one != last; ++one) {
       thumbnail.index = one->second;
       _ready.push_back(thumbnail);
+      _bytes += reserved;
     }
     _expected.erase(first, last);
+    tellOfRoom();
   }
   handOutSoon();
 }
@@ -149,16 +153,22 @@ void ThumbnailStream::takeStep(HostThumbnailStep& step) {
   step.done = _done;
   step.total = _targets;
   step.finished = _hasEnded && _ready.empty();
-  _bytes -= std::min(bytes, _bytes);
+  _bytes -= bytes;
+  tellOfRoom();
+}
+
+void ThumbnailStream::tellOfRoom() {
   if (_bytes <= kMostBytes / 2) _roomCame.notifyAll();
 }
 
-void ThumbnailStream::waitForRoom(std::size_t bytes) {
+bool ThumbnailStream::waitForRoom(const NSFileProviderItemIdentifier& identifier,
+                                  std::size_t bytes) {
   {
     MutexLock lock(_mutex);
+    if (!_expected.contains(identifier)) return false;
     if (!_isWanted || _bytes == 0 || _bytes + bytes <= kMostBytes) {
       _bytes += bytes;
-      return;
+      return true;
     }
   }
   // Until there is room for many, or every picture that is taken would wake one that comes.
@@ -166,6 +176,7 @@ void ThumbnailStream::waitForRoom(std::size_t bytes) {
   MutexLock lock(_mutex);
   while (_isWanted && _bytes > kMostBytes / 2) _roomCame.wait(_mutex);
   _bytes += bytes;
+  return true;
 }
 
 }  // namespace skein

@@ -52,7 +52,10 @@ class ThumbnailStream final : public std::enable_shared_from_this<ThumbnailStrea
   // On the queue: steps go out in their order, and under no lock.
   void handOut() SKEIN_EXCLUDES(_mutex);
   void takeStep(HostThumbnailStep& step) SKEIN_REQUIRES(_mutex);
-  void waitForRoom(std::size_t bytes) SKEIN_EXCLUDES(_mutex);
+  // False when the item was told of. Otherwise it has reserved room for `bytes`.
+  bool waitForRoom(const NSFileProviderItemIdentifier& identifier, std::size_t bytes)
+      SKEIN_EXCLUDES(_mutex);
+  void tellOfRoom() SKEIN_REQUIRES(_mutex);
 
   const std::shared_ptr<Executor> _executor;
   const std::size_t _targets;
@@ -63,7 +66,7 @@ class ThumbnailStream final : public std::enable_shared_from_this<ThumbnailStrea
   // The targets that were not told of yet, by their item.
   Targets _expected SKEIN_GUARDED_BY(_mutex);
   std::deque<HostThumbnail> _ready SKEIN_GUARDED_BY(_mutex);
-  std::size_t _bytes SKEIN_GUARDED_BY(_mutex) = 0;  // of pictures that were not taken
+  std::size_t _bytes SKEIN_GUARDED_BY(_mutex) = 0;  // of pictures not taken, and reserved
   std::deque<Reply<HostThumbnailStep, NSErrorPtr>> _waiting SKEIN_GUARDED_BY(_mutex);
   bool _willHandOut SKEIN_GUARDED_BY(_mutex) = false;
   std::uint64_t _done SKEIN_GUARDED_BY(_mutex) = 0;  // handed out

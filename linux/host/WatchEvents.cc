@@ -4,6 +4,8 @@
 #include <string_view>
 #include <utility>
 
+#include "linux/protocol/AnswerRoom.h"
+
 namespace skein {
 namespace {
 
@@ -15,6 +17,11 @@ void mix(std::uint64_t& digest, std::uint64_t value) {
 
 void mix(std::uint64_t& digest, std::string_view text) {
   mix(digest, std::hash<std::string_view>()(text));
+}
+
+std::size_t bytesOf(const HostChange& change) {
+  return change.filename.size() + change.previousFilename.value_or("").size() +
+         skein::bytesOf(change.item);
 }
 
 template <class T>
@@ -53,17 +60,16 @@ KnownItem KnownItem::of(const NSFileProviderItem& item) {
 }
 
 void WatchEvents::add(HostChange change) {
-  const auto [place, isNew] = _places.try_emplace(change.identifier, _changes.size());
+  const auto [place, isNew] = _places.try_emplace(change.identifier, _changes.end());
   if (isNew) {
-    _changes.emplace_back(std::move(change));
+    place->second = _changes.insert(_changes.end(), std::move(change));
     return;
   }
-  std::optional<HostChange>& slot = _changes[place->second];
-  HostChange& earlier = *slot;
+  HostChange& earlier = *place->second;
   using Kind = HostChange::Kind;
   if (change.kind == Kind::Deleted) {
     if (earlier.kind == Kind::Created) {
-      slot.reset();
+      _changes.erase(place->second);
       _places.erase(place);
       return;
     }
@@ -90,20 +96,11 @@ void WatchEvents::add(HostChange change) {
 
 std::vector<HostChange> WatchEvents::take(std::size_t limit) {
   std::vector<HostChange> taken;
-  while (_taken < _changes.size() && taken.size() < limit) {
-    std::optional<HostChange>& slot = _changes[_taken++];
-    if (!slot) continue;
-    _places.erase(slot->identifier);
-    taken.push_back(std::move(*slot));
-    slot.reset();
-  }
-  if (_taken == _changes.size()) {
-    _changes.clear();
-    _taken = 0;
-  } else if (_taken > _changes.size() / 2) {
-    _changes.erase(_changes.begin(), _changes.begin() + static_cast<std::ptrdiff_t>(_taken));
-    for (auto& [identifier, place] : _places) place -= _taken;
-    _taken = 0;
+  AnswerRoom room;
+  while (!_changes.empty() && taken.size() < limit && room.take(bytesOf(_changes.front()))) {
+    _places.erase(_changes.front().identifier);
+    taken.push_back(std::move(_changes.front()));
+    _changes.pop_front();
   }
   return taken;
 }

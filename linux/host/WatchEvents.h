@@ -2,7 +2,7 @@
 
 #include <cstddef>
 #include <cstdint>
-#include <optional>
+#include <list>
 #include <string>
 #include <unordered_map>
 #include <vector>
@@ -29,14 +29,13 @@ using KnownItems = std::unordered_map<NSFileProviderItemIdentifier, KnownItem>;
 class WatchEvents {
  public:
   void add(HostChange change);
-  // The oldest `limit` changes.
+  // The oldest changes, `limit` of them or as many as one answer holds.
   std::vector<HostChange> take(std::size_t limit);
-  bool empty() const { return _places.empty(); }
+  bool empty() const { return _changes.empty(); }
 
  private:
-  std::vector<std::optional<HostChange>> _changes;  // those before _taken are gone
-  std::size_t _taken = 0;
-  std::unordered_map<NSFileProviderItemIdentifier, std::size_t> _places;
+  std::list<HostChange> _changes;  // the oldest first
+  std::unordered_map<NSFileProviderItemIdentifier, std::list<HostChange>::iterator> _places;
 };
 
 }  // namespace skein

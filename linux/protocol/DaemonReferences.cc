@@ -12,6 +12,13 @@ namespace {
 
 constexpr int kMostProgressUnderWay = 16;
 
+// Sends a push and runs `then` after it, also when it failed: what comes next is no less due.
+template <class Request, class Then>
+void send(DaemonService& service, Request request, Then then) {
+  auto sent = request.send().ignoreResult();
+  service.tasks->add(sent.then(then, [then](kj::Exception&&) mutable { then(); }));
+}
+
 }  // namespace
 
 NSURLPtr urlFromClient(capnp::Data::Reader data) {
@@ -55,8 +62,7 @@ void ReceiverReference::receiveProgressUpdates(const VLQueryItems& updates, Repl
     ++self->_progressUnderWay;
     auto request = self->_client->receiveProgressUpdatesRequest();
     codec::encode(request.initItems(static_cast<unsigned>(updates.size())), updates);
-    self->_service->tasks->add(
-        request.send().ignoreResult().then([self] { --self->_progressUnderWay; }));
+    send(*self->_service, kj::mv(request), [self] { --self->_progressUnderWay; });
   });
 }
 
@@ -87,10 +93,10 @@ void EventsReference::sendAccount() {
   auto request = _client->accountDidChangeRequest();
   if (const auto& account = *_nextAccount) codec::encode(request.initAccount(), *account);
   _nextAccount.reset();
-  _service->tasks->add(request.send().ignoreResult().then([self = shared_from_this()] {
+  send(*_service, kj::mv(request), [self = shared_from_this()] {
     self->_accountUnderWay = false;
     self->sendAccount();
-  }));
+  });
 }
 
 void EventsReference::containerListDidChange() {
@@ -103,11 +109,10 @@ void EventsReference::containerListDidChange() {
 void EventsReference::sendContainers() {
   if (!std::exchange(_nextContainers, false)) return;
   _containersUnderWay = true;
-  auto sent = _client->containerListDidChangeRequest().send().ignoreResult();
-  _service->tasks->add(sent.then([self = shared_from_this()] {
+  send(*_service, _client->containerListDidChangeRequest(), [self = shared_from_this()] {
     self->_containersUnderWay = false;
     self->sendContainers();
-  }));
+  });
 }
 
 // --- Senders.

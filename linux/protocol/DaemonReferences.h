@@ -20,7 +20,8 @@ class ReceiverReference final : public VLItemNotificationReceiving,
   // On the loop's thread.
   ReceiverReference(DaemonServicePtr service, wire::Receiver::Client client);
 
-  // The reply is destroyed uncalled when the client is gone.
+  // The reply is destroyed uncalled when the push could not be made: the client is gone, or
+  // what it was to receive cannot be sent.
   void receiveUpdates(const VLQueryItems& items, const std::vector<std::string>& logicalExtensions,
                       const std::vector<std::string>& physicalExtensions, Reply<> reply) override;
   // Never answered; dropped while too many are on their way.

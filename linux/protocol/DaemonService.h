@@ -52,7 +52,8 @@ struct DaemonService final : private kj::TaskSet::ErrorHandler {
   kj::Own<kj::TaskSet> newTasks() {
     return kj::heap<kj::TaskSet>(static_cast<kj::TaskSet::ErrorHandler&>(*this));
   }
-  void taskFailed(kj::Exception&&) override {}  // a push to a client that is gone
+  // A push that failed. Whoever made it knows, by its reply that goes uncalled.
+  void taskFailed(kj::Exception&&) override {}
 };
 using DaemonServicePtr = std::shared_ptr<DaemonService>;
 

@@ -7,9 +7,11 @@
 namespace skein {
 namespace {
 
-capnp::ReaderOptions readerOptions(const RpcLimits& limits) {
+// What the library holds outgoing messages against. Those that come in have a limit of their
+// own, where they are read.
+capnp::ReaderOptions optionsForSending(const RpcLimits& limits) {
   capnp::ReaderOptions options;
-  options.traversalLimitInWords = limits.messageWords;
+  options.traversalLimitInWords = limits.sentWords;
   return options;
 }
 
@@ -65,6 +67,7 @@ void BoundedMessageStream::count(capnp::MessageReader& message) {
 kj::Promise<kj::Maybe<capnp::MessageReaderAndFds>> BoundedMessageStream::tryReadMessage(
     kj::ArrayPtr<kj::AutoCloseFd> fdSpace, capnp::ReaderOptions options,
     kj::ArrayPtr<capnp::word> scratchSpace) {
+  options.traversalLimitInWords = _limits.readWords;
   return whenPeerReads()
       .then([this, fdSpace, options, scratchSpace] {
         return _inner.tryReadMessage(fdSpace, options, scratchSpace);
@@ -107,7 +110,7 @@ kj::Promise<void> BoundedMessageStream::writeMessages(
 RpcConnection::RpcConnection(RpcIo& io, FileDescriptor socket, const RpcLimits& limits,
                              capnp::Capability::Client bootstrap)
     : _stream(wrap(io, std::move(socket)), limits),
-      _network(_stream, capnp::rpc::twoparty::Side::SERVER, readerOptions(limits)),
+      _network(_stream, capnp::rpc::twoparty::Side::SERVER, optionsForSending(limits)),
       _system(capnp::makeRpcServer(_network, kj::mv(bootstrap))) {
   _stream.watchQueueOf(_network);
   _system.setFlowLimit(limits.unansweredWords);
@@ -115,7 +118,7 @@ RpcConnection::RpcConnection(RpcIo& io, FileDescriptor socket, const RpcLimits& 
 
 RpcConnection::RpcConnection(RpcIo& io, FileDescriptor socket, const RpcLimits& limits)
     : _stream(wrap(io, std::move(socket)), limits),
-      _network(_stream, capnp::rpc::twoparty::Side::CLIENT, readerOptions(limits)),
+      _network(_stream, capnp::rpc::twoparty::Side::CLIENT, optionsForSending(limits)),
       _system(capnp::makeRpcClient(_network)) {
   _stream.watchQueueOf(_network);
   _system.setFlowLimit(limits.unansweredWords);

@@ -24,8 +24,10 @@ struct RpcIo {
 
 // How much one peer may make this process hold.
 struct RpcLimits {
-  // The longest message that is read, in words of 8 bytes.
-  std::uint64_t messageWords;
+  // The longest message that is read, in words of 8 bytes; a longer one closes the connection.
+  std::uint64_t readWords;
+  // The longest that is sent: no more than the other side reads. A longer one fails alone.
+  std::uint64_t sentWords;
   // Calls that are not answered yet, in words; beyond it the peer is not read from.
   std::size_t unansweredWords;
   // Calls that the peer has not declared finished; beyond it the connection is closed.
@@ -33,10 +35,15 @@ struct RpcLimits {
   // Answers that the peer does not read, in bytes; beyond it the peer is not read from.
   std::size_t unreadBytes;
 
+  static constexpr std::uint64_t kRequestWords = std::uint64_t{64} * 1024;
+  static constexpr std::uint64_t kAnswerWords = std::uint64_t{8} * 1024 * 1024;
+
   // For a server, whose peers may be anybody who runs as the same user.
-  static RpcLimits ofServer() { return {64 * 1024, 16 * 1024, 4096, 4 << 20}; }
+  static RpcLimits ofServer() { return {kRequestWords, kAnswerWords, 16 * 1024, 4096, 4 << 20}; }
   // For a client, who reads whatever its server sends (or both would wait for each other).
-  static RpcLimits ofClient() { return {8 * 1024 * 1024, 1024 * 1024, 65536, SIZE_MAX}; }
+  static RpcLimits ofClient() {
+    return {kAnswerWords, kRequestWords, 1024 * 1024, 65536, SIZE_MAX};
+  }
 };
 
 // The message stream of one peer, within limits. Ends the stream at the first message

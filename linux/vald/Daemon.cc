@@ -7,6 +7,7 @@
 #include <string>
 #include <utility>
 
+#include "linux/protocol/AnswerRoom.h"
 #include "linux/vald/ChangeToken.h"
 #include "linux/vald/DrivePath.h"
 #include "linux/vald/Replies.h"
@@ -177,8 +178,11 @@ void Daemon::URLsForFileObjectIDs(std::vector<VLFileObjectID> fileObjectIDs,
     NSErrorPtr error;
     std::vector<NSURLPtr> urls;
     urls.reserve(ids.size());
+    // Who misses one asks for it alone.
+    AnswerRoom room(kAnswerBytes);
     for (const auto& path : self._parts.store.pathsForIDs(ids, &error)) {
-      urls.push_back(path ? NSURL::fileURLWithPath(*path) : nullptr);
+      const bool isTold = path && room.take(path->size());
+      urls.push_back(isTold ? NSURL::fileURLWithPath(*path) : nullptr);
     }
     answered(std::move(urls), error);
   });

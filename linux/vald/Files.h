@@ -12,6 +12,7 @@
 #include "linux/vald/DocumentPlaces.h"
 #include "linux/vald/FolderStore.h"
 #include "linux/vald/Replies.h"
+#include "linux/vald/TrashListings.h"
 #include "linux/vald/cloud/Downloader.h"
 #include "linux/vald/cloud/Eviction.h"
 #include "linux/vald/files/FileOperations.h"
@@ -124,6 +125,9 @@ class Files final : public LocalFiles {
                      Reply<NSErrorPtr> reply);
   void startDownload(const std::string& path, const std::shared_ptr<NSProgress>& progress,
                      Reply<NSErrorPtr> reply);
+  // Everything in the trash, what was thrown away last first.
+  TrashListings::Items trashInOrder(NSErrorOut error);
+  TrashedItem trashedItem(VLQueryItemPtr item, const std::string& path) const;
   std::optional<NSDate> dateOfTrashing(const std::string& path) const;
   std::vector<FileHistoryEntry> historyOf(const std::string& path, const std::string& identifier,
                                           std::size_t limit, NSErrorOut error);
@@ -132,6 +136,7 @@ class Files final : public LocalFiles {
 
   const FilesParts _parts;
   Eviction _eviction;
+  TrashListings _trashListings;
 };
 
 }  // namespace skein::vald

@@ -4,6 +4,7 @@
 #include <ctime>
 #include <utility>
 
+#include "linux/protocol/AnswerRoom.h"
 #include "linux/vald/Files.h"
 #include "linux/vald/files/FileErrors.h"
 #include "linux/vald/files/FileNames.h"
@@ -16,6 +17,11 @@ constexpr std::uint64_t kMostTrashed = 1000;
 constexpr std::uint64_t kMostHistory = 1000;
 constexpr auto kSameRemoval = std::chrono::minutes(1);
 constexpr char kByAnother[] = "another program";
+
+std::size_t bytesOf(const FileHistoryEntry& entry) {
+  return entry.origin.size() + entry.identifier.size() + entry.path.size() +
+         entry.destination.size();
+}
 
 std::optional<std::int64_t> nanoseconds(const std::optional<NSDate>& date) {
   if (!date) return std::nullopt;
@@ -101,34 +107,58 @@ std::optional<NSDate> Files::dateOfTrashing(const std::string& path) const {
   return NSDate(std::chrono::seconds(seconds));
 }
 
+TrashListings::Items Files::trashInOrder(NSErrorOut error) {
+  std::vector<FolderStore::Trashed> found = _parts.store.trashedItems(error);
+  // The time of change is the moment of the renaming, unless something was done since:
+  // close enough for an order that costs no look at a file.
+  std::sort(found.begin(), found.end(), [](const auto& a, const auto& b) {
+    return a.changed != b.changed ? a.changed > b.changed : a.id.rawID() < b.id.rawID();
+  });
+  auto items = std::make_shared<std::vector<VLFileObjectID>>();
+  items->reserve(found.size());
+  for (const FolderStore::Trashed& one : found) items->push_back(one.id);
+  return items;
+}
+
+TrashedItem Files::trashedItem(VLQueryItemPtr item, const std::string& path) const {
+  TrashedItem trashed{std::move(item), NSURL::fileURLWithPath(path), nullptr, std::nullopt};
+  const DocumentPlace place = findDocument(_parts.operations.roots(), path);
+  const FileResult origin = _parts.operations.putBackPath(place.physical);
+  if (!origin.error) {
+    trashed.putBackURL = NSURL::fileURLWithPath(
+        place.isEvicted() ? documentPath(nullptr, origin.path) : origin.path);
+  }
+  trashed.trashed = dateOfTrashing(place.physical);
+  return trashed;
+}
+
 void Files::trashedItems(std::uint64_t offset, std::uint64_t limit,
                          Reply<std::vector<TrashedItem>, std::uint64_t, NSErrorPtr> reply) {
   postAnswer(*_parts.executor, std::move(reply), [=, this](auto& answered) {
-    NSErrorPtr error;
-    std::vector<FolderStore::Trashed> found = _parts.store.trashedItems(&error);
-    if (error) return answerError(answered, error);
-    // The time of change is the moment of the renaming, unless something was done since:
-    // close enough for an order that costs no look at a file.
-    std::sort(found.begin(), found.end(), [](const auto& a, const auto& b) {
-      return a.changed != b.changed ? a.changed > b.changed : a.path < b.path;
-    });
-    const std::size_t begin = std::min<std::size_t>(offset, found.size());
-    const std::size_t end =
-        std::min<std::size_t>(found.size() - begin, std::min(limit, kMostTrashed)) + begin;
-    std::vector<TrashedItem> page;
-    for (std::size_t at = begin; at < end; ++at) {
-      const FolderStore::Trashed& one = found[at];
-      TrashedItem trashed{one.item, NSURL::fileURLWithPath(one.path), nullptr, std::nullopt};
-      const DocumentPlace place = findDocument(_parts.operations.roots(), one.path);
-      const FileResult origin = _parts.operations.putBackPath(place.physical);
-      if (!origin.error) {
-        trashed.putBackURL = NSURL::fileURLWithPath(
-            place.isEvicted() ? documentPath(nullptr, origin.path) : origin.path);
-      }
-      trashed.trashed = dateOfTrashing(place.physical);
-      page.push_back(std::move(trashed));
+    auto place = TrashListings::Place::of(offset);
+    TrashListings::Items items = _trashListings.find(place);
+    if (!items) {
+      NSErrorPtr error;
+      items = trashInOrder(&error);
+      if (error) return answerError(answered, error);
+      _trashListings.begin(items, place);
     }
-    answered(std::move(page), end < found.size() ? end : 0, nullptr);
+    std::vector<TrashedItem> page;
+    AnswerRoom room;
+    for (; place.position < items->size() && page.size() < std::min(limit, kMostTrashed);
+         ++place.position) {
+      const VLFileObjectID id = (*items)[place.position];
+      const VLQueryItemPtr item = _parts.store.itemWithID(id, nullptr);
+      const auto path = _parts.store.pathForID(id, nullptr);
+      // What was put back or removed meanwhile is in the trash no more.
+      if (!item || !path || !item->isTrashed()) continue;
+      // The path that it had is about as long.
+      if (!room.take(bytesOf(item) + 2 * path->size())) break;
+      page.push_back(trashedItem(item, *path));
+    }
+    const bool hasEnded = place.position >= items->size();
+    if (hasEnded) _trashListings.end(place);
+    answered(std::move(page), hasEnded ? 0 : place.offset(), nullptr);
   });
 }
 
@@ -196,7 +226,10 @@ void Files::history(std::string path, std::string identifier, std::uint64_t limi
     std::vector<FileHistoryEntry> entries = historyOf(path, identifier, most, &error);
     if (error) return answerError(answered, error);
     if (!path.empty()) addRemovalsByOthers(path, most, entries);
-    if (entries.size() > most) entries.resize(most);
+    AnswerRoom room(kAnswerBytes);
+    std::size_t count = 0;
+    while (count < std::min(entries.size(), most) && room.take(bytesOf(entries[count]))) ++count;
+    entries.resize(count);
     answered(std::move(entries), nullptr);
   });
 }

@@ -10,6 +10,7 @@
 #include <unordered_map>
 
 #include "base/Numbers.h"
+#include "linux/protocol/AnswerRoom.h"
 #include "linux/vald/RandomToken.h"
 #include "linux/vald/files/FileNames.h"
 #include "linux/vald/index/IndexFile.h"
@@ -173,8 +174,13 @@ Page FolderStore::list(const FolderRow& folder, SortOrder order, std::uint64_t o
   std::vector<FoundItem> items = reader->page(folder.number, order, place, offset, most + 1);
   if (storeFailure(reader, error)) return {};
   Page page;
-  if (items.size() > most) {
-    items.pop_back();
+  AnswerRoom room;
+  std::size_t count = 0;
+  while (count < std::min<std::size_t>(items.size(), most) && room.take(items[count].bytes())) {
+    ++count;
+  }
+  if (items.size() > count) {
+    items.erase(items.begin() + static_cast<std::ptrdiff_t>(count), items.end());
     if (!items.empty()) {
       page.nextOffset = offset + items.size();
       const ItemRow& last = items.back().row;
@@ -425,9 +431,11 @@ ChangePage FolderStore::changesSince(std::uint64_t rank, std::uint64_t limit, NS
   auto item = items.begin();
   auto tombstone = dead.begin();
   page.newestRank = rank;
+  AnswerRoom room;
   while (page.changes.size() < limit && (item != items.end() || tombstone != dead.end())) {
     StoreChange change;
     if (tombstone == dead.end() || (item != items.end() && item->row.rank < tombstone->rank)) {
+      if (!room.take(item->bytes())) break;
       change.rank = item->row.rank;
       change.item = item->item();
       change.folder = item->holder.id;

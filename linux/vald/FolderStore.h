@@ -57,10 +57,9 @@ class FolderStore final : public Store {
   ItemDetails details(VLFileObjectID id);
   // Every tag with the number of its items, by name.
   std::vector<std::pair<std::string, std::uint64_t>> tagsInUse();
-  // What lies in the roots' trashes, unordered, with absolute paths.
+  // What lies in the roots' trashes, unordered.
   struct Trashed {
-    VLQueryItemPtr item;
-    std::string path;
+    VLFileObjectID id = VLFileObjectID::documentWithRawID(0);
     std::int64_t changed = 0;  // the file's time of change, in nanoseconds since 1970
   };
   std::vector<Trashed> trashedItems(NSErrorOut error);

@@ -1,6 +1,7 @@
 // The store held against the disk.
 #include <cstring>
 
+#include "linux/protocol/AnswerRoom.h"
 #include "linux/vald/FolderStore.h"
 
 namespace skein::vald {
@@ -10,8 +11,16 @@ std::vector<IndexDifference> FolderStore::check(std::uint64_t limit) {
   // What is under way is no difference.
   settle(std::chrono::seconds(30));
   std::vector<IndexDifference> differences;
+  AnswerRoom room(kAnswerBytes);
+  bool isFull = false;
   const auto add = [&](Kind kind, const std::string& path, const std::string& detail) {
-    if (differences.size() < limit) differences.push_back({kind, path, detail});
+    if (isFull) return;
+    isFull = differences.size() >= limit || !room.take(path.size() + detail.size());
+    if (!isFull) {
+      differences.push_back({kind, path, detail});
+    } else if (!differences.empty()) {
+      differences.back().detail += "; there are more differences than are told here";
+    }
   };
   auto reader = _readers.lease();
   if (!reader) return differences;
@@ -26,7 +35,7 @@ std::vector<IndexDifference> FolderStore::check(std::uint64_t limit) {
     for (const FolderRow& trash : reader->trashes()) {
       if (trash.parent == rootRow.folder) folders.emplace_back(trash.number, trash.name);
     }
-    while (!folders.empty() && differences.size() < limit) {
+    while (!folders.empty() && !isFull) {
       const auto [key, relative] = std::move(folders.back());
       folders.pop_back();
       const auto folder = reader->folder(key);

@@ -73,11 +73,8 @@ std::vector<FolderStore::Trashed> FolderStore::trashedItems(NSErrorOut error) {
   auto reader = _readers.lease();
   if (storeFailure(reader, error)) return trashed;
   for (const FolderRow& trash : reader->trashes()) {
-    const auto path = pathOfFolder(*reader.get(), trash.number);
-    if (!path) continue;
-    for (const FoundItem& found :
-         reader->page(trash.number, SortOrder::Name, std::nullopt, 0, trash.children + 1)) {
-      trashed.push_back({found.item(), *path + '/' + found.row.name, found.row.state.changed});
+    for (const ItemRow& row : reader->children(trash.number)) {
+      trashed.push_back({row.id, row.state.changed});
     }
   }
   if (storeFailure(reader, error)) trashed.clear();

@@ -22,6 +22,11 @@ NSErrorPtr changesLost() {
                      "again.");
 }
 
+NSErrorPtr pushLost() {
+  return vellumError(VLVellumErrorChangesLost,
+                     "Changes could not be told to whoever watches; list the folder again.");
+}
+
 NSErrorPtr watchFailed(const NSURLPtr& url, const NSErrorPtr& reason) {
   return NSError::errorWithDomain(
       VLVellumErrorDomain, VLVellumErrorChangesLost,
@@ -51,6 +56,24 @@ class ItemUpdateSender::Proxy final : public VLItemNotificationSending {
 
  private:
   const std::shared_ptr<ItemUpdateSender> _sender;
+};
+
+// Hears what became of one push: it was answered, or it is destroyed without that.
+class ItemUpdateSender::PushReply {
+ public:
+  explicit PushReply(std::weak_ptr<ItemUpdateSender> sender) : _sender(std::move(sender)) {}
+  PushReply(PushReply&&) = default;
+  PushReply& operator=(PushReply&&) = delete;
+  ~PushReply() {
+    if (const auto sender = _sender.lock()) sender->breakLink(pushLost());
+  }
+
+  void operator()() {
+    if (const auto sender = std::exchange(_sender, {}).lock()) sender->pushWasAnswered();
+  }
+
+ private:
+  std::weak_ptr<ItemUpdateSender> _sender;
 };
 
 ItemUpdateSender::ItemUpdateSender(std::shared_ptr<VLItemNotificationReceiving> receiver,
@@ -281,9 +304,7 @@ void ItemUpdateSender::push() {
     _pushUnderWay = true;
     receiver = _receiver;
   }
-  receiver->receiveUpdates(items, {}, {}, [weak = weak_from_this()] {
-    if (const auto self = weak.lock()) self->pushWasAnswered();
-  });
+  receiver->receiveUpdates(items, {}, {}, PushReply(weak_from_this()));
 }
 
 void ItemUpdateSender::pushWasAnswered() {

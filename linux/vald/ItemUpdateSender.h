@@ -27,7 +27,8 @@ struct SenderLimits {
 // vald's end of one watch: pushes the watched folder's items to one receiver as they
 // change, one push at a time. While a push is unanswered the changes gather, the latest
 // state of each item; when too many wait, the link breaks. The memory that a receiver who
-// stopped can cost is thereby bounded.
+// stopped can cost is thereby bounded. A push whose reply goes uncalled was lost, and breaks
+// the link as well: the receiver would never hear of these changes otherwise.
 //
 // Any thread. Pushes, replies and handlers come from the executor, under no lock. It ends
 // with invalidate(), a broken link, or its last reference: then it lets go of the receiver
@@ -74,6 +75,7 @@ class ItemUpdateSender final : public VLItemNotificationSender,
  private:
   enum class State : std::uint8_t { Idle, Gathering, Watching, Ended };
   class Proxy;
+  class PushReply;
   using Handlers = std::vector<std::function<void(NSErrorPtr)>>;
 
   void gather(const NSURLPtr& url, Reply<NSErrorPtr> gatherReply) SKEIN_EXCLUDES(_mutex);

@@ -1,7 +1,8 @@
 #include "linux/vald/PendingItems.h"
 
-#include <algorithm>
 #include <utility>
+
+#include "linux/protocol/AnswerRoom.h"
 
 namespace skein::vald {
 
@@ -15,10 +16,9 @@ void PendingItems::add(VLQueryItemPtr item) {
 }
 
 VLQueryItems PendingItems::take(std::size_t limit) {
-  const std::size_t count = std::min(limit, _items.size() - _taken);
   VLQueryItems batch;
-  batch.reserve(count);
-  for (std::size_t i = 0; i < count; ++i) {
+  AnswerRoom room;
+  while (batch.size() < limit && _taken < _items.size() && room.take(bytesOf(_items[_taken]))) {
     VLQueryItemPtr item = std::move(_items[_taken++]);
     _placeByID.erase(item->fileObjectID());
     batch.push_back(std::move(item));

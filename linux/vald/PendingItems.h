@@ -15,7 +15,7 @@ class PendingItems {
   // A later state of an item replaces the earlier one in its place.
   void add(VLQueryItemPtr item);
 
-  // Takes the oldest `limit` items out.
+  // Takes the oldest items out, `limit` of them or as many as one message holds.
   VLQueryItems take(std::size_t limit);
 
   // How many items wait.

@@ -96,6 +96,42 @@ TEST(ThumbnailsOfThreads, WhoBringsMoreThanFitsWaitsUntilItIsTakenOrNotWanted) {
   EXPECT_EQ(brought, 5U);
 }
 
+// The extension calls once for each time that a folder is named, and the first call tells of
+// all of them: nobody takes the pictures of the others, so they must not fill the room.
+TEST(ThumbnailsOfThreads, APictureThatWasToldOfTakesNoRoom) {
+  const auto pool = std::make_shared<ThreadPool>(1, "thumbnails");
+  const auto stream = std::make_shared<ThumbnailStream>(HostTools{pool, nullptr}, 6);
+  const std::string folder = "i0000000000000007";
+  stream->expect({{folder, 0}, {folder, 1}, {folder, 2}, {idOf(1), 3}, {idOf(2), 4}, {idOf(3), 5}});
+  const NSData large(std::string(3 << 20, 'p'));
+  std::thread bringer([&] {
+    for (int call = 0; call < 3; ++call) {
+      stream->thumbnailDidCome(folder, large, std::nullopt, nullptr);
+    }
+    for (std::uint64_t number = 1; number <= 3; ++number) {
+      stream->thumbnailDidCome(idOf(number), large, std::nullopt, nullptr);
+    }
+    stream->batchDidEnd(nullptr);
+  });
+  std::size_t taken = 0;
+  for (bool isOver = false; !isOver;) {
+    const auto came = std::make_shared<std::promise<HostThumbnailStep>>();
+    stream->next(
+        [came](HostThumbnailStep step, const NSErrorPtr&) { came->set_value(std::move(step)); });
+    auto next = came->get_future();
+    if (next.wait_until(testDeadline()) != std::future_status::ready) {
+      ADD_FAILURE() << "nothing came after " << taken;
+      break;
+    }
+    const HostThumbnailStep step = next.get();
+    taken += step.thumbnails.size();
+    isOver = step.finished;
+  }
+  stream->letGo();
+  bringer.join();
+  EXPECT_EQ(taken, 6U);
+}
+
 TEST_F(Thumbnails, LettingGoCancelsTheBatchAlsoBeforeItHasBegun) {
   const auto progress = NSProgress::progressWithTotalUnitCount(0);
   int cancellations = 0;

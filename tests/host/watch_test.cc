@@ -317,5 +317,24 @@ TEST(WatchEvents, AreTheSumSinceTheLastTime) {
   EXPECT_TRUE(events.empty());
 }
 
+TEST(WatchEvents, AreTakenInPiecesThatCanBeSent) {
+  VLQueryItem::Properties properties;
+  properties.tagData = NSData(std::string(60'000, 't'));
+  WatchEvents events;
+  for (std::uint64_t id = 1; id <= 200; ++id) {
+    HostChange one = change(HostChange::Kind::Created, id, "name");
+    one.item = std::make_shared<const VLQueryItem>(properties);
+    events.add(std::move(one));
+  }
+  std::size_t taken = 0;
+  while (!events.empty()) {
+    const std::size_t count = events.take(200).size();
+    ASSERT_GT(count, 0U);
+    EXPECT_LT(count, 100U);
+    taken += count;
+  }
+  EXPECT_EQ(taken, 200U);
+}
+
 }  // namespace
 }  // namespace skein

@@ -14,10 +14,10 @@ namespace {
 constexpr char kPicture[] = "\x89PNG\r\n\x1a\n and the rest";
 
 // An app with a container of its own, and an icon in a file.
-void installApp(const Drive& drive) {
+void installApp(const Drive& drive, const std::string& picture = kPicture) {
   const std::filesystem::path data = std::filesystem::path(drive.store()).parent_path() / "data";
   std::filesystem::create_directories(data / "applications");
-  std::ofstream(data / "app.png") << kPicture;
+  std::ofstream(data / "app.png") << picture;
   std::ofstream(data / "applications/org.example.App.desktop")
       << "[Desktop Entry]\nType=Application\nName=App\nIcon=" << (data / "app.png").native()
       << "\nX-Skein-Containers=org.example.App\nX-Skein-Undecorated=true\n";
@@ -55,6 +55,20 @@ TEST(Thumb, TellsOfEachItemAndWritesWhatThereIs) {
 
   // Off a terminal that shows pictures there is nowhere to put them.
   EXPECT_EQ(drive.run({"thumb", "/App"}).code, 2);
+}
+
+// More than one message holds, and more than waits to be taken.
+TEST(Thumb, LargePicturesComeHoweverOftenTheyAreNamed) {
+  constexpr std::size_t kSize = 3'000'000;
+  Drive drive;
+  installApp(drive, kPicture + std::string(kSize - (sizeof kPicture - 1), 'p'));
+  Arguments arguments{"thumb", "--json"};
+  arguments.insert(arguments.end(), 12, "/App");
+  const Result result = drive.run(arguments);
+  EXPECT_EQ(result.code, 0) << result.errors;
+  const auto lines = result.lines();
+  ASSERT_EQ(lines.size(), 12U);
+  for (const std::string& line : lines) EXPECT_EQ(nlohmann::json::parse(line)["bytes"], kSize);
 }
 
 }  // namespace

@@ -80,6 +80,30 @@ TEST_F(Links, PushesArriveInOrderAndTheirRepliesGoBack) {
   EXPECT_EQ(receiver->progress.take(), 2U);
 }
 
+// What vald pushes may be too large for a message. vald hears that it did not arrive, and the
+// link is as good as before.
+TEST_F(Links, APushThatCannotBeSentFailsAlone) {
+  link();
+  VLQueryItem::Properties large = document(1)->properties();
+  large.tagData = NSData(std::string(20 << 20, 't'));
+  const VLQueryItems items(4, std::make_shared<const VLQueryItem>(large));
+  auto kept = std::make_shared<int>(0);
+  std::weak_ptr<int> reply = kept;
+  served->receiver->receiveUpdates(items, {}, {}, [this, kept = std::move(kept)] { acks.add(1); });
+  EXPECT_TRUE(becomesTrue([&] { return reply.expired(); })) << "the reply goes uncalled";
+  EXPECT_EQ(acks.count(), 0U);
+
+  served->receiver->receiveProgressUpdates(items, [] {});
+  for (int more = 0; more < 20; ++more) {
+    served->receiver->receiveProgressUpdates({document(1)}, [] {});
+    EXPECT_EQ(receiver->progress.take(), 1U);
+  }
+  push(2);
+  const auto push = receiver->pushes.take();
+  ASSERT_TRUE(push);
+  EXPECT_EQ(push->items.front()->fileObjectID(), document(2)->fileObjectID());
+}
+
 TEST_F(Links, MessagesOfTheSenderReachVald) {
   link();
   Outcome<> boosted;

@@ -266,5 +266,33 @@ TEST_F(RoundTrip, StatusChecksFaultsAndStop) {
   EXPECT_EQ(daemon->asked.take(), "stop");
 }
 
+// Answers may be long; what a client asks may not, and a question that is too long fails
+// without costing the connection.
+TEST_F(RoundTrip, LongAnswersArriveAndLongQuestionsFailAlone) {
+  VLQueryItem::Properties large = nothingSet();
+  large.tagData = NSData(std::string(300'000, 't'));
+  daemon->items.assign(100, item(large));
+  const auto [items, next, error] =
+      ask<NSFileProviderItems, std::uint64_t, NSErrorPtr>(*client, [](auto& proxy, auto reply) {
+        proxy.enumerateItemsInFolder(std::nullopt, 0, 0, 1000, std::move(reply));
+      });
+  ASSERT_EQ(items.size(), 100U);
+  EXPECT_EQ(items.back()->tagData(), large.tagData);
+
+  daemon->holds = true;
+  Outcome<NSFileProviderItems, std::uint64_t, NSErrorPtr> held;
+  client->remoteObjectProxyWithErrorHandler(held.errorHandler())
+      ->enumerateItemsInFolder(std::nullopt, 0, 0, 1, held.reply());
+  auto answer = daemon->held.take();
+  ASSERT_TRUE(answer);
+  Outcome<NSErrorPtr> refused;
+  client->remoteObjectProxyWithErrorHandler(refused.errorHandler())
+      ->files()
+      .setTagNames(NSURL::fileURLWithPath("/s/a"), {std::string(600'000, 't')}, refused.reply());
+  EXPECT_TRUE(refused.errors->waitForCount(1));
+  (*answer)({}, 0, nullptr);
+  held.value();
+}
+
 }  // namespace
 }  // namespace skein

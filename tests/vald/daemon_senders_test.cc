@@ -275,6 +275,29 @@ TEST_F(BoundedSenders, BreakTheLinkOfAReceiverThatStopped) {
   }
 }
 
+// Without that, the receiver would wait for ever for what it was not told.
+TEST_F(BoundedSenders, BreakTheLinkWhenAPushIsLost) {
+  const SenderPtr sender = make();
+  listen(sender);
+  watch(sender, folder);
+  store.addFile("1", folder);
+  d.executor->runAll();
+  receiver->reply();
+  d.executor->runAll();
+  EXPECT_TRUE(broken.empty());
+  store.addFile("2", folder);
+  d.executor->runAll();
+  ASSERT_EQ(receiver->pushes.size(), 2U);
+  receiver->replies.clear();
+  d.executor->runAll();
+  ASSERT_EQ(broken.size(), 1U);
+  EXPECT_EQ(broken[0]->domain(), VLVellumErrorDomain);
+  EXPECT_EQ(broken[0]->code(), VLVellumErrorChangesLost);
+  store.addFile("3", folder);
+  d.executor->runAll();
+  EXPECT_EQ(receiver->pushes.size(), 2U);
+}
+
 TEST_F(BoundedSenders, BreakWhatTheStoresOverflowConcerns) {
   const auto deep = store.addFolder("deep", folder);
   const auto broke = [&](VLFileObjectID watched, std::uint64_t options,

@@ -390,7 +390,22 @@ TEST_F(DriveTest, WhatIsTrashedKeepsItsIdentifierWhoeverTrashesIt) {
   EXPECT_EQ(items[0].url->path(), at(trash + "/files/folder"));
   EXPECT_EQ(items[0].putBackURL->path(), at("folder"));
   EXPECT_TRUE(items[0].trashed);
-  EXPECT_EQ(next, 1U);
+  // The next page is of the same moment, whatever is trashed or goes meanwhile.
+  write("later.txt");
+  settle();
+  EXPECT_EQ(trashed("later.txt"), trash + "/files/later.txt");
+  const auto page = [this](std::uint64_t from, std::uint64_t limit) {
+    return ask<std::vector<TrashedItem>, std::uint64_t, NSErrorPtr>(
+        [=](LocalFiles& f, auto reply) { f.trashedItems(from, limit, std::move(reply)); });
+  };
+  const auto [others, end, none] = page(next, 10);
+  ASSERT_EQ(others.size(), 1U);
+  EXPECT_EQ(others[0].url->path(), at(trash + "/files/doc.txt"));
+  EXPECT_EQ(end, 0U);
+  EXPECT_EQ(std::get<0>(page(0, 10)).size(), 3U);
+  const std::uint64_t again = std::get<1>(page(0, 1));
+  EXPECT_EQ(removed(trash + "/files/later.txt"), "");
+  EXPECT_EQ(std::get<0>(page(again, 10)).size(), 2U);
 
   // Put back by either.
   EXPECT_EQ(moved(trash + "/files/folder", ""), "folder");

@@ -92,6 +92,60 @@ TEST_F(StoreListing, PagesByNameAndByDateAreWholeAtAnyPageSize) {
   EXPECT_EQ(item("f")->childItemCount(), 57U);
 }
 
+// However much there is of each item, a page is no longer than can be sent.
+TEST_F(StoreListing, PagesEndEarlyWhereItemsAreLong) {
+  constexpr std::size_t kItems = 150;
+  const std::string tag(60'000, 't');
+  std::vector<std::string> expected;
+  for (std::size_t number = 0; number < kItems; ++number) {
+    expected.push_back("file" + std::to_string(1000 + number));
+    write(expected.back());
+  }
+  open();
+  for (const std::string& name : expected) {
+    ASSERT_EQ(store->changeDetails(item(name)->fileObjectID(),
+                                   [&](ItemDetails& details) { details.tags = tag; }),
+              nullptr);
+  }
+  const auto isShort = [](const std::vector<VLQueryItemPtr>& items) {
+    return items.size() * 60'000 < (6 << 20);
+  };
+  const Page first = store->listFolder(std::nullopt, SortOrder::Name, 0, 1000, nullptr);
+  EXPECT_TRUE(isShort(first.items)) << first.items.size();
+  EXPECT_EQ(first.items.front()->tagData()->length(), tag.size() + 4);
+  EXPECT_EQ(names(std::nullopt, SortOrder::Name, 1000), expected);
+  auto byDate = names(std::nullopt, SortOrder::Date, 1000);
+  std::sort(byDate.begin(), byDate.end());
+  EXPECT_EQ(byDate, expected);
+
+  // The journal's pages too, also where deletions are among the changes.
+  const std::uint64_t before = store->currentRank();
+  for (std::size_t number = 0; number < kItems; ++number) {
+    if (number % 3 == 0) {
+      remove(expected[number]);
+    } else {
+      store->tellAnew(item(expected[number])->fileObjectID(), false);
+    }
+  }
+  settle();
+  std::size_t changes = 0;
+  for (std::uint64_t rank = before;;) {
+    NSErrorPtr error;
+    const ChangePage page = store->changesSince(rank, 1000, &error);
+    ASSERT_EQ(error, nullptr);
+    ASSERT_FALSE(page.expired);
+    if (page.changes.empty()) break;
+    std::vector<VLQueryItemPtr> items;
+    for (const StoreChange& change : page.changes) {
+      if (!change.item->isDead()) items.push_back(change.item);
+    }
+    EXPECT_TRUE(isShort(items)) << items.size();
+    changes += page.changes.size();
+    rank = page.newestRank;
+  }
+  EXPECT_EQ(changes, kItems);
+}
+
 TEST_F(StoreListing, AListingUnderWaySkipsNothingWhenItemsBeforeItGo) {
   for (const char* name : {"a", "b", "c", "d", "e"}) write(name);
   open();

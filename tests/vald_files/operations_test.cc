@@ -284,6 +284,12 @@ TEST(Provenance, TellsWhoseRequestRemovedAPathAndIsBounded) {
   ASSERT_EQ(history.size(), 1u);
   EXPECT_EQ(history[0].state, OperationState::Undone);
 
+  // A path that no file system has, and that somebody may ask about all the same.
+  std::string deep = drive.at("renamed");
+  for (int depth = 0; depth < 40'000; ++depth) deep += "/d";
+  EXPECT_EQ(files.journal().historyOfPath(deep, 10, nullptr).size(), 2u);
+  EXPECT_EQ(files.journal().historyOfPath(deep, 1, nullptr)[0].origin, "two");
+
   NSErrorPtr error;
   auto journal = OperationJournal::open(drive.state + "/small.db", 100, drive.files, &error);
   ASSERT_TRUE(journal) << wordsOf(error);

@@ -2,7 +2,9 @@
 
 #include <sqlite3.h>
 
+#include <algorithm>
 #include <cerrno>
+#include <iterator>
 #include <utility>
 
 #include "linux/vald/files/FileErrors.h"
@@ -228,21 +230,25 @@ void OperationJournal::finish(End end) {
 void OperationJournal::end(std::int64_t id, OperationState state) { finish({id, state}); }
 void OperationJournal::discard(std::int64_t id) { finish({id, std::nullopt}); }
 
-std::vector<OperationEntry> OperationJournal::select(const std::string& condition,
-                                                     const std::vector<std::string>& values,
-                                                     NSErrorOut error) {
-  MutexLock lock(_mutex);
+void OperationJournal::writeEnds() {
   for (auto end = _unwritten.begin(); end != _unwritten.end();) {
     end = write(*end) == SQLITE_OK ? _unwritten.erase(end) : std::next(end);
   }
+}
+
+std::vector<OperationEntry> OperationJournal::select(const std::string& condition,
+                                                     const std::vector<std::string_view>& values,
+                                                     NSErrorOut error) {
+  MutexLock lock(_mutex);
+  writeEnds();
   const std::string sql = std::string("SELECT ") + kColumns + " FROM operation WHERE " + condition;
   sqlite3_stmt* statement = nullptr;
   int code = sqlite3_prepare_v2(_database, sql.c_str(), -1, &statement, nullptr);
   std::vector<OperationEntry> entries;
-  if (code == SQLITE_OK) {
-    for (std::size_t at = 0; at < values.size(); ++at) {
-      bindPath(statement, static_cast<int>(at) + 1, values[at]);
-    }
+  for (auto value = values.begin(); code == SQLITE_OK && value != values.end(); ++value) {
+    // Not copied: a path of many folders is asked for with each of them.
+    sqlite3_bind_blob(statement, 1, value->empty() ? "" : value->data(),
+                      static_cast<int>(value->size()), SQLITE_STATIC);
     while ((code = sqlite3_step(statement)) == SQLITE_ROW) {
       OperationEntry entry;
       entry.id = sqlite3_column_int64(statement, 0);
@@ -256,29 +262,41 @@ std::vector<OperationEntry> OperationJournal::select(const std::string& conditio
       entry.aside = column(statement, 8);
       entries.push_back(std::move(entry));
     }
+    if (code == SQLITE_DONE) code = sqlite3_reset(statement);
   }
-  if (code != SQLITE_DONE) error.store(failure("can't read", code));
+  if (code != SQLITE_OK) error.store(failure("can't read", code));
   sqlite3_finalize(statement);
   return entries;
 }
 
 std::vector<OperationEntry> OperationJournal::openEntries(NSErrorOut error) {
-  return select("state = 0 ORDER BY id", {}, error);
+  return select("state = 0 ORDER BY id", {std::string_view()}, error);
 }
 
 std::vector<OperationEntry> OperationJournal::historyOfPath(const std::string& path,
                                                             std::size_t limit, NSErrorOut error) {
-  std::vector<std::string> paths;
-  for (std::string at = path; !at.empty(); at = parentOfPath(at)) paths.push_back(at);
-  std::string places;
-  for (std::size_t at = 1; at <= paths.size(); ++at) {
-    places += (at > 1 ? ", ?" : "?") + std::to_string(at);
+  const std::string newest = " ORDER BY id DESC LIMIT " + std::to_string(limit);
+  std::vector<OperationEntry> entries =
+      select("(path = ?1 OR destination = ?1) AND (kind <> 2 OR destination = ?1)" + newest, {path},
+             error);
+  std::vector<std::string_view> folders;
+  const std::string_view whole = path;
+  for (std::size_t end = path.rfind('/'); end != 0 && end != std::string::npos;
+       end = path.rfind('/', end - 1)) {
+    folders.push_back(whole.substr(0, end));
   }
   // That a folder was made says nothing about what is in it.
-  return select("(path IN (" + places + ") OR destination IN (" + places +
-                    ")) AND (kind <> 2 OR destination = ?1) ORDER BY id DESC LIMIT " +
-                    std::to_string(limit),
-                paths, error);
+  std::vector<OperationEntry> ofFolders =
+      select("(path = ?1 OR destination = ?1) AND kind <> 2" + newest, folders, error);
+  std::move(ofFolders.begin(), ofFolders.end(), std::back_inserter(entries));
+  std::sort(entries.begin(), entries.end(),
+            [](const auto& a, const auto& b) { return a.id > b.id; });
+  // One that moved something from one of the folders to another was found twice.
+  entries.erase(std::unique(entries.begin(), entries.end(),
+                            [](const auto& a, const auto& b) { return a.id == b.id; }),
+                entries.end());
+  if (entries.size() > limit) entries.resize(limit);
+  return entries;
 }
 
 std::vector<OperationEntry> OperationJournal::historyOfDocument(const std::string& document,

@@ -5,6 +5,7 @@
 #include <optional>
 #include <set>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "base/Mutex.h"
@@ -95,8 +96,11 @@ class OperationJournal {
   int write(const End& end) SKEIN_REQUIRES(_mutex);
   int insert(OperationEntry& entry) SKEIN_REQUIRES(_mutex);
   NSErrorPtr failure(const char* doing, int code) SKEIN_REQUIRES(_mutex);
+  // What was not written yet, so that it is read as well.
+  void writeEnds() SKEIN_REQUIRES(_mutex);
+  // What `condition` selects for each of `values`, one after the other, as its parameter.
   std::vector<OperationEntry> select(const std::string& condition,
-                                     const std::vector<std::string>& values, NSErrorOut error);
+                                     const std::vector<std::string_view>& values, NSErrorOut error);
 
   FileLayer& _files;
   const std::uint64_t _retention;

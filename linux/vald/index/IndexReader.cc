@@ -1,6 +1,7 @@
 #include "linux/vald/index/IndexReader.h"
 
 #include "base/Numbers.h"
+#include "linux/protocol/AnswerRoom.h"
 #include "linux/vald/scan/StoreNames.h"
 
 namespace skein::vald {
@@ -89,7 +90,11 @@ FoundItem IndexReader::found(SqliteStatement& statement) {
 
 std::vector<FoundItem> IndexReader::all(SqliteStatement& statement) {
   std::vector<FoundItem> items;
-  while (statement.step()) items.push_back(found(statement));
+  AnswerRoom room;
+  bool isRoom = true;
+  while (isRoom && statement.step())
+    isRoom = room.take(items.emplace_back(found(statement)).bytes());
+  if (!isRoom) statement.reset();
   for (FoundItem& item : items) item.holder.isTrashed = isTrashed(item.row.parent);
   return items;
 }

@@ -22,6 +22,8 @@ struct FoundItem {
   ItemDetails details;
 
   VLQueryItemPtr item() const { return makeItem(row, holder, children, details); }
+  // About as many bytes of text as item() has.
+  std::size_t bytes() const { return row.name.size() + 2 * details.tags.size(); }
 };
 
 // The read side of the index: one connection, for one thread at a time. Failures are
@@ -60,11 +62,12 @@ class IndexReader {
   std::vector<ItemRow> children(FolderKey folder);
 
   // A page of a folder's children, or (folder 0) of all folders: after `place`, or from
-  // `offset` on.
+  // `offset` on. It ends early, with the first that is too much for an AnswerRoom.
   std::vector<FoundItem> page(FolderKey folder, SortOrder order,
                               const std::optional<ListingPlace>& place, std::uint64_t offset,
                               std::uint64_t limit);
 
+  // Ends early as page() does.
   std::vector<FoundItem> itemsAfter(std::uint64_t rank, std::uint64_t limit);
   std::vector<Tombstone> tombstonesAfter(std::uint64_t rank, std::uint64_t limit);
   // What was removed under a name, newest first.
