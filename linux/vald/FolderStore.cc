@@ -161,17 +161,11 @@ Page FolderStore::list(const FolderRow& folder, SortOrder order, std::uint64_t o
                        std::uint64_t limit, NSErrorOut error) {
   auto reader = _readers.lease();
   if (storeFailure(reader, error)) return {};
-  // Counted in the same moment as the page is read. All folders: any change may count.
-  std::uint64_t changes = 0;
-  if (folder.number == kNoFolder) {
-    changes = reader->number("SELECT max(rank) FROM item");
-  } else if (const auto current = reader->folder(folder.number)) {
-    changes = current->changes;
-  }
   std::optional<ListingPlace> place;
-  if (offset > 0) place = _places.find(folder.number, order, offset, changes);
+  if (offset > 0) place = _places.find(folder.number, order, offset);
   const std::uint64_t most = std::min<std::uint64_t>(limit, 100'000);
-  std::vector<FoundItem> items = reader->page(folder.number, order, place, offset, most + 1);
+  std::vector<FoundItem> items =
+      reader->page(folder.number, order, place, ListingPlaces::index(offset), most + 1);
   if (storeFailure(reader, error)) return {};
   Page page;
   AnswerRoom room;
@@ -182,11 +176,11 @@ Page FolderStore::list(const FolderRow& folder, SortOrder order, std::uint64_t o
   if (items.size() > count) {
     items.erase(items.begin() + static_cast<std::ptrdiff_t>(count), items.end());
     if (!items.empty()) {
-      page.nextOffset = offset + items.size();
       const ItemRow& last = items.back().row;
-      _places.remember(folder.number, order, page.nextOffset, changes,
-                       {order == SortOrder::Date ? difference(0, last.state.modified) : 0,
-                        last.name, last.id.rawID()});
+      page.nextOffset =
+          _places.remember(folder.number, order, offset, items.size(),
+                           {order == SortOrder::Date ? difference(0, last.state.modified) : 0,
+                            last.name, last.id.rawID()});
     }
   }
   page.items.reserve(items.size());

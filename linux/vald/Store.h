@@ -36,7 +36,9 @@ struct StoreOptions {
 
 struct Page {
   std::vector<VLQueryItemPtr> items;
-  std::uint64_t nextOffset = 0;  // 0 at the end
+  // Where this listing goes on, and no other; 0 at the end. The index of the next item, and
+  // more when the folder changed during a listing.
+  std::uint64_t nextOffset = 0;
 };
 
 // One change as it was journalled. A dead item's properties hold its identifiers alone.

@@ -299,7 +299,7 @@ void StoreWriter::afterDecisions() {
   enqueue(_reconciler.takeNewFolders());
 }
 
-void StoreWriter::accept(FolderKey key, const FolderSnapshot& snapshot, bool inRound) {
+void StoreWriter::accept(FolderKey key, const FolderSnapshot& snapshot, bool inRound, bool isOld) {
   Folder* folder = _folders.find(key);
   if (folder == nullptr) return;
   switch (snapshot.look) {
@@ -325,7 +325,13 @@ void StoreWriter::accept(FolderKey key, const FolderSnapshot& snapshot, bool inR
     if (isFirst) loadFolder(key, snapshot);
     return;
   }
-  _reconciler.addFolder(key, snapshot);
+  if (!_reconciler.addFolder(key, snapshot, isOld)) {
+    // It is on its way elsewhere; its parent tells where it went.
+    _later.folders[key].whole = true;
+    if (folder->row.parent != kNoFolder) {
+      _later.folders[folder->row.parent].names.insert(folder->row.name);
+    }
+  }
   _reconciler.decide(inRound);
   afterDecisions();
   if (inRound) enqueueSubfolders(key);
@@ -374,8 +380,7 @@ void StoreWriter::loadFolder(FolderKey key, const FolderSnapshot& snapshot) {
       parent->isCountUntold = true;
     }
   }
-  Folder* folder = _folders.find(key);
-  ++folder->row.changes;
+  const Folder* folder = _folders.find(key);
   _folders.touch(key);
   if (key != kDriveFolder) {
     const FolderKey parent = folder->row.parent != kNoFolder ? folder->row.parent : kDriveFolder;
@@ -418,7 +423,7 @@ Look StoreWriter::lookAtFolder(FolderKey key, int& error) {
   error = snapshot.error;
   begin();
   if (Folder* folder = _folders.find(key)) folder->round = _round;
-  accept(key, snapshot, false);
+  accept(key, snapshot, false, false);
   if (_inRound && !_isBulk) enqueueSubfolders(key);
   commit();
   return snapshot.look;

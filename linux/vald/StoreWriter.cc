@@ -177,7 +177,7 @@ void StoreWriter::takeScans() {
     begin();
     ++_scanned;
     if (result.snapshot.look == Look::Seen) noteWatch(result.folder, result.isWatched);
-    accept(result.folder, result.snapshot, _inRound);
+    accept(result.folder, result.snapshot, _inRound, true);
     if (_database->failed()) break;
   }
   const bool isDone = _scanner.pending() == 0;

@@ -114,8 +114,8 @@ class StoreWriter {
   void noteUnreadable(FolderKey folder, int error);
   void afterDecisions();
 
-  // One folder that was read.
-  void accept(FolderKey folder, const FolderSnapshot& snapshot, bool inRound);
+  // One folder that was read; `isOld`: a while ago, by the scanner.
+  void accept(FolderKey folder, const FolderSnapshot& snapshot, bool inRound, bool isOld);
   void loadFolder(FolderKey folder, const FolderSnapshot& snapshot);
   void endBulkLoad();
   void reconcile(DirtySet& dirty);

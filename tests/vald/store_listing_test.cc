@@ -158,6 +158,47 @@ TEST_F(StoreListing, AListingUnderWaySkipsNothingWhenItemsBeforeItGo) {
   EXPECT_EQ(second.items[0]->filename(), "c");
 }
 
+// Each goes on where it was, whatever the others saw at the same index.
+TEST_F(StoreListing, ListingsOfOneFolderBeforeBetweenAndAfterChangesDoNotMix) {
+  makeFolder("away");
+  makeFolder("f");
+  const auto name = [](int number) { return "n" + std::to_string(100 + number); };
+  std::vector<std::string> all;
+  for (int i = 0; i < 40; ++i) {
+    write("f/" + name(i));
+    const timespec times[2] = {{1000 - i, 0}, {1000 - i, 0}};
+    utimensat(AT_FDCWD, at("f/" + name(i)).c_str(), times, 0);
+    all.push_back(name(i));
+  }
+  open();
+  const VLFileObjectID folder = item("f")->fileObjectID();
+  for (const SortOrder order : {SortOrder::Name, SortOrder::Date}) {
+    const auto left = [&] { return std::vector<std::string>(all.begin(), all.end()); };
+    const auto goOn = [&](std::vector<std::string>& seen, std::uint64_t offset) {
+      const Page page = store->listFolder(folder, order, offset, 4, nullptr);
+      for (const VLQueryItemPtr& item : page.items) seen.push_back(item->filename());
+      return page.nextOffset;
+    };
+    EXPECT_EQ(names(folder, order, 4), left());
+    std::vector<std::vector<std::string>> seen(4);
+    std::vector<std::vector<std::string>> expected(4);
+    std::vector<std::uint64_t> offsets(4, 0);
+    // Each begins after another item went, and has two pages when the next begins.
+    for (std::size_t i = 0; i < seen.size(); ++i) {
+      expected[i] = left();
+      for (std::size_t j = 0; j <= i; ++j) offsets[j] = goOn(seen[j], offsets[j]);
+      rename("f/" + all.front(), "away/" + all.front());
+      all.erase(all.begin());
+      settle();
+    }
+    for (std::size_t i = 0; i < seen.size(); ++i) {
+      while (offsets[i] != 0) offsets[i] = goOn(seen[i], offsets[i]);
+      EXPECT_EQ(seen[i], expected[i]) << i;
+    }
+    EXPECT_EQ(names(folder, order, 4), left());
+  }
+}
+
 TEST_F(StoreListing, AnItemThatChangesBetweenTwoPagesIsListedOnce) {
   for (const char* name : {"a", "b", "c", "d"}) write(name);
   open();
@@ -169,6 +210,28 @@ TEST_F(StoreListing, AnItemThatChangesBetweenTwoPagesIsListedOnce) {
   ASSERT_EQ(page.items.size(), 2U);
   EXPECT_EQ(page.items[0]->filename(), "c");
   EXPECT_EQ(page.items[1]->filename(), "d");
+}
+
+TEST(ListingPlaces, OneThatWaitsOutlivesManyThatWentOn) {
+  ListingPlaces places;
+  const auto place = [](std::uint64_t number) {
+    return ListingPlace{0, "n" + std::to_string(number), number};
+  };
+  const std::uint64_t waiting = places.remember(2, SortOrder::Name, 0, 200, place(1));
+  EXPECT_EQ(waiting, 200U);
+  const std::uint64_t apart = places.remember(2, SortOrder::Name, 0, 200, place(2));
+  EXPECT_NE(apart, waiting);
+  EXPECT_EQ(ListingPlaces::index(apart), 200U);
+  std::uint64_t offset = 0;
+  for (std::uint64_t i = 0; i < 20'000; ++i) {
+    offset = places.remember(3, SortOrder::Date, offset, 200, place(i));
+    EXPECT_EQ(places.find(3, SortOrder::Date, offset), place(i));
+  }
+  EXPECT_EQ(offset, 4'000'000U);
+  EXPECT_EQ(places.find(3, SortOrder::Date, 200), std::nullopt);  // bounded
+  EXPECT_EQ(places.find(2, SortOrder::Name, waiting), place(1));
+  EXPECT_EQ(places.find(2, SortOrder::Name, apart), place(2));
+  EXPECT_EQ(places.find(2, SortOrder::Date, waiting), std::nullopt);
 }
 
 TEST_F(StoreListing, OnlyFilesFoldersAndAliasesAndNothingBehindAnAlias) {

@@ -50,7 +50,7 @@ CREATE TABLE folder (
   name BLOB NOT NULL,
   scanned INTEGER NOT NULL,
   children INTEGER NOT NULL,
-  changes INTEGER NOT NULL,
+  changes INTEGER NOT NULL,  -- not used any more
   inode INTEGER NOT NULL,
   generation INTEGER NOT NULL,
   born INTEGER NOT NULL

@@ -18,7 +18,7 @@ constexpr std::size_t kMostIdle = 4;
   "LEFT JOIN detail ON item.flags & 8 AND detail.id = item.id AND detail.is_document = "         \
   "(item.kind=0) "
 #define SKEIN_FOLDER \
-  "SELECT key, id, parent, name, scanned, children, changes, inode, generation, born FROM folder "
+  "SELECT key, id, parent, name, scanned, children, inode, generation, born FROM folder "
 
 FolderRow folderFromRow(SqliteStatement& statement) {
   return {statement.integer(0),
@@ -27,9 +27,8 @@ FolderRow folderFromRow(SqliteStatement& statement) {
           std::string(statement.bytes(3)),
           statement.integer(4) != 0,
           statement.number(5),
-          statement.number(6),
-          {statement.number(7), static_cast<std::uint32_t>(statement.integer(8)),
-           statement.integer(9)}};
+          {statement.number(6), static_cast<std::uint32_t>(statement.integer(7)),
+           statement.integer(8)}};
 }
 
 std::optional<FolderRow> oneFolder(SqliteStatement& statement) {

@@ -59,9 +59,9 @@ IndexWriter::IndexWriter(SqliteDatabase& database)
       _putFolder(database,
                  // A folder's identifier stays, and with it what stands in the index of them.
                  "INSERT INTO folder(key, id, parent, name, scanned, children, changes, inode, "
-                 "generation, born) VALUES(?,?,?,?,?,?,?,?,?,?) ON CONFLICT(key) DO UPDATE SET "
+                 "generation, born) VALUES(?,?,?,?,?,?,0,?,?,?) ON CONFLICT(key) DO UPDATE SET "
                  "parent=excluded.parent, name=excluded.name, scanned=excluded.scanned, "
-                 "children=excluded.children, changes=excluded.changes, inode=excluded.inode, "
+                 "children=excluded.children, inode=excluded.inode, "
                  "generation=excluded.generation, born=excluded.born"),
       _eraseFolder(database, "DELETE FROM folder WHERE key=?"),
       _setFlags(database, "UPDATE item SET flags=? WHERE rank=?"),
@@ -261,8 +261,7 @@ std::vector<FolderRow> IndexWriter::folders() {
   std::vector<FolderRow> folders;
   SqliteStatement statement(
       _database,
-      "SELECT key, id, parent, name, scanned, children, changes, inode, generation, born "
-      "FROM folder");
+      "SELECT key, id, parent, name, scanned, children, inode, generation, born FROM folder");
   while (statement.step()) {
     folders.push_back({statement.integer(0),
                        VLFileObjectID::folderOrAliasWithRawID(statement.number(1)),
@@ -270,9 +269,8 @@ std::vector<FolderRow> IndexWriter::folders() {
                        std::string(statement.bytes(3)),
                        statement.integer(4) != 0,
                        statement.number(5),
-                       statement.number(6),
-                       {statement.number(7), static_cast<std::uint32_t>(statement.integer(8)),
-                        statement.integer(9)}});
+                       {statement.number(6), static_cast<std::uint32_t>(statement.integer(7)),
+                        statement.integer(8)}});
   }
   return folders;
 }
@@ -280,8 +278,7 @@ std::vector<FolderRow> IndexWriter::folders() {
 void IndexWriter::putFolder(const FolderRow& folder) {
   _putFolder
       .start(folder.number, folder.id.rawID(), folder.parent, folder.name, folder.scanned ? 1 : 0,
-             folder.children, folder.changes, folder.key.inode, folder.key.generation,
-             folder.key.born)
+             folder.children, folder.key.inode, folder.key.generation, folder.key.born)
       .run();
 }
 

@@ -27,7 +27,6 @@ struct FolderRow {
   std::string name;
   bool scanned = false;
   std::uint64_t children = 0;
-  std::uint64_t changes = 0;  // rises whenever its listing changes
   FileKey key;
 };
 

@@ -8,8 +8,7 @@ void Journal::count(FolderKey folder, int by) {
   Folder* found = _folders.find(folder);
   if (found == nullptr) return;
   found->row.children += static_cast<std::uint64_t>(by);
-  ++found->row.changes;
-  if (by != 0) found->isCountUntold = true;
+  found->isCountUntold = true;
   _folders.touch(folder);
 }
 
@@ -35,14 +34,15 @@ void Journal::insert(ItemRow& row) {
 void Journal::update(ItemRow& row, FolderKey previousParent) {
   _index.update(row);
   if (Folder* folder = _folders.find(row.folder)) folder->isCountUntold = false;
-  count(previousParent, previousParent != row.parent ? -1 : 0);
-  if (previousParent != row.parent) count(row.parent, 1);
+  if (previousParent != row.parent) {
+    count(previousParent, -1);
+    count(row.parent, 1);
+  }
   note(row, false, previousParent);
 }
 
 void Journal::updateDetails(ItemRow& row) {
   _index.update(row);
-  count(row.parent, 0);
   note(row, false, row.parent, false);
 }
 

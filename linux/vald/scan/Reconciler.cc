@@ -41,8 +41,12 @@ void Reconciler::forget() {
 
 // ---- gathering
 
-void Reconciler::addFolder(FolderKey folder, const FolderSnapshot& snapshot) {
-  _selves.insert(folder);
+bool Reconciler::addFolder(FolderKey folder, const FolderSnapshot& snapshot, bool isOld) {
+  std::vector<std::string> again;
+  const auto lookAgain = [&](std::string_view name) {
+    if (isOld) again.emplace_back(name);
+    return isOld;
+  };
   std::vector<ItemRow> rows = _index.childrenOf(folder);
   // The containers' folders are listed at the drive's root, but do not live in it.
   std::erase_if(rows, [](const ItemRow& row) { return row.containerID.has_value(); });
@@ -50,15 +54,32 @@ void Reconciler::addFolder(FolderKey folder, const FolderSnapshot& snapshot) {
   auto entry = snapshot.entries.begin();
   while (row != rows.end() || entry != snapshot.entries.end()) {
     if (entry == snapshot.entries.end() || (row != rows.end() && row->name < entry->name)) {
-      _vanished.push_back(*row++);
+      if (!lookAgain(row->name)) _vanished.push_back(*row);
+      ++row;
     } else if (row == rows.end() || entry->name < row->name) {
-      _appeared.push_back({{folder, std::string(entry->name)}, entry->state});
+      if (!lookAgain(entry->name)) {
+        _appeared.push_back({{folder, std::string(entry->name)}, entry->state});
+      }
       ++entry;
     } else {
-      compare(*row++, entry->state);
+      if (!differs(*row, entry->state) || !lookAgain(row->name)) compare(*row, entry->state);
+      ++row;
       ++entry;
     }
   }
+  _selves.insert(folder);
+  if (again.empty()) return true;
+  int descriptor = -1;
+  int error = 0;
+  _disk.forget();
+  if (_disk.open(folder, descriptor, error) != Look::Seen) return false;
+  for (const std::string& name : again) {
+    FileState state;
+    const Look look = readEntry(descriptor, name, state, error);
+    if (look == Look::Seen) addName(folder, name, state);
+    if (look == Look::Gone) addName(folder, name, std::nullopt);
+  }
+  return true;
 }
 
 void Reconciler::addName(FolderKey folder, const std::string& name,
@@ -74,10 +95,15 @@ void Reconciler::addName(FolderKey folder, const std::string& name,
   _selves.insert(folder);
 }
 
+bool Reconciler::differs(const ItemRow& row, const FileState& state) {
+  return row.state.kind != state.kind || !row.state.key.names(state.key) ||
+         (row.folder == kNoFolder && !row.state.looksLike(state));
+}
+
 void Reconciler::compare(const ItemRow& row, const FileState& state) {
   if (row.state.kind != state.kind || !row.state.key.names(state.key)) {
     _replaced.push_back({{row.parent, row.name}, state});
-  } else if (!row.state.looksLike(state) && row.folder == kNoFolder) {
+  } else if (differs(row, state)) {
     retarget(row, state);
   } else if (!row.state.looksLike(state)) {
     _selves.insert(row.folder);

@@ -49,8 +49,11 @@ class Reconciler {
   Reconciler(IndexWriter& index, Journal& journal, FolderTable& folders, Disk& disk,
              Details& details, std::chrono::milliseconds graceWindow, Clock clock);
 
-  // Gathers how a folder, read as a whole, differs from the index.
-  void addFolder(FolderKey folder, const FolderSnapshot& snapshot);
+  // Gathers how a folder, read as a whole, differs from the index. `isOld`: the folder was
+  // read a while ago, and what was done in it since may stand in the index already; so what
+  // differs is looked at again, name by name. False when the folder cannot be opened for that;
+  // then nothing was gathered.
+  bool addFolder(FolderKey folder, const FolderSnapshot& snapshot, bool isOld = false);
   // Gathers how one name differs. `state` nil: there is nothing.
   void addName(FolderKey folder, const std::string& name, const std::optional<FileState>& state);
   // The folder's own dates, or its count of children, may have changed.
@@ -89,6 +92,8 @@ class Reconciler {
   enum class Whereabouts : std::uint8_t { StillThere, Gone, Displaced, Unknown };
 
   void decideOnce(bool inRound);
+  // Whether the item's file is another, or looks otherwise. A folder's dates are its own matter.
+  static bool differs(const ItemRow& row, const FileState& state);
   void compare(const ItemRow& row, const FileState& state);
   void appeared(const Difference& difference);
   void replaced(const Difference& difference);
