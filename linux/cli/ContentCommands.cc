@@ -31,7 +31,7 @@ std::pair<HostItem, NSErrorPtr> fetch(HostService& host, const std::string& item
   auto [transfer, error] = await<std::shared_ptr<HostTransfer>>(
       [&](auto reply) { host.files().contents(targetOf(item), currentVersion, std::move(reply)); });
   if (error) return {HostItem(), std::move(error)};
-  auto [end, problem] = followTransfer(*transfer, item);
+  auto [end, problem] = followTransfer(transfer, item);
   return {std::move(end.item), std::move(problem)};
 }
 
@@ -44,18 +44,14 @@ NSErrorPtr setPinned(HostService& host, const std::string& item, bool pinned) {
 
 int runGet(HostService& host, const GetOptions& options) {
   Report report(options.json);
-  for (const std::string& item : options.items) {
+  return report.each(options.items, [&](const std::string& item) {
     auto [found, error] = fetch(host, item, options.newest);
     if (!error && options.pin) error = setPinned(host, item, true);
-    if (error) {
-      report.failed(item, error);
-      continue;
-    }
+    if (error) return report.failed(item, error);
     std::string line = pathOfURL(found.url);
     if (report.output().isTerminal()) line = escaped(line);
     report.done(item, found, line + '\n');
-  }
-  return report.code();
+  });
 }
 
 NSErrorPtr fileError(const std::string& path) {
@@ -89,7 +85,7 @@ int runCat(HostService& host, const ItemOptions& options) {
 
 int runEvict(HostService& host, const EvictOptions& options) {
   Report report(options.json);
-  for (const std::string& item : options.items) {
+  return report.each(options.items, [&](const std::string& item) {
     NSErrorPtr error;
     if (options.unpin) error = setPinned(host, item, false);
     if (!error) {
@@ -97,8 +93,7 @@ int runEvict(HostService& host, const EvictOptions& options) {
       error = std::get<0>(awaitOnce<>(start));
     }
     report.ended(item, error);
-  }
-  return report.code();
+  });
 }
 
 }  // namespace

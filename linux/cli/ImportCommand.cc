@@ -65,7 +65,8 @@ class Importer {
       _report.failed(folder, error);
       return _report.code();
     }
-    for (std::size_t at = 0; at + 1 < _options.items.size(); ++at) importOne(_options.items[at]);
+    const std::vector<std::string> sources(_options.items.begin(), _options.items.end() - 1);
+    _report.each(sources, [&](const std::string& source) { importOne(source); });
     if (!_options.json && _report.output().isTerminal()) writeSummary();
     return _report.code();
   }
@@ -92,7 +93,7 @@ class Importer {
     };
     auto [transfer, error] = awaitOnce<std::shared_ptr<HostTransfer>>(start);
     if (error) return std::move(error);
-    auto [end, problem] = followTransfer(*transfer, source);
+    auto [end, problem] = followTransfer(transfer, source);
     if (problem) return std::move(problem);
     ++_imported;
     _bytes += end.completedBytes;

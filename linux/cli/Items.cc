@@ -7,6 +7,15 @@
 #include "vellum/VLErrors.h"
 
 namespace skein::cli {
+namespace {
+
+std::string failureLine(const std::string& given, const std::string& text, int code) {
+  return "{\"given\":" + jsonString(given) + jsonBytes("given", given) +
+         ",\"done\":false,\"error\":" + jsonString(text) + ",\"exitCode\":" + std::to_string(code) +
+         "}\n";
+}
+
+}  // namespace
 
 HostTarget targetOf(const std::string& text) {
   return text.starts_with('/') ? HostTarget::path(text) : HostTarget::identifier(text);
@@ -69,11 +78,29 @@ void Report::failed(const std::string& given, const NSErrorPtr& error) {
   const std::string text = textFor(error);
   if (_code == kSuccess) _code = exitCodeFor(error);
   ++_failures;
-  tell("{\"given\":" + jsonString(given) + jsonBytes("given", given) +
-           ",\"done\":false,\"error\":" + jsonString(text) +
-           ",\"exitCode\":" + std::to_string(exitCodeFor(error)) + "}\n",
-       {});
+  _hasCancelled = _hasCancelled || exitCodeFor(error) == kInterrupted;
+  tell(failureLine(given, text, exitCodeFor(error)), {});
   complain(given + ": " + text);
+}
+
+void Report::interrupted(const std::vector<std::string>& items, std::size_t notBegun) {
+  const std::size_t left = items.size() - notBegun;
+  const std::size_t done = notBegun - _failures;
+  if (left == 0 && !_hasCancelled) {
+    complain(done == items.size() ? "the interruption came too late: everything is done"
+                                  : "the interruption came too late to change anything");
+    return;
+  }
+  _code = 128 + interruption();
+  std::string text = "interrupted: " + std::to_string(done) + " of " +
+                     std::to_string(items.size()) + (items.size() == 1 ? " item" : " items") +
+                     (done == 1 ? " is done" : " are done");
+  if (_failures > 0) text += ", " + std::to_string(_failures) + " failed or cancelled";
+  if (left > 0) text += "; " + std::to_string(left) + " not begun, from " + items[notBegun] + " on";
+  for (std::size_t at = notBegun; at < items.size(); ++at) {
+    tell(failureLine(items[at], "the command was interrupted before this was begun", _code), {});
+  }
+  complain(text);
 }
 
 // Told at once: who interrupts the command knows how far it came.

@@ -9,6 +9,7 @@
 #include <utility>
 #include <vector>
 
+#include "linux/cli/Interruption.h"
 #include "linux/cli/Output.h"
 #include "linux/cli/Session.h"
 
@@ -62,18 +63,32 @@ class Report {
     error ? failed(given, error) : done(given);
   }
 
+  // Calls deal(item) for each of the items until the command is interrupted, and tells then what
+  // was not begun. Answers code().
+  template <class Deal>
+  int each(const std::vector<std::string>& items, Deal deal) {
+    const NotedInterruption noted;
+    std::size_t at = 0;
+    while (at < items.size() && interruption() == 0) deal(items[at++]);
+    if (interruption() != 0) interrupted(items, at);
+    return _code;
+  }
+
   Output& output() { return _output; }
-  // That of the first failure.
+  // That of the first failure; 128 + signal when an interruption kept something from being done.
   int code() const { return _code; }
   std::size_t failures() const { return _failures; }
 
  private:
   void tell(const std::string& json, std::string_view text);
+  // What is before `notBegun` was dealt with.
+  void interrupted(const std::vector<std::string>& items, std::size_t notBegun);
 
   const bool _json;
   Output _output;
   int _code = 0;
   std::size_t _failures = 0;
+  bool _hasCancelled = false;
 };
 
 // Calls change(item, reply) for each of the items, one after the other, and reports. A change
@@ -81,7 +96,7 @@ class Report {
 template <class Change>
 int changeEach(const ItemOptions& options, Change change) {
   Report report(options.json);
-  for (const std::string& item : options.items) {
+  return report.each(options.items, [&](const std::string& item) {
     const auto start = [&](auto reply) { change(item, std::move(reply)); };
     const auto [changed, error] = awaitOnce<HostItem>(start);
     if (error) {
@@ -89,8 +104,7 @@ int changeEach(const ItemOptions& options, Change change) {
     } else {
       report.done(item, changed);
     }
-  }
-  return report.code();
+  });
 }
 
 }  // namespace skein::cli

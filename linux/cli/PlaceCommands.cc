@@ -49,7 +49,7 @@ ItemAnswer makeFolders(HostService& host, const std::string& path) {
 
 int runMakeFolders(HostService& host, const FolderOptions& options) {
   Report report(options.json);
-  for (const std::string& path : options.items) {
+  return report.each(options.items, [&](const std::string& path) {
     const auto place = placeOf(path);
     const auto [made, error] = !place            ? ItemAnswer(HostItem(), noPathError(path))
                                : options.parents ? makeFolders(host, path)
@@ -59,8 +59,7 @@ int runMakeFolders(HostService& host, const FolderOptions& options) {
     } else {
       report.done(path, made);
     }
-  }
-  return report.code();
+  });
 }
 
 // Where mv(1) would put things: into a folder that is there, or else at a path.

@@ -58,16 +58,17 @@ std::string sizeText(std::uint64_t bytes) {
   return text.data();
 }
 
-std::pair<HostTransferStep, NSErrorPtr> followTransfer(HostTransfer& transfer,
-                                                       const std::string& name) {
+std::pair<HostTransferStep, NSErrorPtr> followTransfer(
+    const std::shared_ptr<HostTransfer>& transfer, const std::string& name) {
+  const OnInterruption cancels([transfer] { transfer->cancel(); });
   Progress progress;
   const auto begin = Clock::now();
   for (;;) {
     Awaited<HostTransferStep> next;
-    transfer.next(next.reply());
+    transfer->next(next.reply());
     auto [step, error] = next.wait();
     if (error || step.finished) return {std::move(step), std::move(error)};
-    progress.show(transferText(step, name, begin));
+    if (step.totalBytes > 0) progress.show(transferText(step, name, begin));
   }
 }
 

@@ -28,8 +28,9 @@ class Progress {
 // "1.5 GB"; bytes below a thousand as they are.
 std::string sizeText(std::uint64_t bytes);
 
-// Follows a transfer to its end, showing how far it is; its last step, or why it failed.
-std::pair<HostTransferStep, NSErrorPtr> followTransfer(HostTransfer& transfer,
-                                                       const std::string& name);
+// Follows a transfer to its end, showing how far it is; its last step, or why it failed. A
+// signal that is noted cancels it, and the answer is what became of it.
+std::pair<HostTransferStep, NSErrorPtr> followTransfer(
+    const std::shared_ptr<HostTransfer>& transfer, const std::string& name);
 
 }  // namespace skein::cli

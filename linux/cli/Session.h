@@ -9,6 +9,7 @@
 
 #include "base/Mutex.h"
 #include "base/ThreadPool.h"
+#include "linux/cli/Interruption.h"
 #include "linux/protocol/DrivePaths.h"
 #include "linux/protocol/HostClient.h"
 
@@ -26,10 +27,11 @@ struct DriveChoice {
 template <class... Values>
 class Awaited {
  public:
-  // What to give the service. Once.
+  // What to give the service. The first answer counts.
   Reply<Values..., NSErrorPtr> reply() {
     return [state = _state](Values... values, NSErrorPtr error) {
       MutexLock lock(state->mutex);
+      if (state->values) return;
       state->values = std::tuple<Values..., NSErrorPtr>(std::move(values)..., std::move(error));
       state->came.notifyAll();
     };
@@ -82,10 +84,21 @@ class Session {
 // took long is an answer of its own.
 bool isWorthAnotherTry(const NSErrorPtr& error, std::chrono::steady_clock::time_point begin);
 
-// Calls start(reply) and waits for the answer.
+// Calls start(reply) and waits for the answer, also when the command is interrupted: for changes.
 template <class... Values, class Start>
 std::tuple<Values..., NSErrorPtr> awaitOnce(Start& start) {
   Awaited<Values...> answer;
+  start(answer.reply());
+  return answer.wait();
+}
+
+// For questions, whose answer nobody needs when the command is interrupted: interruptedError()
+// then.
+template <class... Values, class Start>
+std::tuple<Values..., NSErrorPtr> awaitUnlessInterrupted(Start& start) {
+  Awaited<Values...> answer;
+  const OnInterruption interrupted(
+      [answer]() mutable { answer.reply()(Values()..., interruptedError()); });
   start(answer.reply());
   return answer.wait();
 }
@@ -94,8 +107,10 @@ std::tuple<Values..., NSErrorPtr> awaitOnce(Start& start) {
 template <class... Values, class Start>
 std::tuple<Values..., NSErrorPtr> await(Start start) {
   const auto begin = std::chrono::steady_clock::now();
-  auto answer = awaitOnce<Values...>(start);
-  if (isWorthAnotherTry(std::get<NSErrorPtr>(answer), begin)) answer = awaitOnce<Values...>(start);
+  auto answer = awaitUnlessInterrupted<Values...>(start);
+  if (isWorthAnotherTry(std::get<NSErrorPtr>(answer), begin)) {
+    answer = awaitUnlessInterrupted<Values...>(start);
+  }
   return answer;
 }
 

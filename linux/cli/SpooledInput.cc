@@ -34,6 +34,7 @@ NSErrorPtr failure(const std::string& what) {
 NSErrorPtr copyInput(int to, const std::string& path) {
   std::string buffer(std::size_t{256} * 1024, '\0');
   for (;;) {
+    if (!waitForInput()) return interruptedError();
     const ssize_t got = read(STDIN_FILENO, buffer.data(), buffer.size());
     if (got < 0 && errno == EINTR) continue;
     if (got < 0) return failure("standard input cannot be read");

@@ -61,7 +61,7 @@ std::string lineOf(const std::string& item, const HostItem& found, const TagOpti
 int runTag(HostService& host, const TagOptions& options) {
   if (options.list) return runList(host, options.json);
   Report report(options.json);
-  for (const std::string& item : options.items) {
+  return report.each(options.items, [&](const std::string& item) {
     auto [found, error] =
         await<HostItem>([&](auto reply) { host.item(targetOf(item), std::move(reply)); });
     if (!error && options.changes()) {
@@ -70,14 +70,10 @@ int runTag(HostService& host, const TagOptions& options) {
       };
       std::tie(found, error) = awaitOnce<HostItem>(start);
     }
-    if (error) {
-      report.failed(item, error);
-      continue;
-    }
+    if (error) return report.failed(item, error);
     const std::string line = options.changes() ? "" : lineOf(item, found, options);
     report.done(item, found, line);
-  }
-  return report.code();
+  });
 }
 
 }  // namespace

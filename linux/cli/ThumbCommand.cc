@@ -72,6 +72,7 @@ class Gallery {
   explicit Gallery(const ThumbOptions& options) : _options(options), _folder(options.folder) {}
 
   void take(const std::string& item, const HostThumbnail& thumbnail) {
+    ++_taken;
     std::string path;
     NSErrorPtr error = thumbnail.error;
     if (thumbnail.data && !_options.folder.empty()) {
@@ -89,6 +90,7 @@ class Gallery {
     _output.flush();
   }
   int code() const { return _code; }
+  std::size_t taken() const { return _taken; }
 
  private:
   void writeJson(const std::string& item, const HostThumbnail& thumbnail, const std::string& path,
@@ -132,6 +134,7 @@ class Gallery {
   PictureFolder _folder;
   Output _output;
   int _code = kSuccess;
+  std::size_t _taken = 0;
 };
 
 // Follows one batch to its end; its error when it never began or broke off.
@@ -147,9 +150,8 @@ NSErrorPtr runBatch(HostService& host, const std::vector<std::string>& items,
   if (refused) return refused;
   Progress progress;
   for (;;) {
-    Awaited<HostThumbnailStep> next;
-    batch->next(next.reply());
-    const auto [step, error] = next.wait();
+    const auto start = [&, &batch = batch](auto reply) { batch->next(std::move(reply)); };
+    const auto [step, error] = awaitUnlessInterrupted<HostThumbnailStep>(start);
     progress.clear();
     for (const HostThumbnail& thumbnail : step.thumbnails) {
       if (thumbnail.index < items.size()) gallery.take(items[thumbnail.index], thumbnail);
@@ -181,11 +183,16 @@ int runThumb(HostService& host, const ThumbOptions& options) {
     return kUsage;
   }
   Gallery gallery(options);
+  const NotedInterruption noted;
   for (auto next = options.items.begin(); next != options.items.end();) {
     const std::vector<std::string> items = takeBatch(next, options.items.end());
-    if (const NSErrorPtr error = runBatch(host, items, options, gallery)) {
-      return complainAbout(error);
+    const NSErrorPtr error = runBatch(host, items, options, gallery);
+    if (interruption() != 0 && gallery.taken() < options.items.size()) {
+      complain("interrupted: " + std::to_string(gallery.taken()) + " of " +
+               std::to_string(options.items.size()) + " thumbnails came; the rest is cancelled");
+      return 128 + interruption();
     }
+    if (error) return complainAbout(error);
   }
   return gallery.code();
 }

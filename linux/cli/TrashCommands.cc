@@ -7,6 +7,7 @@
 #include "linux/cli/ExitCodes.h"
 #include "linux/cli/ItemText.h"
 #include "linux/cli/Items.h"
+#include "linux/cli/Progress.h"
 
 namespace skein::cli {
 namespace {
@@ -119,26 +120,19 @@ int runRestore(HostService& host, const RestoreOptions& options) {
     folder = targetOf(options.folder);
   }
   Report report(options.json);
-  for (const std::string& item : options.items) {
+  return report.each(options.items, [&, &trash = trash](const std::string& item) {
     const auto [identifier, unclear] = identifierInTrash(trash, item);
-    if (unclear) {
-      report.failed(item, unclear);
-      continue;
-    }
+    if (unclear) return report.failed(item, unclear);
     const auto start = [&, name = identifier](auto reply) {
       host.files().untrash(HostTarget::identifier(name), folder, originOf("restore"),
                            std::move(reply));
     };
     const auto [restored, problem] = awaitOnce<HostItem>(start);
-    if (problem) {
-      report.failed(item, problem);
-      continue;
-    }
+    if (problem) return report.failed(item, problem);
     // It may have got another name, or another folder.
     const std::string& path = restored.path;
     report.done(item, restored, (report.output().isTerminal() ? escaped(path) : path) + '\n');
-  }
-  return report.code();
+  });
 }
 
 // Asks on a terminal; elsewhere nobody can be asked, and the command was clear.
@@ -146,30 +140,33 @@ bool isWanted(const std::string& item) {
   if (isatty(STDIN_FILENO) != 1 || isatty(STDERR_FILENO) != 1) return true;
   std::cerr << "Remove " << escaped(item) << " for good? [y/N] " << std::flush;
   std::string answer;
-  std::getline(std::cin, answer);
+  if (waitForInput()) std::getline(std::cin, answer);
   return answer == "y" || answer == "Y" || answer == "yes";
+}
+
+NSErrorPtr removeOne(HostService& host, const std::string& item) {
+  const auto start = [&](auto reply) {
+    host.files().remove(targetOf(item), originOf("rm"), std::move(reply));
+  };
+  auto [removal, error] = awaitOnce<std::shared_ptr<HostTransfer>>(start);
+  return error ? std::move(error) : followTransfer(removal, item).second;
 }
 
 int runRemove(HostService& host, const RemoveOptions& options) {
   Report report(options.json);
-  for (const std::string& item : options.items) {
+  return report.each(options.items, [&](const std::string& item) {
     auto [named, error] = namedItem(host, item);
     const bool isFolder = !named.isAlias && named.found.item && named.found.item->isFolder();
     if (!error && isFolder && !options.folders) {
       error = failure("it is a folder; remove it and all that is in it with: skein rm -r");
     }
     if (!error && !options.force && !isWanted(item)) {
-      error = failure("it was not removed; nobody said yes");
+      error =
+          interruption() != 0 ? interruptedError() : failure("it was not removed; nobody said yes");
     }
-    if (!error) {
-      const auto start = [&](auto reply) {
-        host.files().remove(targetOf(item), originOf("rm"), std::move(reply));
-      };
-      error = std::get<0>(awaitOnce<>(start));
-    }
+    if (!error) error = removeOne(host, item);
     report.ended(item, error);
-  }
-  return report.code();
+  });
 }
 
 }  // namespace
@@ -211,8 +208,10 @@ void addTrashCommands(CLI::App& app, Invocation& invocation) {
   rm->add_flag("-f,--force", removed->force, "Do not ask, as it does on a terminal");
   rm->add_flag("--json", removed->json, "One JSON object per line");
   runs(rm, invocation,
-       "To be able to get them back, use: skein trash\nExample: skein rm -r /Scratch", removed,
-       runRemove);
+       "To be able to get them back, use: skein trash. Until this command has ended, Ctrl-C puts "
+       "the "
+       "item\nunder way back, a whole folder too.\nExample: skein rm -r /Scratch",
+       removed, runRemove);
 }
 
 }  // namespace skein::cli

@@ -7,6 +7,7 @@
 #include <utility>
 
 #include "linux/framework/RequestOrigin.h"
+#include "linux/framework/RequestProgress.h"
 #include "linux/framework/SyncCall.h"
 #include "linux/protocol/LocalFiles.h"
 
@@ -18,14 +19,15 @@ inline constexpr std::chrono::seconds kLongestChange{120};
 
 // Calls start(files, origin, reply). `handler`, whose last value is an error, runs once, on
 // the executor: with what came, or with the error that nothing will. It has the calling
-// thread's origin, which `start` gets too.
+// thread's origin, which `start` gets too, and its progress.
 template <class... Values, class Start>
 void callFiles(const DaemonAccess& access, UniqueFunction<void(Values...)> handler, Start start) {
   const RequestOrigin origin = RequestOriginScope::current();
   const auto reply = [handler =
                           std::make_shared<UniqueFunction<void(Values...)>>(std::move(handler)),
-                      origin](Values... values) {
-    const RequestOriginScope scope(origin);
+                      origin, progress = RequestProgressScope::current()](Values... values) {
+    const RequestOriginScope originScope(origin);
+    const RequestProgressScope progressScope(progress);
     (*handler)(std::move(values)...);
   };
   const auto daemon = access.client->remoteObjectProxyWithErrorHandler([reply](NSErrorPtr error) {

@@ -75,7 +75,10 @@ void LocalFileOperations::fp_deleteWithCompletionHandler(
     const NSURLPtr& url, UniqueFunction<void(NSErrorPtr)> completionHandler) {
   callFiles(_access, std::move(completionHandler),
             [&](LocalFiles& files, const RequestOrigin& origin, auto reply) {
-              files.remove(url, origin, reply);
+              auto progress = files.remove(url, origin, reply);
+              if (const auto current = RequestProgressScope::current()) {
+                current->follow(std::move(progress));
+              }
             });
 }
 

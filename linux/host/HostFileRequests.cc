@@ -28,6 +28,12 @@ NSErrorPtr nothingAnsweredError() {
         "The operation ended without saying what became of the item; look at it with skein ls"}});
 }
 
+NSErrorPtr cancelledError() {
+  return NSError::errorWithDomain(
+      NSCocoaErrorDomain, NSUserCancelledError,
+      {{NSLocalizedDescriptionKey, std::string("The download was cancelled.")}});
+}
+
 // An item counts, whatever error is left beside it.
 template <class Answer>
 void answerWith(const DriveRequests& drive, Answer& answer, NSFileProviderItemPtr item,
@@ -166,8 +172,11 @@ void HostFileRequests::contents(HostTarget target, bool currentVersion,
               transfer->finish(std::move(item), std::move(problem));
             });
         transfer->follow(want->progress());
-        (*timed)(streamOf(transfer, [want = std::move(want)]() mutable { want = nullptr; }),
-                 nullptr);
+        const auto letGo = [transfer, want = std::move(want)]() mutable {
+          want = nullptr;
+          transfer->finish({}, cancelledError());
+        };
+        (*timed)(streamOf(transfer, letGo), nullptr);
       });
 }
 
@@ -319,22 +328,26 @@ void HostFileRequests::untrash(HostTarget target, std::optional<HostTarget> pare
          });
 }
 
-void HostFileRequests::remove(HostTarget target, RequestOrigin origin, Reply<NSErrorPtr> reply) {
-  _drive->withDrive<>(
-      std::move(reply),
-      [drive = _drive, target = std::move(target),
-       origin = std::move(origin)](const std::shared_ptr<TimedReply<>>& timed) {
+void HostFileRequests::remove(HostTarget target, RequestOrigin origin,
+                              Reply<std::shared_ptr<HostTransfer>, NSErrorPtr> reply) {
+  _drive->withDrive<std::shared_ptr<HostTransfer>>(
+      std::move(reply), [drive = _drive, target = std::move(target),
+                         origin = std::move(origin)](const TimedTransfer& timed) {
         NSErrorPtr error;
         const auto identifier = drive->resolve(target, &error);
         if (!identifier) {
-          (*timed)(error);
+          (*timed)(nullptr, error);
           return;
         }
-        const RequestOriginScope scope(origin);
-        drive->extension().deleteItemWithIdentifier(
-            *identifier, [timed](NSErrorPtr problem) { (*timed)(std::move(problem)); });
-      },
-      kChangeDeadline);
+        const auto transfer = std::make_shared<Transfer>(drive->tools());
+        const auto progress = std::make_shared<RequestProgress>();
+        const RequestOriginScope originScope(origin);
+        const RequestProgressScope progressScope(progress);
+        drive->extension().deleteItemWithIdentifier(*identifier, [transfer](NSErrorPtr problem) {
+          transfer->finish({}, std::move(problem));
+        });
+        (*timed)(streamOf(transfer, [progress] { progress->cancel(); }), nullptr);
+      });
 }
 
 void HostFileRequests::trashedItems(Reply<std::shared_ptr<HostTrash>, NSErrorPtr> reply) {

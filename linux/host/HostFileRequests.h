@@ -33,7 +33,8 @@ class HostFileRequests final : public HostFiles {
   void trash(HostTarget target, RequestOrigin origin, ItemReply reply) override;
   void untrash(HostTarget target, std::optional<HostTarget> parent, RequestOrigin origin,
                ItemReply reply) override;
-  void remove(HostTarget target, RequestOrigin origin, Reply<NSErrorPtr> reply) override;
+  void remove(HostTarget target, RequestOrigin origin,
+              Reply<std::shared_ptr<HostTransfer>, NSErrorPtr> reply) override;
   void trashedItems(Reply<std::shared_ptr<HostTrash>, NSErrorPtr> reply) override;
   void setTags(HostTarget target, std::vector<std::string> names, ItemReply reply) override;
   void tagsInUse(Reply<std::vector<TagUse>, NSErrorPtr> reply) override;

@@ -16,6 +16,7 @@ class TransferStream final : public HostTransfer {
   void next(Reply<HostTransferStep, NSErrorPtr> reply) override {
     _transfer->next(std::move(reply));
   }
+  void cancel() override { _letGo(); }
 
  private:
   const std::shared_ptr<Transfer> _transfer;

@@ -39,7 +39,8 @@ class Transfer final : public std::enable_shared_from_this<Transfer> {
   bool _timed SKEIN_GUARDED_BY(_queue) = false;
 };
 
-// The stream over it: runs `letGo` when whoever follows it lets go.
+// The stream over it: runs `letGo` when whoever follows it cancels it, and when it lets go.
+// Whoever still waits for a step then hears what `letGo` leads to.
 std::shared_ptr<HostTransfer> streamOf(std::shared_ptr<Transfer> transfer, Task letGo);
 
 }  // namespace skein

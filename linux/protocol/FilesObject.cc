@@ -27,6 +27,11 @@ void encodeAll(auto list, const auto& values) {
   for (const auto& value : values) codec::encode(list[at++], value);
 }
 
+// For a transfer that answers with no URL.
+Reply<NSErrorPtr> errorAlone(LocalFiles::URLReply reply) {
+  return [reply = std::move(reply)](NSErrorPtr error) mutable { reply(nullptr, std::move(error)); };
+}
+
 std::optional<std::string> nameOf(bool there, capnp::Data::Reader name) {
   return there ? std::optional(codec::text(name)) : std::nullopt;
 }
@@ -98,13 +103,10 @@ kj::Promise<void> FilesObject::move(MoveContext context) {
 
 kj::Promise<void> FilesObject::remove(RemoveContext context) {
   const auto params = context.getParams();
-  return answer(
-      _service, context,
-      [&](auto reply) {
-        files().remove(urlFromClient(params.getUrl()), codec::text(params.getOrigin()),
-                       std::move(reply));
-      },
-      codec::encodeError);
+  return startTransfer(context, [&](LocalFiles::URLReply reply) {
+    return files().remove(urlFromClient(params.getUrl()), codec::text(params.getOrigin()),
+                          errorAlone(std::move(reply)));
+  });
 }
 
 kj::Promise<void> FilesObject::trash(TrashContext context) {
@@ -200,9 +202,8 @@ kj::Promise<void> FilesObject::tagsInUse(TagsInUseContext context) {
 kj::Promise<void> FilesObject::download(DownloadContext context) {
   const auto params = context.getParams();
   return startTransfer(context, [&](LocalFiles::URLReply reply) {
-    return files().download(
-        urlFromClient(params.getUrl()), params.getCurrentVersion(),
-        [reply = std::move(reply)](NSErrorPtr error) mutable { reply(nullptr, std::move(error)); });
+    return files().download(urlFromClient(params.getUrl()), params.getCurrentVersion(),
+                            errorAlone(std::move(reply)));
   });
 }
 

@@ -105,15 +105,18 @@ class FilesProxy final : public LocalFiles {
         urlReply(std::move(reply)));
   }
 
-  void remove(NSURLPtr url, RequestOrigin origin, Reply<NSErrorPtr> reply) override {
-    change(
+  std::shared_ptr<NSProgress> remove(NSURLPtr url, RequestOrigin origin,
+                                     Reply<NSErrorPtr> reply) override {
+    return transfer(
         [=](wire::Files::Client& files) {
           auto request = files.removeRequest();
           if (url) request.setUrl(codec::bytes(url->path()));
           request.setOrigin(codec::bytes(origin));
-          return request.send();
+          return request;
         },
-        errorReply(std::move(reply)));
+        [reply = std::move(reply)](TransferOutcome outcome) mutable {
+          reply(std::move(outcome.error));
+        });
   }
 
   void trash(NSURLPtr url, RequestOrigin origin, URLReply reply) override {

@@ -24,14 +24,14 @@ SharedReply<Values...> share(std::type_identity_t<Reply<Values..., NSErrorPtr>>&
 }
 
 // One stream, on the connection that it was made on. The reference belongs to the loop.
-// `Decode` is a function object without state.
-template <class Client, class Decode, class... Values>
-class StreamProxy final : public HostStream<Values...> {
+// `Decode` is a function object without state; `Stream` the HostStream<Values...> that it is.
+template <class Stream, class Client, class Decode, class... Values>
+class StreamProxy : public Stream {
  public:
   StreamProxy(std::shared_ptr<SocketClient> socket, Client client)
       : _socket(std::move(socket)),
-        _connection(_socket->currentConnection()),
-        _client(_socket->loop()->own(std::make_unique<Client>(kj::mv(client)))) {}
+        _client(_socket->loop()->own(std::make_unique<Client>(kj::mv(client)))),
+        _connection(_socket->currentConnection()) {}
 
   void next(Reply<Values..., NSErrorPtr> reply) override {
     auto shared = share<Values...>(reply);
@@ -46,16 +46,19 @@ class StreamProxy final : public HostStream<Values...> {
     });
   }
 
- private:
+ protected:
   const std::shared_ptr<SocketClient> _socket;
-  const std::uint64_t _connection;
   const std::shared_ptr<Client> _client;
+
+ private:
+  const std::uint64_t _connection;
 };
 
 template <class... Values, class Client, class Decode>
 std::shared_ptr<HostStream<Values...>> makeStream(const std::shared_ptr<SocketClient>& socket,
                                                   Client client, Decode) {
-  return std::make_shared<StreamProxy<Client, Decode, Values...>>(socket, kj::mv(client));
+  using Stream = HostStream<Values...>;
+  return std::make_shared<StreamProxy<Stream, Client, Decode, Values...>>(socket, kj::mv(client));
 }
 
 // The messages of one interface of the host's object. A call's `reply` runs once, on the

@@ -22,7 +22,12 @@ struct HostTransferStep {
 };
 // A step when there is something new, at most every 100 ms, and the last one at once. Letting
 // go cancels the transfer and waits for nothing; nothing of it is left.
-using HostTransfer = HostStream<HostTransferStep>;
+class HostTransfer : public HostStream<HostTransferStep> {
+ public:
+  // Ends it; its last step tells whether that came in time (NSUserCancelledError) or what is
+  // done. Any thread; returns at once.
+  virtual void cancel() = 0;
+};
 using HostTrash = HostStream<std::vector<HostTrashedItem>, bool>;  // a page; whether it is the last
 
 // Asynchronous: each reply runs once, on any thread but the caller's. An error comes with
@@ -58,7 +63,9 @@ class HostFiles {
   // Nil parent: where it was.
   virtual void untrash(HostTarget target, std::optional<HostTarget> parent, RequestOrigin origin,
                        ItemReply reply) = 0;
-  virtual void remove(HostTarget target, RequestOrigin origin, Reply<NSErrorPtr> reply) = 0;
+  // For good; the last step has no item. Until it is told, cancelling puts the item back.
+  virtual void remove(HostTarget target, RequestOrigin origin,
+                      Reply<std::shared_ptr<HostTransfer>, NSErrorPtr> reply) = 0;
   virtual void trashedItems(Reply<std::shared_ptr<HostTrash>, NSErrorPtr> reply) = 0;
 
   virtual void setTags(HostTarget target, std::vector<std::string> names, ItemReply reply) = 0;

@@ -20,6 +20,10 @@ class TransferObject final : public wire::HostTransfer::Server {
                           codec::setError(results, error);
                         });
   }
+  kj::Promise<void> cancel(CancelContext) override {
+    _stream.run([](HostTransfer& transfer) { transfer.cancel(); });
+    return kj::READY_NOW;
+  }
 
  private:
   StreamOwner<HostTransfer> _stream;
@@ -189,7 +193,7 @@ kj::Promise<void> HostFilesObject::remove(RemoveContext context) {
       context,
       [target = codec::decode(params.getTarget()), origin = codec::text(params.getOrigin())](
           HostFiles& files, auto reply) { files.remove(target, origin, std::move(reply)); },
-      encodeError);
+      encodeTransfer(_peer));
 }
 
 kj::Promise<void> HostFilesObject::trashedItems(TrashedItemsContext context) {

@@ -12,11 +12,26 @@ namespace {
 
 using Wire = wire::HostFiles::Client;
 
-Task decodeStep(const auto& results, const SharedReply<HostTransferStep>& reply) {
-  return [reply, step = codec::decode(results), error = codec::errorOf(results)]() mutable {
-    (*reply)(std::move(step), std::move(error));
-  };
-}
+struct DecodeStep {
+  Task operator()(const auto& results, const SharedReply<HostTransferStep>& reply) {
+    return [reply, step = codec::decode(results), error = codec::errorOf(results)]() mutable {
+      (*reply)(std::move(step), std::move(error));
+    };
+  }
+};
+
+class HostTransferProxy final
+    : public StreamProxy<HostTransfer, wire::HostTransfer::Client, DecodeStep, HostTransferStep> {
+ public:
+  using StreamProxy::StreamProxy;
+
+  void cancel() override {
+    _socket->loop()->post([client = _client] {
+      // Where this does not arrive, the transfer has ended or ends with its connection.
+      client->cancelRequest().send().detach([](kj::Exception&&) {});
+    });
+  }
+};
 
 Task decodePage(const auto& results, const SharedReply<std::vector<HostTrashedItem>, bool>& reply) {
   std::vector<HostTrashedItem> items;
@@ -171,8 +186,9 @@ class HostFilesProxy final : public HostFiles, private HostCalls<wire::HostFiles
         reply);
   }
 
-  void remove(HostTarget target, RequestOrigin origin, Reply<NSErrorPtr> reply) override {
-    callForError(
+  void remove(HostTarget target, RequestOrigin origin,
+              Reply<std::shared_ptr<HostTransfer>, NSErrorPtr> reply) override {
+    callForTransfer(
         [target = std::move(target), origin = std::move(origin)](Wire& host) {
           auto request = host.removeRequest();
           codec::encode(request.initTarget(), target);
@@ -271,9 +287,7 @@ class HostFilesProxy final : public HostFiles, private HostCalls<wire::HostFiles
         std::move(send),
         [socket = _socket](auto& results) -> std::shared_ptr<HostTransfer> {
           if (!results.hasTransfer()) return nullptr;
-          return makeStream<HostTransferStep>(
-              socket, results.getTransfer(),
-              [](const auto& step, const auto& next) { return decodeStep(step, next); });
+          return std::make_shared<HostTransferProxy>(socket, results.getTransfer());
         },
         reply);
   }

@@ -74,6 +74,11 @@ class StreamOwner {
                          [stream = _stream](auto reply) { stream->next(std::move(reply)); },
                          std::move(encode));
   }
+  // Calls call(stream), after the calls before it.
+  template <class Call>
+  void run(Call call) {
+    _queue.async([stream = _stream, call = std::move(call)] { call(*stream); });
+  }
 
  private:
   const HostPeerPtr _peer;

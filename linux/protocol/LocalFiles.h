@@ -75,8 +75,10 @@ class LocalFiles {
   // is taken is tried again with a number.
   virtual void move(NSURLPtr url, NSURLPtr folder, std::optional<std::string> newName, bool bounce,
                     RequestOrigin origin, URLReply reply) = 0;
-  // For good.
-  virtual void remove(NSURLPtr url, RequestOrigin origin, Reply<NSErrorPtr> reply) = 0;
+  // For good. Cancelling the progress puts the item back where it was, and the reply is
+  // NSUserCancelledError, unless the answer is on its way: nothing is deleted before that.
+  virtual std::shared_ptr<NSProgress> remove(NSURLPtr url, RequestOrigin origin,
+                                             Reply<NSErrorPtr> reply) = 0;
   virtual void trash(NSURLPtr url, RequestOrigin origin, URLReply reply) = 0;
 
   // Where a trashed item was; null with an error when that is not known.

@@ -17,7 +17,8 @@ interface Files {
   rename @3 (url :Data, newName :Data, origin :Data) -> (url :Data, error :Types.Error);
   move @4 (url :Data, folder :Data, newName :Data, bounce :Bool, origin :Data)
       -> (url :Data, error :Types.Error);
-  remove @5 (url :Data, origin :Data) -> (error :Types.Error);
+  remove @5 (url :Data, origin :Data, observer :TransferObserver)
+      -> (transfer :Transfer, error :Types.Error);
   trash @6 (url :Data, origin :Data) -> (url :Data, error :Types.Error);
 
   putBackURL @7 (url :Data) -> (url :Data, error :Types.Error);
@@ -42,7 +43,8 @@ interface Files {
       -> (entries :List(FileHistoryEntry), error :Types.Error);
 }
 
-# Bytes on their way. vald's end: the client's last reference ends it, as cancel() does.
+# Bytes on their way, or a removal. vald's end: the client's last reference ends it, as
+# cancel() does.
 interface Transfer {
   # When it has ended, however it did; the counts are the last ones.
   result @0 () -> (url :Data, error :Types.Error, completedBytes :Int64, totalBytes :Int64);

@@ -31,7 +31,7 @@ interface HostFiles {
   trash @8 (target :Target, origin :Data) -> (item :HostItem, error :Types.Error);
   untrash @9 (target :Target, parent :Target, origin :Data)
       -> (item :HostItem, error :Types.Error);
-  remove @10 (target :Target, origin :Data) -> (error :Types.Error);
+  remove @10 (target :Target, origin :Data) -> (transfer :HostTransfer, error :Types.Error);
   trashedItems @11 () -> (trash :HostTrash, error :Types.Error);
 
   setTags @12 (target :Target, names :List(Data)) -> (item :HostItem, error :Types.Error);
@@ -51,6 +51,7 @@ interface HostFiles {
 interface HostTransfer {
   next @0 () -> (completedBytes :UInt64, totalBytes :UInt64, finished :Bool, item :HostItem,
                  error :Types.Error);
+  cancel @1 ();
 }
 interface HostTrash {
   next @0 () -> (items :List(HostTrashedItem), last :Bool, error :Types.Error);

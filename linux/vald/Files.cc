@@ -167,14 +167,33 @@ void Files::move(NSURLPtr url, NSURLPtr folder, std::optional<std::string> newNa
   });
 }
 
-void Files::remove(NSURLPtr url, RequestOrigin origin, Reply<NSErrorPtr> reply) {
+std::shared_ptr<NSProgress> Files::remove(NSURLPtr url, RequestOrigin origin,
+                                          Reply<NSErrorPtr> reply) {
+  auto progress = NSProgress::progressWithTotalUnitCount(0);
   answer("url", url, std::move(reply), [=, this](Reply<NSErrorPtr>& answered) {
     const Subject subject = subjectAt(url->path());
-    const FileResult result =
-        _parts.operations.remove(subject.place.physical, request(subject, origin));
-    if (!result.error) _parts.store.lookAtPaths({subject.place.path});
+    FileRequest asked = request(subject, origin);
+    const auto goesOn = [&] { return !progress->isCancelled(); };
+    Task deletion;
+    asked.progress = [&](const FileProgress&) { return goesOn(); };
+    asked.removed = [&] {
+      _parts.store.lookAtPaths({subject.place.path});
+      return goesOn();
+    };
+    asked.deleteLater = [&](Task task) { deletion = std::move(task); };
+    const FileResult result = _parts.operations.remove(subject.place.physical, asked);
+    if (result.error) {
+      // It may have been put back.
+      std::vector<std::string> places{subject.place.path};
+      if (!result.path.empty()) {
+        places.push_back(documentPath(&_parts.operations.roots(), result.path));
+      }
+      _parts.store.lookAtPaths(places);
+    }
     answered(result.error);
+    if (deletion) _parts.importExecutor->post(std::move(deletion));
   });
+  return progress;
 }
 
 void Files::trash(NSURLPtr url, RequestOrigin origin, URLReply reply) {

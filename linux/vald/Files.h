@@ -27,7 +27,7 @@ struct FilesParts {
   CloudPlaces places;
   Downloader& downloader;
   std::shared_ptr<Executor> executor;        // for what takes milliseconds
-  std::shared_ptr<Executor> importExecutor;  // for what may take minutes
+  std::shared_ptr<Executor> importExecutor;  // for what may take minutes; deletions too
   // Why a document may not be uploaded although nothing failed; empty when it will be.
   std::function<std::string(VLFileObjectID)> whyNotUploaded;
   // Told after it succeeded; both return soon.
@@ -59,7 +59,8 @@ class Files final : public LocalFiles {
   void rename(NSURLPtr url, std::string newName, RequestOrigin origin, URLReply reply) override;
   void move(NSURLPtr url, NSURLPtr folder, std::optional<std::string> newName, bool bounce,
             RequestOrigin origin, URLReply reply) override;
-  void remove(NSURLPtr url, RequestOrigin origin, Reply<NSErrorPtr> reply) override;
+  std::shared_ptr<NSProgress> remove(NSURLPtr url, RequestOrigin origin,
+                                     Reply<NSErrorPtr> reply) override;
   void trash(NSURLPtr url, RequestOrigin origin, URLReply reply) override;
 
   void putBackURL(NSURLPtr url, URLReply reply) override;

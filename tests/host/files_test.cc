@@ -89,7 +89,7 @@ class FileExtension final : public NSFileProviderExtension {
   void deleteItemWithIdentifier(const NSFileProviderItemIdentifier& identifier,
                                 ErrorCompletion done) override {
     note("delete " + identifier);
-    done(answered.second);
+    transfers.push_back({RequestProgressScope::current(), std::move(done), nullptr});
   }
   void setTagData(std::optional<NSData> data, const NSFileProviderItemIdentifier& identifier,
                   ItemCompletion done) override {
@@ -185,8 +185,9 @@ class FileRequests : public testing::Test {
   }
   void next(HostTransfer& stream) {
     stream.next([this](const HostTransferStep& step, const NSErrorPtr& problem) {
+      const auto& item = step.item.item;
       heard.push_back(problem         ? textOf(problem)
-                      : step.finished ? "finished " + step.item.item->filename()
+                      : step.finished ? "finished " + (item ? item->filename() : "without item")
                                       : std::to_string(step.completedBytes) + " of " +
                                             std::to_string(step.totalBytes));
     });
@@ -231,14 +232,13 @@ TEST_F(FileRequests, EachChangeIsTheExtensionsInItsOriginsName) {
   files->trash(a, "me", itemReply());
   files->untrash(b, std::nullopt, "me", itemReply());
   files->untrash(b, a, "me", itemReply());
-  files->remove(a, "me", errorReply());
   files->setTags(a, {"x", "y"}, itemReply());
   EXPECT_EQ(calls(), (Words{"mkdir new in NSFileProviderRootContainerItemIdentifier by me",
                             "rename a to c by me", "move a to b as nil by me",
                             "move a to b as c by me", "trash a by me", "untrash b to nil by me",
-                            "untrash b to a by me", "delete a by me", "tag a x y"}));
+                            "untrash b to a by me", "tag a x y"}));
   EXPECT_EQ(heard, (Words{"a at /a", "a at /a", "a at /a", "a at /a", "a at /a", "a at /a",
-                          "a at /a", "done", "a at /a"}));
+                          "a at /a", "a at /a"}));
   EXPECT_EQ(RequestOriginScope::current(), "");
 }
 
@@ -313,6 +313,45 @@ TEST_F(FileRequests, LettingGoOfAnImportCancelsItNowOrWhenItBegins) {
     run();
   }
   EXPECT_EQ(heard, Words());
+}
+
+TEST_F(FileRequests, ARemovalIsCancelledByAskingOrByLettingGoAndSaysWhatBecameOfIt) {
+  for (const bool isAsked : {true, false}) {
+    std::shared_ptr<HostTransfer> stream;
+    files->remove(HostTarget::path("/a"), "me", transferReply(stream));
+    EXPECT_EQ(calls(), (Words{"delete a by me"}));
+    auto held = take();
+    const auto removal = NSProgress::progressWithTotalUnitCount(0);
+    held.progress->follow(removal);
+    next(*stream);
+    EXPECT_FALSE(removal->isCancelled());
+    if (isAsked) {
+      stream->cancel();
+    } else {
+      stream = nullptr;
+    }
+    EXPECT_TRUE(removal->isCancelled());
+    EXPECT_EQ(heard, Words());
+    // It came too late, or in time.
+    held.provided(isAsked ? nullptr : cancelled());
+    run();
+    EXPECT_EQ(std::exchange(heard, {}), (Words{isAsked ? "finished without item" : "error 3072"}));
+  }
+}
+
+TEST_F(FileRequests, WhoCancelsADownloadIsAnsweredThoughOthersStillWantIt) {
+  const auto first = get("a");
+  const auto second = get("a");
+  auto held = take();
+  held.progress->follow(NSProgress::progressWithTotalUnitCount(10));
+  next(*first);
+  next(*second);
+  first->cancel();
+  run();
+  EXPECT_EQ(heard, (Words{"error 3072"}));
+  held.provided(nullptr);
+  run();
+  EXPECT_EQ(heard, (Words{"error 3072", "finished a"}));
 }
 
 TEST_F(FileRequests, AFileThatSeveralWantIsAskedForOnceAndCancelledWithTheLast) {

@@ -158,12 +158,7 @@ class Client {
         change(
             [&](auto reply) { files.untrash(document, std::nullopt, _origin, std::move(reply)); });
         break;
-      case 8: {
-        Answer<> removed(_tally);
-        files.remove(document, _origin, removed.reply());
-        removed.wait();
-        break;
-      }
+      case 8: follow([&](auto reply) { files.remove(document, _origin, std::move(reply)); }); break;
       case 9:
         change([&](auto reply) {
           files.setTags(document, {"tag", fresh("tag")}, std::move(reply));

@@ -29,6 +29,7 @@ class FakeFiles final : public LocalFiles {
     URLReply reply;
   };
   Inbox<Transfer> transfers;
+  bool holdsRemovals = false;  // else they are answered at once
   // Kept by what counts in it, which may come when the fake is gone.
   const std::shared_ptr<Inbox<int>> cancelled = std::make_shared<Inbox<int>>();
   Inbox<int>& cancellations = *cancelled;
@@ -61,9 +62,16 @@ class FakeFiles final : public LocalFiles {
          {path(what), path(folder), newName.value_or("nil"), bounce ? "bounce" : "plain", origin});
     reply(url, error);
   }
-  void remove(NSURLPtr what, RequestOrigin origin, Reply<NSErrorPtr> reply) override {
+  std::shared_ptr<NSProgress> remove(NSURLPtr what, RequestOrigin origin,
+                                     Reply<NSErrorPtr> reply) override {
     note("remove", {path(what), origin});
-    reply(error);
+    if (!holdsRemovals) {
+      reply(error);
+      return NSProgress::progressWithTotalUnitCount(0);
+    }
+    return begin([reply = std::move(reply)](const NSURLPtr&, NSErrorPtr problem) mutable {
+      reply(std::move(problem));
+    });
   }
   void trash(NSURLPtr what, RequestOrigin origin, URLReply reply) override {
     note("trash", {path(what), origin});

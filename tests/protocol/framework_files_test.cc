@@ -203,6 +203,26 @@ TEST_F(FrameworkFiles, ACompletionHasTheOriginOfItsCall) {
   EXPECT_EQ(asked(), "remove /s/.a.skein inner");
 }
 
+TEST_F(FrameworkFiles, ADeletionAndItsRetryAreCancelledWithTheirRequest) {
+  fake().holdsRemovals = true;
+  Outcome<NSErrorPtr> ended;
+  const auto progress = std::make_shared<RequestProgress>();
+  {
+    const RequestProgressScope scope(progress);
+    operations().fp_deleteWithCompletionHandler(
+        at("/s/a"), [reply = ended.reply(), this](const NSErrorPtr&) mutable {
+          operations().fp_deleteWithCompletionHandler(at("/s/.a.skein"), std::move(reply));
+        });
+  }
+  begun().reply(nullptr, NSError::errorWithDomain(NSCocoaErrorDomain, NSFileNoSuchFileError));
+  FakeFiles::Transfer retry = begun();
+  progress->cancel();
+  fake().cancellations.take();
+  EXPECT_TRUE(retry.progress->isCancelled());
+  retry.reply(nullptr, NSError::errorWithDomain(NSCocoaErrorDomain, NSUserCancelledError));
+  EXPECT_EQ(std::get<0>(ended.value())->code(), NSUserCancelledError);
+}
+
 TEST_F(FrameworkFiles, WithoutAConnectionEachCallerIsAnsweredOnce) {
   fake().url = at("/s/new");
   Outcome<NSURLPtr, NSErrorPtr> imported;

@@ -261,6 +261,106 @@ TEST(Trash, BelievesNoInfoThatLeadsOut) {
   EXPECT_EQ(parseTrashInfo("Path=a\n"), std::nullopt);
 }
 
+// What a removal is asked with, and what it left to delete.
+struct Removal {
+  FileRequest request = {"me", {}, {}};
+  Task deletion;
+
+  Removal() {
+    request.deleteLater = [this](Task task) { deletion = std::move(task); };
+  }
+};
+
+TEST(Removal, IsTakenBackUntilItIsAnswered) {
+  TestDrive drive;
+  FileOperations& files = drive.open();
+  drive.write("folder/sub/deep", "deep");
+  drive.write("letter", "dear");
+  const auto before = drive.snapshot(true);
+  const auto isWhole = [&] {
+    EXPECT_TRUE(std::filesystem::is_empty(drive.state + "/staging"));
+    EXPECT_TRUE(files.journal().openEntries(nullptr).empty());
+    return drive.snapshot(true) == before;
+  };
+  for (const char* name : {"folder", "letter"}) {
+    Removal early;
+    early.request.progress = [](const FileProgress&) { return false; };
+    early.request.removed = [&] { return drive.exists(name); };
+    if (name == std::string("folder")) {
+      EXPECT_EQ(codeOf(files.remove(drive.at(name), early.request).error), NSUserCancelledError);
+      EXPECT_TRUE(isWhole());
+    }
+    Removal late;
+    late.request.removed = [&] {
+      EXPECT_FALSE(drive.exists(name));
+      return false;
+    };
+    const FileResult result = files.remove(drive.at(name), late.request);
+    EXPECT_EQ(codeOf(result.error), NSUserCancelledError);
+    EXPECT_EQ(result.path, "");
+    EXPECT_FALSE(late.deletion);
+    EXPECT_TRUE(isWhole());
+    EXPECT_EQ(files.journal().historyOfPath(drive.at(name), 1, nullptr).at(0).state,
+              OperationState::Undone);
+  }
+
+  // Another program takes the name meanwhile.
+  Removal taken;
+  taken.request.removed = [&] {
+    drive.write("folder", "other");
+    return false;
+  };
+  const FileResult result = files.remove(drive.at("folder"), taken.request);
+  EXPECT_EQ(codeOf(result.error), NSUserCancelledError);
+  EXPECT_EQ(result.path, drive.at("folder 2"));
+  EXPECT_EQ(TestDrive::get(drive.at("folder")), "other");
+  EXPECT_EQ(TestDrive::get(drive.at("folder 2/sub/deep")), "deep");
+}
+
+TEST(Removal, DeletesATreeAfterTheAnswerOrAtTheNextStart) {
+  for (const bool isRun : {true, false}) {
+    TestDrive drive;
+    FileOperations& files = drive.open();
+    drive.write("folder/sub/deep", "deep");
+    Removal removal;
+    EXPECT_EQ(files.remove(drive.at("folder"), removal.request).error, nullptr);
+    EXPECT_FALSE(drive.exists("folder"));
+    EXPECT_FALSE(std::filesystem::is_empty(drive.state + "/staging"));
+    ASSERT_TRUE(removal.deletion);
+    // The name is free at once.
+    EXPECT_EQ(files.createFolder(drive.store, "folder", kRequest).error, nullptr);
+    if (isRun) removal.deletion();
+    removal.deletion = nullptr;
+    EXPECT_EQ(files.journal().openEntries(nullptr).empty(), isRun);
+    if (!isRun) drive.open();
+    EXPECT_TRUE(std::filesystem::is_empty(drive.state + "/staging"));
+    EXPECT_TRUE(drive.operations->journal().openEntries(nullptr).empty());
+    EXPECT_TRUE(drive.exists("folder"));
+  }
+}
+
+TEST(Removal, ThatIsCancelledIsWholeAtAnyFailure) {
+  bool met = true;
+  for (std::uint64_t step = 1; met; ++step) {
+    ASSERT_LT(step, 50u);
+    TestDrive drive;
+    FileOperations& files = drive.open();
+    drive.write("folder/sub/deep", "deep");
+    const auto before = drive.snapshot(true);
+    Removal removal;
+    removal.request.removed = [] { return false; };
+    drive.files.failAt(step, EIO);
+    const NSErrorPtr error = files.remove(drive.at("folder"), removal.request).error;
+    met = drive.files.met();
+    // What cannot be put back is removed, and said to be.
+    EXPECT_EQ(drive.snapshot(true) == before, error != nullptr) << step;
+    EXPECT_EQ(removal.deletion.operator bool(), error == nullptr) << step;
+    drive.files.failAt(0, 0);
+    drive.open();
+    EXPECT_EQ(drive.exists("folder"), error != nullptr) << step;
+  }
+}
+
 TEST(Provenance, TellsWhoseRequestRemovedAPathAndIsBounded) {
   TestDrive drive;
   FileOperations& files = drive.open();

@@ -8,6 +8,7 @@
 #include <string>
 #include <vector>
 
+#include "base/Executor.h"
 #include "linux/vald/files/FileCoordinator.h"
 #include "linux/vald/files/FileLayer.h"
 #include "linux/vald/files/OperationJournal.h"
@@ -36,10 +37,16 @@ struct FileOperationsOptions {
 struct FileRequest {
   std::string origin;            // in words, such as "skein trash (process 4711)"
   std::string document;          // the item's persistent identifier, where it is known
-  FileProgressHandler progress;  // importing alone
+  FileProgressHandler progress;  // importing and removing: how far it is, and whether to go on
   // Renaming and moving alone: called when the item is at `path`, while the disk is yet to be
   // written; when that fails, it is taken back after this call.
   std::function<void(const std::string& path)> moved = {};
+  // Removing alone: called when the item is out of sight, and nothing of it is deleted yet.
+  // False: it is put back.
+  std::function<bool()> removed = {};
+  // Removing alone: is given what deletes a removed folder, to be run after the answer; what
+  // never runs is done by the next start. Null: it is deleted before remove() returns.
+  std::function<void(Task)> deleteLater = {};
 };
 
 // Where the item is now, or why it is where it was.
@@ -94,7 +101,8 @@ class FileOperations {
   FileResult move(const std::string& path, const std::string& folder,
                   const std::optional<std::string>& newName, bool bounce,
                   const FileRequest& request);
-  // Removes a file or tree for good. Answers without a path.
+  // Removes a file or tree for good. Answers without a path; when it was cancelled and the name
+  // is taken by then, with the path that the item has now.
   FileResult remove(const std::string& path, const FileRequest& request);
   // To the trash at the item's root; the answer is its path in there.
   FileResult trash(const std::string& path, const FileRequest& request);
@@ -156,7 +164,9 @@ class FileOperations {
                            const StorePlace& place, const FileRequest& request, bool& again);
   // Deletes what an import left; what stays is the next start's.
   void discardStaged(const StagingPlace& staged, OperationScope& scope);
-  NSErrorPtr removeAside(const StorePlace& place, const FileRequest& request, bool& again);
+  FileResult removeAside(const StorePlace& place, const FileRequest& request, bool& again);
+  // Back to its name, or to the next one that is free. 0 or an errno.
+  int putBackRemoved(const StagingPlace& aside, const StorePlace& place, std::string& name);
 
   FileResult moveTo(const StorePlace& from, const std::string& folder, const std::string& name,
                     bool bounce, OperationKind kind, const FileRequest& request);

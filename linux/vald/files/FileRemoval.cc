@@ -9,58 +9,100 @@
 
 namespace skein::vald {
 
+namespace {
+
+constexpr unsigned kMostNames = 1000;
+
+FileResult cancelledRemoval(const StorePlace& place, const std::string& name) {
+  if (name == place.name) return {{}, fileError(ECANCELED, "can't remove", place.path())};
+  const std::string now = joinPath(place.folderPath(), name);
+  return {now, fileErrorWithWords(NSUserCancelledError, ECANCELED,
+                                  "the removal was cancelled; another item has the name now, so "
+                                  "this one is \"" +
+                                      printable(now) + "\"",
+                                  now)};
+}
+
+}  // namespace
+
 FileResult FileOperations::remove(const std::string& path, const FileRequest& request) {
   StorePlace place;
   Hold hold;
   if (NSErrorPtr error = take(path, {path}, place, hold)) return {{}, error};
-  if (NSErrorPtr error = obstacleToRemoval(place.folder, place.name, place.path())) {
+  const auto goesOn = [&] { return !request.progress || request.progress({}); };
+  if (NSErrorPtr error = obstacleToRemoval(place.folder, place.name, place.path(), goesOn)) {
     return {{}, error};
   }
   bool again = false;
-  NSErrorPtr error = removeAside(place, request, again);
-  if (again) error = removeAside(place, request, again);
-  return {{}, error};
+  FileResult result = removeAside(place, request, again);
+  if (again) result = removeAside(place, request, again);
+  return result;
 }
 
-NSErrorPtr FileOperations::removeAside(const StorePlace& place, const FileRequest& request,
+FileResult FileOperations::removeAside(const StorePlace& place, const FileRequest& request,
                                        bool& again) {
   again = false;
   const std::string path = place.path();
-  StagingPlace aside;
-  if (NSErrorPtr error = _staging.place(kRemovalPrefix, place, aside)) return error;
-  OperationScope scope(*_journal, OperationKind::Remove, request, path, {}, aside.path);
-  if (NSErrorPtr error = scope.begin()) return error;
+  struct stat status {};
+  const bool isFolder = place.folder.status(place.name, status) == 0 && S_ISDIR(status.st_mode);
+  const auto aside = std::make_shared<StagingPlace>();
+  if (NSErrorPtr error = _staging.place(kRemovalPrefix, place, *aside)) return {{}, error};
+  const auto scope = std::make_shared<OperationScope>(*_journal, OperationKind::Remove, request,
+                                                      path, std::string(), aside->path);
+  if (NSErrorPtr error = scope->begin()) return {{}, error};
 
-  int failure =
-      _files.renameWithoutReplacing(place.folder.get(), place.name, aside.folder.get(), aside.name);
-  if (failure == EXDEV && aside.outside) {
+  int failure = _files.renameWithoutReplacing(place.folder.get(), place.name, aside->folder.get(),
+                                              aside->name);
+  if (failure == EXDEV && aside->outside) {
     _staging.refuseOutside(place);
-    scope.discard();
+    scope->discard();
     again = true;
-    return fileError(failure, "can't remove", path);
+    return {{}, fileError(failure, "can't remove", path)};
   }
+  std::string name;
   // Gone for good before the first part of it is deleted: a power cut shall not bring
   // half a tree back.
-  if (failure == 0 && (failure = syncFolders(place.folder, &aside.folder)) != 0) {
-    if (_files.renameWithoutReplacing(aside.folder.get(), aside.name, place.folder.get(),
-                                      place.name) != 0) {
-      scope.leaveOpen();
-    }
+  if (failure == 0 && (failure = syncFolders(place.folder, &aside->folder)) != 0) {
+    if (putBackRemoved(*aside, place, name) != 0) scope->leaveOpen();
   }
-  if (failure != 0) return fileError(failure, "can't remove", path);
+  if (failure != 0) return {{}, fileError(failure, "can't remove", path)};
+  if (request.removed && !request.removed()) {
+    failure = putBackRemoved(*aside, place, name);
+    if (failure == 0) return cancelledRemoval(place, name);
+    VL_ERROR(_log, "[ERROR] can't put %@ back (%@), so it is removed", path,
+             std::generic_category().message(failure));
+  }
 
   // From here on it is removed; what cannot be deleted now is deleted at the next start.
-  failure = removeTree(_files, aside.folder, aside.name);
-  if (const int forgetting = removeTrashInfo(place)) failure = forgetting;
-  if (failure != 0) {
+  scope->leaveOpen();
+  const int forgetting = removeTrashInfo(place);
+  Task rest = [this, aside, scope, path, forgetting] {
+    int problem = removeTree(_files, aside->folder, aside->name);
+    if (problem == 0) problem = forgetting;
+    if (problem == 0) return scope->done();
     VL_ERROR(_log,
              "[ERROR] removed %@, but can't delete all of %@ (%@); the next start tries again",
-             path, aside.path, std::generic_category().message(failure));
-    scope.leaveOpen();
-    return nullptr;
+             path, aside->path, std::generic_category().message(problem));
+  };
+  if (isFolder && request.deleteLater) {
+    request.deleteLater(std::move(rest));
+  } else {
+    rest();
   }
-  scope.done();
-  return nullptr;
+  return {};
+}
+
+int FileOperations::putBackRemoved(const StagingPlace& aside, const StorePlace& place,
+                                   std::string& name) {
+  int failure = EEXIST;
+  for (unsigned number = 1; failure == EEXIST && number <= kMostNames; ++number) {
+    name = numberedName(place.name, number, ' ');
+    failure =
+        _files.renameWithoutReplacing(aside.folder.get(), aside.name, place.folder.get(), name);
+  }
+  // A disk that refuses this one may forget the put back in a power cut; it is made all the same.
+  if (failure == 0) syncFolders(place.folder, &aside.folder);
+  return failure;
 }
 
 }  // namespace skein::vald

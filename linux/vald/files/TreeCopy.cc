@@ -49,7 +49,9 @@ NSErrorPtr TreeCopy::measure(const DirectoryHandle& folder, const std::string& n
   if (const int failure = folder.status(name, status)) {
     return fileError(failure, "can't read", path);
   }
-  ++_state.totalItems;
+  if (++_state.totalItems % kTellItems == 0 && _progress && !_progress({})) {
+    return fileError(ECANCELED, "can't bring in", path);
+  }
   if (S_ISREG(status.st_mode)) _state.totalBytes += static_cast<std::uint64_t>(status.st_size);
   if (S_ISREG(status.st_mode) || S_ISLNK(status.st_mode)) return nullptr;
   if (!S_ISDIR(status.st_mode)) {
@@ -223,8 +225,9 @@ int TreeCopy::copyAttributes(int from, int to) {
 
 NSErrorPtr TreeCopy::sync(const DirectoryHandle& to, const std::string& newName,
                           const std::string& path) {
-  const int failure =
-      _state.totalItems > kFewItems ? _files.syncAll(to.get()) : syncTree(to, newName);
+  int failure = _state.totalItems > kFewItems ? _files.syncAll(to.get()) : syncTree(to, newName);
+  // The disk may have taken its time.
+  if (failure == 0 && _progress && !_progress(_state)) failure = ECANCELED;
   return failure == 0 ? nullptr : fileError(failure, "can't bring in", path);
 }
 

@@ -37,7 +37,8 @@ class TreeCopy {
   // After measure(). On an error a part may have been made; the caller removes it.
   NSErrorPtr copy(const DirectoryHandle& from, const std::string& name, const std::string& path,
                   const DirectoryHandle& to, const std::string& newName);
-  // Puts the copy on the disk: a few files each by itself, many all at once.
+  // Puts the copy on the disk: a few files each by itself, many all at once. The last that can be
+  // cancelled.
   NSErrorPtr sync(const DirectoryHandle& to, const std::string& newName, const std::string& path);
 
  private:

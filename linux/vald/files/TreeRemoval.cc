@@ -12,11 +12,12 @@
 namespace skein::vald {
 
 NSErrorPtr obstacleToRemoval(const DirectoryHandle& folder, const std::string& name,
-                             const std::string& path) {
+                             const std::string& path, const std::function<bool()>& goesOn) {
   const char* const doing = "can't remove";
   struct stat status {};
   if (const int failure = folder.status(name, status)) return fileError(failure, doing, path);
   if (!S_ISDIR(status.st_mode)) return nullptr;
+  if (!goesOn()) return fileError(ECANCELED, doing, path);
   if (folder.mountOf(name) != folder.mountOf()) return fileError(EBUSY, doing, path);
   DirectoryHandle below;
   if (const int failure = folder.openFolder(name, below)) return fileError(failure, doing, path);
@@ -26,7 +27,7 @@ NSErrorPtr obstacleToRemoval(const DirectoryHandle& folder, const std::string& n
     empty = false;
     struct stat childStatus {};
     if (below.status(child, childStatus) == 0 && S_ISDIR(childStatus.st_mode)) {
-      error = obstacleToRemoval(below, child, joinPath(path, child));
+      error = obstacleToRemoval(below, child, joinPath(path, child), goesOn);
     }
     return error == nullptr;
   });
