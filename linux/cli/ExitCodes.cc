@@ -83,6 +83,8 @@ constexpr Meaning kMeanings[] = {
      "the drive's processes cannot be reached", kTryAgain},
     {NSPOSIXErrorDomain, EACCES, kRefused, "permission denied", kPermissions},
     {NSPOSIXErrorDomain, EBUSY, kRefused, "it is in use just now", "try again when that is over"},
+    {NSPOSIXErrorDomain, ETXTBSY, kRefused, "another program is writing to it",
+     "try again when that is over"},
     {"SkeinEvictionErrorDomain", kAnyCode, kRefused, "it was not evicted",
      "see its state with: skein stat"},
 };

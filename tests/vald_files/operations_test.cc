@@ -1,4 +1,7 @@
 // What each operation does, refuses, and remembers.
+#include <sys/xattr.h>
+
+#include "linux/vald/files/AccessList.h"
 #include "linux/vald/files/TrashInfo.h"
 #include "tests/vald_files/FilesFixture.h"
 
@@ -259,6 +262,106 @@ TEST(Trash, BelievesNoInfoThatLeadsOut) {
   EXPECT_EQ(origin(std::string("b\0c", 3)), "");
   EXPECT_EQ(origin("b%2"), "");
   EXPECT_EQ(parseTrashInfo("Path=a\n"), std::nullopt);
+}
+
+TEST(Import, RefusesWhatIsBeingWritten) {
+  TestDrive drive;
+  FileOperations& files = drive.open();
+  const std::string source = drive.outside + "/saved";
+  TestDrive::put(source, std::string(40 << 20, 's'));
+  const auto import = [&](const FileRequest& request) {
+    const NSErrorPtr error = files.importDocument(source, drive.store, {}, request).error;
+    EXPECT_TRUE(std::filesystem::is_empty(drive.state + "/staging"));
+    EXPECT_EQ(drive.exists("saved"), !error);
+    return error;
+  };
+  FileDescriptor writer(::open(source.c_str(), O_WRONLY | O_CLOEXEC));
+  EXPECT_EQ(posixOf(import(kRequest)), ETXTBSY);
+  writer.reset();
+
+  // Somebody opens it to write, which waits for us; without waiting, that is refused.
+  FileRequest request = kRequest;
+  bool isFirst = true;
+  request.progress = [&](const FileProgress& state) {
+    if (state.doneBytes > 0 && std::exchange(isFirst, false)) {
+      EXPECT_LT(::open(source.c_str(), O_WRONLY | O_NONBLOCK | O_CLOEXEC), 0);
+    }
+    return true;
+  };
+  const NSErrorPtr disturbed = import(request);
+  // A copy by reference is whole before anybody can come.
+  if (disturbed) EXPECT_EQ(posixOf(disturbed), ETXTBSY);
+  if (disturbed) EXPECT_EQ(import(kRequest), nullptr);
+}
+
+// An access list: "system.posix_acl_access" of what a named user, and not the group, may read.
+std::string readableByAnother() {
+  const std::pair<char, char> entries[] = {{1, 6}, {2, 4}, {4, 0}, {16, 4}, {32, 0}};
+  std::string list("\2\0\0\0", 4);
+  for (const auto& [tag, permissions] : entries) {
+    list += {tag, 0, permissions, 0};
+    list += tag == 2 ? std::string("\x39\x30\0\0", 4) : std::string("\xff\xff\xff\xff");
+  }
+  return list;
+}
+
+TEST(Import, KeepsAccessListsOrGivesNoMoreThanTheyDo) {
+  TestDrive drive;
+  FileOperations& files = drive.open();
+  const std::string source = drive.outside + "/private";
+  const char* const name = "system.posix_acl_access";
+  const std::string list = readableByAnother();
+  TestDrive::put(source, "private");
+  if (::setxattr(source.c_str(), name, list.data(), list.size(), 0) != 0) {
+    GTEST_SKIP() << "this file system has no access lists";
+  }
+  ASSERT_EQ(files.importDocument(source, drive.store, {}, kRequest).error, nullptr);
+  char kept[256];
+  const ssize_t size = ::getxattr(drive.at("private").c_str(), name, kept, sizeof kept);
+  ASSERT_EQ(size, static_cast<ssize_t>(list.size()));
+  EXPECT_EQ(std::string(kept, list.size()), list);
+
+  // The lists of a drive that has none: the group's bits are the group's, not the mask.
+  AccessList known(list);
+  EXPECT_EQ(known.groupPermissions(), 0u);
+  std::string wide = list;
+  wide[4 + 2 * 8 + 2] = 7;
+  AccessList limited(wide);
+  EXPECT_EQ(limited.groupPermissions(), 4u);
+  limited.limitGroup(2);
+  EXPECT_EQ(limited.groupPermissions(), 0u);
+  EXPECT_TRUE(AccessList("no list").isEmpty());
+  // A step before the mode is set fails as on a file system without lists.
+  std::filesystem::remove(drive.at("private"));
+  bool isMet = false;
+  for (std::uint64_t step = 1; !isMet && step < 50; ++step) {
+    drive.files.failAt(step, ENOTSUP);
+    if (files.importDocument(source, drive.store, {}, kRequest).error) continue;
+    struct stat status {};
+    ASSERT_EQ(::stat(drive.at("private").c_str(), &status), 0);
+    EXPECT_EQ(status.st_mode & 0077,
+              ::getxattr(drive.at("private").c_str(), name, nullptr, 0) < 0 ? 0u : 040u);
+    isMet = ::getxattr(drive.at("private").c_str(), name, nullptr, 0) < 0;
+    std::filesystem::remove(drive.at("private"));
+  }
+  EXPECT_TRUE(isMet);
+}
+
+TEST(Import, KeepsMoreAttributesThanFitInAPage) {
+  TestDrive drive;
+  FileOperations& files = drive.open();
+  const std::string source = drive.outside + "/many";
+  TestDrive::put(source, "x");
+  unsigned made = 0;
+  const auto name = [](unsigned number) {
+    return "user." + std::string(200, 'n') + std::to_string(number);
+  };
+  while (made < 30 && ::setxattr(source.c_str(), name(made).c_str(), "v", 1, 0) == 0) ++made;
+  if (made < 30) GTEST_SKIP() << "this file system keeps " << made << " of them";
+  ASSERT_EQ(files.importDocument(source, drive.store, {}, kRequest).error, nullptr);
+  for (unsigned number = 0; number < made; ++number) {
+    EXPECT_EQ(::getxattr(drive.at("many").c_str(), name(number).c_str(), nullptr, 0), 1) << number;
+  }
 }
 
 // What a removal is asked with, and what it left to delete.

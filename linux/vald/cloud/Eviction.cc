@@ -10,8 +10,8 @@
 #include "linux/vald/cloud/CloudErrors.h"
 #include "linux/vald/cloud/CloudRecovery.h"
 #include "linux/vald/cloud/FileAttributes.h"
-#include "linux/vald/cloud/FileLease.h"
 #include "linux/vald/files/FileErrors.h"
+#include "linux/vald/files/FileLease.h"
 
 namespace skein::vald {
 namespace {

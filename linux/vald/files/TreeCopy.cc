@@ -8,6 +8,7 @@
 #include <cerrno>
 #include <string_view>
 
+#include "linux/vald/files/AccessList.h"
 #include "linux/vald/files/FileErrors.h"
 #include "linux/vald/files/FileNames.h"
 
@@ -23,6 +24,27 @@ constexpr std::uint64_t kTellBytes = std::uint64_t{8} << 20;
 constexpr std::uint64_t kFewItems = 32;
 // Says which document a file is; a copy is another document.
 constexpr std::string_view kOwnAttributes = "user.skein.";
+constexpr char kAccessList[] = "system.posix_acl_access";
+constexpr char kDefaultList[] = "system.posix_acl_default";
+
+constexpr std::size_t kLargestAttribute = 65536;  // the system's limit, of the list as well
+
+std::string attributeOf(int file, const char* name) {
+  std::string value(kLargestAttribute, '\0');
+  const ssize_t size = ::fgetxattr(file, name, value.data(), value.size());
+  value.resize(size > 0 ? static_cast<std::size_t>(size) : 0);
+  return value;
+}
+
+bool isSame(const timespec& one, const timespec& other) {
+  return one.tv_sec == other.tv_sec && one.tv_nsec == other.tv_nsec;
+}
+
+bool isUnchanged(int file, const struct stat& before) {
+  struct stat now {};
+  return ::fstat(file, &now) == 0 && now.st_size == before.st_size &&
+         isSame(now.st_mtim, before.st_mtim) && isSame(now.st_ctim, before.st_ctim);
+}
 
 bool saysImpossible(int number) {
   return number == EOPNOTSUPP || number == ENOTTY || number == EXDEV || number == EINVAL ||
@@ -92,14 +114,22 @@ NSErrorPtr TreeCopy::copyFile(const DirectoryHandle& from, const std::string& na
                               const std::string& path, const DirectoryHandle& to,
                               const std::string& newName) {
   FileDescriptor source;
+  FileLease lease;  // after the file, so that it is given up first
   FileDescriptor made;
   struct stat status {};
   int failure = from.openFile(name, source);
+  if (failure == 0) {
+    const int refusal = lease.take(source.get());
+    if (refusal == EAGAIN) failure = ETXTBSY;
+    if (refusal == 0) _lease = &lease;
+  }
   if (failure == 0 && ::fstat(source.get(), &status) != 0) failure = errno;
   if (failure == 0) failure = _files.createFile(to.get(), newName, 0600, made);
   if (failure == 0) failure = copyContents(source.get(), made.get(), status);
   if (failure == 0) failure = copyAttributes(source.get(), made.get());
-  if (failure == 0) failure = _files.setMode(made.get(), (status.st_mode & 0777) | 0400);
+  if (failure == 0 && !isUnchanged(source.get(), status)) failure = ETXTBSY;
+  _lease = nullptr;
+  if (failure == 0) failure = copyAccess(source.get(), made.get(), status, 0400);
   const timespec times[2] = {status.st_atim, status.st_mtim};
   if (failure == 0) failure = _files.setTimes(made.get(), {}, times);
   if (failure == 0) failure = advance(1, 0);
@@ -123,7 +153,7 @@ NSErrorPtr TreeCopy::copyFolder(const DirectoryHandle& from, const std::string& 
   if (error) return error;
   if (failure == 0) failure = copyAttributes(source.get(), made.get());
   // Also from a read-only medium the owner gets a folder that can be filled and moved.
-  if (failure == 0) failure = _files.setMode(made.get(), (status.st_mode & 0777) | 0700);
+  if (failure == 0) failure = copyAccess(source.get(), made.get(), status, 0700);
   const timespec times[2] = {status.st_atim, status.st_mtim};
   if (failure == 0) failure = _files.setTimes(made.get(), {}, times);
   if (failure == 0) failure = advance(1, 0);
@@ -176,6 +206,7 @@ int TreeCopy::copyRange(int from, int to, std::int64_t offset, std::int64_t end,
     if (const int stop = advance(0, copied)) return stop;
     // A file of the size it was said to have needs no other call to find its end.
     if (offset == end) return 0;
+    if (isDisturbed()) return ETXTBSY;
   }
   return reads ? copyByReading(from, to, offset, end, untilEnd) : 0;
 }
@@ -197,30 +228,60 @@ int TreeCopy::copyByReading(int from, int to, std::int64_t offset, std::int64_t 
     }
     offset += got;
     if (const int stop = advance(0, count)) return stop;
+    if (offset != end && isDisturbed()) return ETXTBSY;
   }
   return 0;
 }
 
 int TreeCopy::copyAttributes(int from, int to) {
-  char names[4096];
-  const ssize_t length = ::flistxattr(from, names, sizeof(names));
+  std::string names(kLargestAttribute, '\0');
+  const ssize_t length = ::flistxattr(from, names.data(), names.size());
   if (length < 0 && errno != ENOTSUP && errno != ENOSYS) return errno;
-  const std::string_view all(names, length > 0 ? static_cast<std::size_t>(length) : 0);
-  for (std::size_t at = 0; at < all.size();) {
-    const std::string name(all.data() + at);
+  names.resize(length > 0 ? static_cast<std::size_t>(length) : 0);
+  for (std::size_t at = 0; at < names.size();) {
+    const std::string name(names.c_str() + at);
     at += name.size() + 1;
     if (!name.starts_with("user.") || name.starts_with(kOwnAttributes)) continue;
-    const ssize_t size = ::fgetxattr(from, name.c_str(), nullptr, 0);
+    std::string value(kLargestAttribute, '\0');
+    const ssize_t size = ::fgetxattr(from, name.c_str(), value.data(), value.size());
     if (size < 0) continue;  // gone meanwhile, or not ours to read
-    std::string value(static_cast<std::size_t>(size), '\0');
-    const ssize_t got = ::fgetxattr(from, name.c_str(), value.data(), value.size());
-    if (got < 0) continue;
-    value.resize(static_cast<std::size_t>(got));
+    value.resize(static_cast<std::size_t>(size));
     const int failure = _files.setAttribute(descriptorPath(to), name, value);
     // A file system without attributes takes the contents all the same.
     if (failure != 0 && failure != ENOTSUP && failure != EPERM) return failure;
   }
   return 0;
+}
+
+int TreeCopy::copyAccess(int from, int to, const struct stat& status, mode_t least) {
+  struct stat made {};
+  if (::fstat(to, &made) != 0) return errno;
+  mode_t mode = status.st_mode & 0777;
+  AccessList list(attributeOf(from, kAccessList));
+  int failure = made.st_gid == status.st_gid ? 0 : _files.setGroup(to, status.st_gid);
+  if (failure == EPERM || failure == EINVAL) {
+    // To another group the copy is what it is to everybody.
+    list.limitGroup(mode & 07);
+    if (list.isEmpty()) mode &= 0707 | (mode & 07) << 3;
+    failure = 0;
+  }
+  if (failure == 0) failure = copyList(to, kAccessList, list.bytes());
+  if (failure == ENOTSUP || failure == EPERM || failure == EINVAL) {
+    // Without the list the group's bits are the group's own, not the most that anybody has.
+    if (!list.isEmpty()) mode = (mode & 0707) | static_cast<mode_t>(list.groupPermissions() << 3);
+    failure = 0;
+  }
+  if (failure == 0 && S_ISDIR(status.st_mode)) {
+    failure = copyList(to, kDefaultList, attributeOf(from, kDefaultList));
+    if (failure == ENOTSUP || failure == EPERM || failure == EINVAL) failure = 0;
+  }
+  return failure != 0 ? failure : _files.setMode(to, mode | least);
+}
+
+// What a folder gives to new files by default is not what the source has.
+int TreeCopy::copyList(int to, const char* name, const std::string& list) {
+  if (!list.empty()) return _files.setAttribute(descriptorPath(to), name, list);
+  return attributeOf(to, name).empty() ? 0 : _files.removeAttribute(descriptorPath(to), name);
 }
 
 NSErrorPtr TreeCopy::sync(const DirectoryHandle& to, const std::string& newName,

@@ -7,6 +7,7 @@
 
 #include "linux/vald/files/DirectoryHandle.h"
 #include "linux/vald/files/FileLayer.h"
+#include "linux/vald/files/FileLease.h"
 #include "platform/foundation/NSError.h"
 
 namespace skein::vald {
@@ -23,8 +24,14 @@ using FileProgressHandler = std::function<bool(const FileProgress&)>;
 
 // Copies a file or a whole tree into a folder: contents by reference where the file
 // system can, else within the kernel; modification times, permissions (never set-user-id,
-// and always enough for the owner to use the copy), user attributes but this system's own,
-// links as links, holes as holes. Memory does not grow with the tree. One use; one thread.
+// and always enough for the owner to use the copy), the group and access lists, user attributes
+// but this system's own, links as links, holes as holes. Where a group or a list cannot be kept,
+// nobody may do more with the copy than with the source.
+//
+// A file that another program has open for writing is refused with ETXTBSY (files of this
+// user's own, on file systems with leases), and so is one that changed while it was read.
+//
+// Memory does not grow with the tree. One use; one thread.
 class TreeCopy {
  public:
   TreeCopy(FileLayer& files, FileProgressHandler progress)
@@ -51,6 +58,11 @@ class TreeCopy {
   int copyRange(int from, int to, std::int64_t offset, std::int64_t end, bool untilEnd);
   int copyByReading(int from, int to, std::int64_t offset, std::int64_t end, bool untilEnd);
   int copyAttributes(int from, int to);
+  // Group, access lists and mode of the source, whose status is `status`, `least` at least.
+  int copyAccess(int from, int to, const struct stat& status, mode_t least);
+  int copyList(int to, const char* name, const std::string& list);
+  // Whether another program waits to write to the file that is read.
+  bool isDisturbed() const { return _lease != nullptr && !_lease->isUndisturbed(); }
   // ECANCELED when the handler wants no more.
   int advance(std::uint64_t items, std::uint64_t bytes);
   int syncTree(const DirectoryHandle& folder, const std::string& name);
@@ -64,6 +76,7 @@ class TreeCopy {
   bool _clones = true;
   bool _copiesRanges = true;
   std::string _buffer;
+  const FileLease* _lease = nullptr;  // of the file that is read
 };
 
 }  // namespace skein::vald

@@ -1,4 +1,4 @@
-#include "linux/vald/cloud/FileLease.h"
+#include "linux/vald/files/FileLease.h"
 
 #include <fcntl.h>
 
