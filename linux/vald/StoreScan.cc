@@ -6,6 +6,7 @@
 
 #include "base/Numbers.h"
 #include "linux/vald/StoreWriter.h"
+#include "linux/vald/files/FileNames.h"
 #include "linux/vald/files/StoreRoots.h"
 #include "linux/vald/index/IndexFile.h"
 #include "linux/vald/scan/DocumentNumbers.h"
@@ -254,6 +255,15 @@ void StoreWriter::enqueue(const std::vector<FolderKey>& folders) {
     const TreeRoot* root = folder != nullptr ? _folders.rootOf(key, job.relativePath) : nullptr;
     if (root == nullptr || root->isLost) continue;
     folder->round = _round;
+    const auto separators = std::count(job.relativePath.begin(), job.relativePath.end(), '/');
+    if (static_cast<std::size_t>(separators) >= kDeepestTree) {
+      if (_unreadable.insert(key).second) {
+        VL_NOTICE(_log,
+                  "[NOTICE] what is in a folder below %@ is left out: it is more than %llu deep",
+                  folder->row.name, static_cast<unsigned long long>(kDeepestTree));
+      }
+      continue;
+    }
     job.folder = key;
     job.root = root->folder;
     job.key = folder->row.key;

@@ -73,8 +73,12 @@ const std::vector<Operation> kOperations = {
      }},
 };
 
+// Where things are staged, and what the file system can.
+enum class Setting { Plain, StagedInStore, RenameReplaces };
+
 // A store with something of each kind, and the same times in every run.
-void furnish(TestDrive& drive) {
+void furnish(TestDrive& drive, Setting setting) {
+  if (setting == Setting::RenameReplaces) drive.files.renameReplaces();
   FileOperations& files = drive.open();
   drive.write("a.txt", "document");
   drive.write("other/a.txt", "taken");
@@ -106,21 +110,22 @@ std::string otherVolume() {
   return shared.st_dev != temporary.st_dev ? "/dev/shm" : "";
 }
 
-class Matrix : public ::testing::TestWithParam<std::tuple<std::size_t, bool>> {
+class Matrix : public ::testing::TestWithParam<std::tuple<std::size_t, Setting>> {
  protected:
   void SetUp() override {
-    if (std::get<1>(GetParam())) {
+    if (setting() == Setting::StagedInStore) {
       stateBase = otherVolume();
       if (stateBase.empty()) GTEST_SKIP() << "no second volume to keep the state on";
     }
     TestDrive drive(stateBase);
-    furnish(drive);
+    furnish(drive, setting());
     before = drive.snapshot(true);
     const FileResult result = operation().run(drive);
     ASSERT_EQ(result.error, nullptr) << wordsOf(result.error);
     after = drive.snapshot(true);
     ASSERT_NE(before, after);
   }
+  static Setting setting() { return std::get<1>(GetParam()); }
   const Operation& operation() const { return kOperations[std::get<0>(GetParam())]; }
 
   // Runs `body` in a process of its own. True when it came to its end.
@@ -160,7 +165,7 @@ TEST_P(Matrix, ACrashAtAnyStepLeavesBeforeOrAfter) {
     SCOPED_TRACE("crash at step " + std::to_string(step));
     ASSERT_LT(step, 200u);
     TestDrive drive(stateBase);
-    furnish(drive);
+    furnish(drive, setting());
     drive.operations.reset();  // a database must not be open across a fork
     finished = runs([&] {
       drive.open();
@@ -198,7 +203,7 @@ TEST_P(Matrix, AFailureAtAnyStepIsClearAndLeavesBeforeOrAfter) {
                      std::to_string(step));
         ASSERT_LT(step, 200u);
         TestDrive drive(stateBase);
-        furnish(drive);
+        furnish(drive, setting());
         drive.files.failAt(step, fault.error, lasting);
         const FileResult result = operation().run(drive);
         met = drive.files.met();
@@ -226,13 +231,18 @@ TEST_P(Matrix, AFailureAtAnyStepIsClearAndLeavesBeforeOrAfter) {
   }
 }
 
+std::string nameOf(const ::testing::TestParamInfo<Matrix::ParamType>& info) {
+  constexpr const char* kEndings[] = {"", "StagedInStore", "RenameReplaces"};
+  const auto ending = static_cast<std::size_t>(std::get<1>(info.param));
+  return kOperations[std::get<0>(info.param)].name + kEndings[ending];
+}
+
 INSTANTIATE_TEST_SUITE_P(Files, Matrix,
                          ::testing::Combine(::testing::Range(std::size_t{0}, kOperations.size()),
-                                            ::testing::Bool()),
-                         [](const auto& info) {
-                           return kOperations[std::get<0>(info.param)].name +
-                                  (std::get<1>(info.param) ? "StagedInStore" : "");
-                         });
+                                            ::testing::Values(Setting::Plain,
+                                                              Setting::StagedInStore,
+                                                              Setting::RenameReplaces)),
+                         nameOf);
 
 }  // namespace
 }  // namespace skein::vald

@@ -1,8 +1,14 @@
 // What each operation does, refuses, and remembers.
+#include <sched.h>
+#include <sys/mount.h>
+#include <sys/wait.h>
 #include <sys/xattr.h>
+
+#include <functional>
 
 #include "linux/vald/files/AccessList.h"
 #include "linux/vald/files/TrashInfo.h"
+#include "linux/vald/files/TreeRemoval.h"
 #include "tests/vald_files/FilesFixture.h"
 
 namespace skein::vald {
@@ -14,15 +20,18 @@ TEST(Names, RefuseWhatCannotBeAndNumberWithinTheLimit) {
   for (const std::string& name :
        {std::string(), std::string("."), std::string(".."), std::string("a/b"),
         std::string("a\0b", 3), std::string(256, 'x'), std::string(".skein-import-1"),
-        std::string(".skein-removed-1")}) {
+        std::string(".skein-removed-1"), std::string(".n.skein-part"), std::string(".n.skein-new"),
+        std::string(".n.skein-old"), std::string(".Trash-1000")}) {
     const NSErrorPtr refusal = refusalOfName(name, false);
     EXPECT_EQ(codeOf(refusal), NSFileWriteInvalidFileNameError) << printable(name);
     EXPECT_FALSE(wordsOf(refusal).empty());
   }
   EXPECT_EQ(refusalOfName(std::string(255, 'x'), true), nullptr);
   EXPECT_EQ(refusalOfName("...", true), nullptr);
-  EXPECT_EQ(refusalOfName(".Trash-1000", false), nullptr);
-  EXPECT_NE(refusalOfName(".Trash-1000", true), nullptr);
+  for (const char* name : {".n.skein", ".skein-old", "n.skein-old", ".Trash-1000x", ".Trash-"}) {
+    EXPECT_EQ(refusalOfName(name, true), nullptr) << name;
+  }
+  EXPECT_EQ(refusalOfName(".Trash", false), nullptr);
   EXPECT_NE(refusalOfName(".Trash", true), nullptr);
   EXPECT_EQ(refusalOfName(".Trash-mine", true), nullptr);
 
@@ -462,6 +471,86 @@ TEST(Removal, ThatIsCancelledIsWholeAtAnyFailure) {
     drive.open();
     EXPECT_EQ(drive.exists("folder"), error != nullptr) << step;
   }
+}
+
+TEST(Removal, AndRefusingAnImportWorkHoweverDeepATreeIs) {
+  TestDrive drive;
+  FileOperations& files = drive.open();
+  drive.makeFolder("deep");
+  for (const std::string& top : {drive.at("deep"), drive.outside}) {
+    DirectoryHandle folder;
+    ASSERT_EQ(DirectoryHandle::openRoot(top, folder), 0);
+    for (int level = 0; level < 5000; ++level) {
+      ASSERT_EQ(::mkdirat(folder.get(), "d", 0700), 0);
+      DirectoryHandle below;
+      ASSERT_EQ(folder.openFolder("d", below), 0);
+      folder = std::move(below);
+    }
+    ASSERT_EQ(::mkdirat(folder.get(), "last", 0700), 0);
+  }
+  const NSErrorPtr refusal =
+      files.importDocument(drive.outside + "/d", drive.store, {}, kRequest).error;
+  EXPECT_NE(wordsOf(refusal).find("more than 1000 folders deep"), std::string::npos)
+      << wordsOf(refusal);
+  EXPECT_FALSE(drive.exists("d"));
+  EXPECT_EQ(files.remove(drive.at("deep"), kRequest).error, nullptr);
+  EXPECT_FALSE(drive.exists("deep"));
+  EXPECT_TRUE(std::filesystem::is_empty(drive.state + "/staging"));
+  DirectoryHandle outside;
+  ASSERT_EQ(DirectoryHandle::openRoot(drive.outside, outside), 0);
+  EXPECT_EQ(removeTree(drive.files, outside, "d"), 0);
+}
+
+// On a small volume of this process's own; false where none may be mounted.
+bool onASmallVolume(const std::function<void(TestDrive&)>& body) {
+  const std::string mount = ::testing::TempDir() + "/skein-full-" + std::to_string(::getpid());
+  std::filesystem::create_directory(mount);
+  const pid_t child = ::fork();
+  if (child == 0) {
+    if (::unshare(CLONE_NEWNS) != 0 ||
+        ::mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr) != 0 ||
+        ::mount("none", mount.c_str(), "tmpfs", 0, "size=8m") != 0) {
+      ::_exit(77);
+    }
+    ::setenv("TEST_TMPDIR", mount.c_str(), 1);
+    {
+      TestDrive drive(mount);
+      body(drive);
+    }
+    ::_exit(::testing::Test::HasFailure() ? 1 : 0);
+  }
+  int status = 0;
+  EXPECT_EQ(::waitpid(child, &status, 0), child);
+  std::filesystem::remove(mount);
+  EXPECT_TRUE(WIFEXITED(status));
+  EXPECT_NE(WEXITSTATUS(status), 1);
+  return WEXITSTATUS(status) != 77;
+}
+
+TEST(Removal, WorksOnAFullDisk) {
+  const bool isMounted = onASmallVolume([](TestDrive& drive) {
+    FileOperations& files = drive.open();
+    drive.write("folder/a", std::string(100'000, 'a'));
+    // Until nothing fits any more, and the journal has used what it had at hand.
+    std::ofstream fill(drive.at("fill"), std::ios::binary);
+    while (fill << std::string(4096, 'f') << std::flush) {
+    }
+    fill.close();
+    NSErrorPtr full;
+    for (int i = 0; i < 10'000 && !full; ++i) {
+      full = files.createFolder(drive.store, "folder-" + std::to_string(i), kRequest).error;
+    }
+    EXPECT_EQ(codeOf(full), NSFileWriteOutOfSpaceError);
+    const FileResult removed = files.remove(drive.at("folder"), kRequest);
+    EXPECT_EQ(removed.error, nullptr) << wordsOf(removed.error);
+    EXPECT_FALSE(drive.exists("folder"));
+    EXPECT_EQ(files.remove(drive.at("fill"), kRequest).error, nullptr);
+    EXPECT_EQ(files.createFolder(drive.store, "folder", kRequest).error, nullptr);
+    struct stat reserve {};
+    EXPECT_EQ(::stat((drive.state + "/operations.db-reserve").c_str(), &reserve), 0);
+    EXPECT_GT(reserve.st_blocks, 0);
+  });
+  if (!isMounted) GTEST_SKIP() << "no small volume may be mounted here";
 }
 
 TEST(Provenance, TellsWhoseRequestRemovedAPathAndIsBounded) {

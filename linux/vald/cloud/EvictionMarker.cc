@@ -17,9 +17,6 @@ namespace {
 
 constexpr std::string_view kFirstLine = "skein-marker 1";
 constexpr std::string_view kSuffix = ".skein";
-constexpr std::string_view kPartSuffix = ".skein-part";
-constexpr std::string_view kFreshSuffix = ".skein-new";
-constexpr std::string_view kAsideSuffix = ".skein-old";
 constexpr std::size_t kLongestPlainName = 240;
 constexpr std::size_t kLargestMarker = 4096;
 
@@ -182,14 +179,6 @@ MarkerNames::MarkerNames(const std::string& name) {
 bool mayBeMarkerName(const std::string& name) {
   return name.size() > 1 + kSuffix.size() && name[0] == '.' && name.ends_with(kSuffix) &&
          refusalOfName(documentNameOfMarker(name), false) == nullptr;
-}
-
-bool isCloudTemporaryName(const std::string& name) {
-  const auto endsWith = [&](std::string_view suffix) {
-    return name.size() > 1 + suffix.size() && name.ends_with(suffix);
-  };
-  return !name.empty() && name[0] == '.' &&
-         (endsWith(kPartSuffix) || endsWith(kFreshSuffix) || endsWith(kAsideSuffix));
 }
 
 std::string nameOfDocument(const EvictionMarker& marker, const std::string& markerName) {

@@ -77,8 +77,6 @@ struct MarkerNames {
 
 // Whether a file of this name may be a marker: only its text says whether it is.
 bool mayBeMarkerName(const std::string& name);
-// Whether the name is that of a file on its way in or out, which is no document.
-bool isCloudTemporaryName(const std::string& name);
 // The document's name, from the marker and the name the marker has now: who renames a
 // marker renames the document.
 std::string nameOfDocument(const EvictionMarker& marker, const std::string& markerName);

@@ -67,6 +67,10 @@ int DirectoryHandle::openFolder(const std::string& relative, DirectoryHandle& fo
   return openStepwise(get(), relative, folder._folder);
 }
 
+int DirectoryHandle::openParent(DirectoryHandle& folder) const {
+  return opened(::openat(get(), "..", kFolderFlags), folder._folder);
+}
+
 int DirectoryHandle::openFile(const std::string& name, FileDescriptor& file) const {
   const int flags = O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC;
   return opened(::openat(get(), name.c_str(), flags), file);
@@ -87,6 +91,15 @@ int DirectoryHandle::status(struct stat& status) const {
 bool DirectoryHandle::exists(const std::string& name) const {
   struct stat found {};
   return status(name, found) == 0;
+}
+
+bool DirectoryHandle::lists(const std::string& name) const {
+  bool found = false;
+  const int failure = list([&](const std::string& entry) {
+    found = entry == name;
+    return !found;
+  });
+  return found || failure != 0;
 }
 
 int DirectoryHandle::readLink(const std::string& name, std::string& target) const {

@@ -24,6 +24,9 @@ class DirectoryHandle {
   // a symbolic link is in the way, ENOTDIR where a component is no folder.
   int openFolder(const std::string& relative, DirectoryHandle& folder) const;
 
+  // The folder that holds this one at the moment: whoever goes up knows which it expects.
+  int openParent(DirectoryHandle& folder) const;
+
   // An entry of this folder, for reading; never waits for a pipe's other end.
   int openFile(const std::string& name, FileDescriptor& file) const;
   // The entry itself, whatever it is: names it for descriptorPath().
@@ -33,6 +36,9 @@ class DirectoryHandle {
   int status(const std::string& name, struct stat& status) const;
   int status(struct stat& status) const;
   bool exists(const std::string& name) const;
+  // Whether it has an entry of exactly this name, by its own list: a file system that folds case
+  // answers exists() for others too. True when it cannot be read.
+  bool lists(const std::string& name) const;
   // What a symbolic link says.
   int readLink(const std::string& name, std::string& target) const;
 

@@ -2,6 +2,8 @@
 
 #include <unistd.h>
 
+#include <cerrno>
+
 namespace skein::vald {
 
 void FaultyFileLayer::failAt(std::uint64_t n, int error, bool andAllAfter) {
@@ -24,6 +26,11 @@ int FaultyFileLayer::beforeStep(FileStep, std::string_view) {
   if (at == 0 || step < at || (step > at && !_andAllAfter)) return 0;
   if (_crash) ::_exit(kCrashStatus);
   return _error;
+}
+
+int FaultyFileLayer::renameKeeping(int at, const std::string& name, int newAt,
+                                   const std::string& newName) {
+  return _renameReplaces ? EINVAL : FileLayer::renameKeeping(at, name, newAt, newName);
 }
 
 }  // namespace skein::vald

@@ -17,6 +17,9 @@ class FaultyFileLayer : public FileLayer {
   // The process ends at the n-th call, before the call is made, without any cleaning up.
   void crashAt(std::uint64_t n);
 
+  // From now on this is a file system that has no rename without replacing.
+  void renameReplaces() { _renameReplaces = true; }
+
   // Calls since the last arming.
   std::uint64_t steps() const { return _steps; }
   // Whether the armed fault was met.
@@ -26,6 +29,8 @@ class FaultyFileLayer : public FileLayer {
 
  protected:
   int beforeStep(FileStep step, std::string_view name) override;
+  int renameKeeping(int at, const std::string& name, int newAt,
+                    const std::string& newName) override;
 
  private:
   void arm(std::uint64_t n, int error, bool crash, bool andAllAfter);
@@ -35,6 +40,7 @@ class FaultyFileLayer : public FileLayer {
   std::atomic<int> _error{0};
   std::atomic<bool> _crash{false};
   std::atomic<bool> _andAllAfter{false};
+  std::atomic<bool> _renameReplaces{false};
 };
 
 }  // namespace skein::vald

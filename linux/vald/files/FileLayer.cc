@@ -36,6 +36,7 @@ std::string_view fileStepName(FileStep step) {
     case FileStep::SetGroup: return "set group";
     case FileStep::SetTimes: return "set times";
     case FileStep::MakeLink: return "make link";
+    case FileStep::Link: return "link";
     case FileStep::Rename: return "rename";
     case FileStep::Unlink: return "unlink";
     case FileStep::RemoveFolder: return "remove folder";
@@ -131,13 +132,37 @@ int FileLayer::makeLink(const std::string& target, int at, const std::string& na
 int FileLayer::renameWithoutReplacing(int at, const std::string& name, int newAt,
                                       const std::string& newName) {
   if (const int fault = beforeStep(FileStep::Rename, name)) return fault;
-  const int failure = result(
-      [&] { return ::renameat2(at, name.c_str(), newAt, newName.c_str(), RENAME_NOREPLACE); });
+  const int failure = renameKeeping(at, name, newAt, newName);
   // EINVAL also says that a folder would go below itself; plain rename says it again.
   if (failure != EINVAL && failure != ENOSYS) return failure;
   struct stat status {};
+  if (::fstatat(at, name.c_str(), &status, AT_SYMLINK_NOFOLLOW) != 0) return errno;
+  if (!S_ISDIR(status.st_mode)) {
+    const int linking = linkBeside(at, name, newAt, newName);
+    if (linking == 0) {
+      const int unlinking = unlink(at, name);
+      if (unlinking != 0) unlink(newAt, newName);
+      return unlinking;
+    }
+    if (linking != EPERM && linking != EOPNOTSUPP && linking != ENOSYS && linking != EMLINK) {
+      return linking;
+    }
+  }
+  // What comes between these two is lost where it is a file that no second name can be made of,
+  // and where it is an empty folder; nothing else can be replaced by a folder.
   if (::fstatat(newAt, newName.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0) return EEXIST;
   return result([&] { return ::renameat(at, name.c_str(), newAt, newName.c_str()); });
+}
+
+int FileLayer::renameKeeping(int at, const std::string& name, int newAt,
+                             const std::string& newName) {
+  return result(
+      [&] { return ::renameat2(at, name.c_str(), newAt, newName.c_str(), RENAME_NOREPLACE); });
+}
+
+int FileLayer::linkBeside(int at, const std::string& name, int newAt, const std::string& newName) {
+  if (const int fault = beforeStep(FileStep::Link, newName)) return fault;
+  return result([&] { return ::linkat(at, name.c_str(), newAt, newName.c_str(), 0); });
 }
 
 int FileLayer::renameOver(int at, const std::string& name, int newAt, const std::string& newName) {

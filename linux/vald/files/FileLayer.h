@@ -25,6 +25,7 @@ enum class FileStep : std::uint8_t {
   SetGroup,
   SetTimes,
   MakeLink,
+  Link,  // a second name
   Rename,
   Unlink,
   RemoveFolder,
@@ -64,7 +65,8 @@ class FileLayer {
   int setTimes(int at, const std::string& name, const timespec times[2]);
   int makeLink(const std::string& target, int at, const std::string& name);
   // Without replacing: EEXIST when `newName` is there. Where the file system cannot
-  // promise that (EINVAL), looks first and then renames.
+  // promise that (EINVAL, ENOSYS), a file gets its new name as a second one before it loses
+  // the old; a crash between leaves both. For a folder it looks first and then renames.
   int renameWithoutReplacing(int at, const std::string& name, int newAt,
                              const std::string& newName);
   // For a change of case alone, where both names are the same entry.
@@ -86,6 +88,11 @@ class FileLayer {
  protected:
   // 0 to go on, or the errno that the step fails with.
   virtual int beforeStep(FileStep, std::string_view) { return 0; }
+  // The system call that promises it.
+  virtual int renameKeeping(int at, const std::string& name, int newAt, const std::string& newName);
+
+ private:
+  int linkBeside(int at, const std::string& name, int newAt, const std::string& newName);
 };
 
 // "/proc/self/fd/N": names an open file for calls that take only paths.

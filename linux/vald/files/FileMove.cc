@@ -17,16 +17,6 @@ NSErrorPtr refused(const std::string& words, const std::string& path) {
                             "can't move \"" + printable(path) + "\": " + words, path);
 }
 
-// By the folder's own list, since a file system that folds case answers for both.
-bool hasExactName(const DirectoryHandle& folder, const std::string& name) {
-  bool found = false;
-  const int failure = folder.list([&](const std::string& entry) {
-    found = entry == name;
-    return !found;
-  });
-  return found || failure != 0;
-}
-
 }  // namespace
 
 NSErrorPtr FileOperations::refusalOfMove(const StorePlace& from, const std::string& folder,
@@ -152,7 +142,7 @@ int FileOperations::renameItem(const StorePlace& from, const StorePlace& to) {
     return failure;
   }
   const bool same = one.st_dev == two.st_dev && one.st_ino == two.st_ino;
-  if (!same || hasExactName(to.folder, to.name)) return failure;
+  if (!same || to.folder.lists(to.name)) return failure;
   return _files.renameOver(from.folder.get(), from.name, to.folder.get(), to.name);
 }
 

@@ -8,6 +8,8 @@
 namespace skein::vald {
 namespace {
 
+constexpr std::string_view kTrash = ".Trash";
+
 // Where the extension begins, its dot included; the length when there is none.
 std::size_t extensionOf(const std::string& name) {
   const std::size_t dot = name.rfind('.');
@@ -22,16 +24,26 @@ std::size_t extensionOf(const std::string& name) {
 
 }  // namespace
 
-bool isStagingName(const std::string& name) {
+bool isStagingName(std::string_view name) {
   return name.starts_with(kImportPrefix) || name.starts_with(kRemovalPrefix);
 }
 
-bool isTrashName(const std::string& name) {
-  constexpr char kTrash[] = ".Trash";
+const char* useOfReservedName(std::string_view name) {
+  if (!name.starts_with('.')) return nullptr;
+  if (isStagingName(name)) return "is used while files are brought in and removed";
+  for (const std::string_view suffix : {kPartSuffix, kFreshSuffix, kAsideSuffix}) {
+    if (name.size() > 1 + suffix.size() && name.ends_with(suffix)) {
+      return "is used while documents come from the cloud and go there";
+    }
+  }
+  return name != kTrash && isTrashName(name) ? "belongs to the trash" : nullptr;
+}
+
+bool isTrashName(std::string_view name) {
   if (name == kTrash) return true;
-  const std::string prefix = std::string(kTrash) + '-';
-  return name.starts_with(prefix) && name.size() > prefix.size() &&
-         name.find_first_not_of("0123456789", prefix.size()) == std::string::npos;
+  const std::size_t number = kTrash.size() + 1;
+  return name.starts_with(kTrash) && name.size() > number && name[number - 1] == '-' &&
+         name.find_first_not_of("0123456789", number) == std::string_view::npos;
 }
 
 std::string trashFolderName(uid_t user) { return ".Trash-" + std::to_string(user); }
@@ -48,12 +60,10 @@ NSErrorPtr refusalOfName(const std::string& name, bool atStoreRoot) {
     why = "a name must not contain a NUL byte";
   } else if (name.size() > kLongestName) {
     why = "a name has at most 255 bytes; this one has " + std::to_string(name.size());
-  } else if (isStagingName(name)) {
-    why = "names that begin with \"" +
-          std::string(name.starts_with(kImportPrefix) ? kImportPrefix : kRemovalPrefix) +
-          "\" are used while files are brought in and removed";
-  } else if (atStoreRoot && isTrashName(name)) {
-    why = "the name belongs to the trash";
+  } else if (const char* use = useOfReservedName(name)) {
+    why = std::string("it ") + use;
+  } else if (atStoreRoot && name == kTrash) {
+    why = "it belongs to the trash";
   } else {
     return nullptr;
   }

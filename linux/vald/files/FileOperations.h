@@ -192,6 +192,8 @@ class FileOperations {
 
   // Finishes or undoes; nil leaves the entry open for the next start.
   std::optional<OperationState> recoverEntry(const OperationEntry& entry);
+  // 0 or an errno.
+  int finishLinking(const OperationEntry& entry);
   std::optional<OperationState> recoverImport(const OperationEntry& entry);
   std::optional<OperationState> recoverRemoval(const OperationEntry& entry);
   std::optional<OperationState> recoverTrash(const OperationEntry& entry);

@@ -40,6 +40,11 @@ NSErrorPtr FileOperations::recover() {
 }
 
 std::optional<OperationState> FileOperations::recoverEntry(const OperationEntry& entry) {
+  if (const int failure = finishLinking(entry)) {
+    VL_ERROR(_log, "[ERROR] can't take the second name of %@ away: %@", printable(entry.path),
+             std::generic_category().message(failure));
+    return std::nullopt;
+  }
   switch (entry.kind) {
     case OperationKind::Import: return recoverImport(entry);
     case OperationKind::Remove: return recoverRemoval(entry);
@@ -55,6 +60,34 @@ std::optional<OperationState> FileOperations::recoverEntry(const OperationEntry&
                                                               : OperationState::Undone;
   }
   return std::nullopt;
+}
+
+// Where a rename had to be made of two steps, the file may have both names.
+int FileOperations::finishLinking(const OperationEntry& entry) {
+  DirectoryHandle folders[2];
+  std::string names[2];
+  struct stat found[2];
+  const bool isImport = entry.kind == OperationKind::Import;
+  const std::string* paths[2] = {isImport ? &entry.aside : &entry.path,
+                                 entry.destination.empty() ? &entry.aside : &entry.destination};
+  for (int at = 0; at < 2; ++at) {
+    StagingPlace staged;
+    StorePlace place;
+    if (paths[at] == &entry.aside) {
+      if (_staging.find(*paths[at], _roots, staged)) return 0;
+    } else if (_roots.locate(*paths[at], place)) {
+      return 0;
+    }
+    const bool isStaged = paths[at] == &entry.aside;
+    folders[at] = std::move(isStaged ? staged.folder : place.folder);
+    names[at] = isStaged ? staged.name : place.name;
+    if (names[at].empty() || folders[at].status(names[at], found[at]) != 0) return 0;
+  }
+  const bool isSame = found[0].st_dev == found[1].st_dev && found[0].st_ino == found[1].st_ino;
+  if (!isSame || S_ISDIR(found[0].st_mode) || found[0].st_nlink < 2) return 0;
+  // Not one name in two spellings.
+  if (!folders[0].lists(names[0]) || !folders[1].lists(names[1])) return 0;
+  return _files.unlink(folders[0].get(), names[0]);
 }
 
 std::optional<OperationState> FileOperations::recoverImport(const OperationEntry& entry) {

@@ -1,6 +1,8 @@
 #include "linux/vald/files/OperationJournal.h"
 
+#include <fcntl.h>
 #include <sqlite3.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
@@ -26,6 +28,8 @@ constexpr char kTables[] = R"(
 )";
 constexpr char kColumns[] = "id, kind, state, time, origin, document, path, destination, aside";
 constexpr std::int64_t kPruneEvery = 256;
+// Some entries with long paths, and the index's own note of what went.
+constexpr off_t kReserve = off_t{2} << 20;
 
 void bindText(sqlite3_stmt* statement, int at, const std::string& text) {
   sqlite3_bind_text(statement, at, text.data(), static_cast<int>(text.size()), SQLITE_TRANSIENT);
@@ -121,6 +125,9 @@ std::unique_ptr<OperationJournal> OperationJournal::open(const std::string& data
     code = journal->prepare("UPDATE operation SET state = ?1 WHERE id = ?2", journal->_setState);
   }
   if (code != SQLITE_OK) return refuse(sqlite3_errmsg(database));
+  journal->_reserve = FileDescriptor(::open((databasePath + "-reserve").c_str(),
+                                            O_WRONLY | O_CREAT | O_NOFOLLOW | O_CLOEXEC, 0600));
+  journal->takeReserve();
   return journal;
 }
 
@@ -196,26 +203,41 @@ NSErrorPtr OperationJournal::begin(OperationEntry& entry) {
   }
   entry.when = std::chrono::time_point_cast<NSDate::duration>(std::chrono::system_clock::now());
   MutexLock lock(_mutex);
+  const bool isRemoval = entry.kind == OperationKind::Remove;
+  if (!isRemoval && !_hasReserve) takeReserve();
+  int code = writeBegin(entry);
+  if ((code & 0xff) == SQLITE_FULL && isRemoval && giveReserveUp()) code = writeBegin(entry);
+  if (code != SQLITE_OK) return failure("can't write", code);
+  _unwritten.clear();
+  return nullptr;
+}
+
+int OperationJournal::writeBegin(OperationEntry& entry) {
   int code = setDurable(!isOneStep(entry.kind));
   if (code == SQLITE_OK) code = run(_beginTransaction);
-  if (code == SQLITE_OK) {
-    for (const End& end : _unwritten) {
-      if (code == SQLITE_OK) code = write(end);
-    }
-    if (code == SQLITE_OK) code = insert(entry);
-    if (code == SQLITE_OK && entry.id % kPruneEvery == 0) {
-      code = run("DELETE FROM operation WHERE state <> 0 AND id <= " +
-                 std::to_string(entry.id - static_cast<std::int64_t>(_retention)));
-    }
-    if (code == SQLITE_OK) code = run(_commit);
+  if (code != SQLITE_OK) return code;
+  for (const End& end : _unwritten) {
+    if (code == SQLITE_OK) code = write(end);
   }
-  if (code == SQLITE_OK) {
-    _unwritten.clear();
-    return nullptr;
+  if (code == SQLITE_OK) code = insert(entry);
+  if (code == SQLITE_OK && entry.id % kPruneEvery == 0) {
+    code = run("DELETE FROM operation WHERE state <> 0 AND id <= " +
+               std::to_string(entry.id - static_cast<std::int64_t>(_retention)));
   }
-  NSErrorPtr error = failure("can't write", code);
-  if (sqlite3_get_autocommit(_database) == 0) run("ROLLBACK");
-  return error;
+  if (code == SQLITE_OK) code = run(_commit);
+  if (code != SQLITE_OK && sqlite3_get_autocommit(_database) == 0) run("ROLLBACK");
+  return code;
+}
+
+void OperationJournal::takeReserve() {
+  _hasReserve = _reserve && ::posix_fallocate(_reserve.get(), 0, kReserve) == 0;
+  // What was allocated of it is for others.
+  if (!_hasReserve && _reserve) [[maybe_unused]]
+    const int failure = ::ftruncate(_reserve.get(), 0);
+}
+
+bool OperationJournal::giveReserveUp() {
+  return std::exchange(_hasReserve, false) && ::ftruncate(_reserve.get(), 0) == 0;
 }
 
 void OperationJournal::finish(End end) {

@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "base/Mutex.h"
+#include "linux/protocol/FileDescriptor.h"
 #include "linux/vald/files/FileLayer.h"
 #include "platform/foundation/NSDate.h"
 #include "platform/foundation/NSError.h"
@@ -52,7 +53,11 @@ struct OperationEntry {
 // takes several steps: what a power cut leaves of one step is whole without an entry. Its end
 // is written after the change, without waiting for the disk, since an end that a power cut
 // loses is found again by looking at the files. Ended entries stay as the provenance of
-// what went and moved, the newest `retention` of them. Any thread.
+// what went and moved, the newest `retention` of them.
+//
+// So that something can be removed from a full disk, room is kept for that beside the database
+// (`DATABASE-reserve`), given up when a removal cannot be written, and taken again when there
+// is room. Any thread.
 class OperationJournal {
  public:
   // Null with an error that names the cause. `files` outlives the journal.
@@ -95,6 +100,10 @@ class OperationJournal {
   int prepare(const std::string& sql, sqlite3_stmt*& statement) SKEIN_REQUIRES(_mutex);
   int write(const End& end) SKEIN_REQUIRES(_mutex);
   int insert(OperationEntry& entry) SKEIN_REQUIRES(_mutex);
+  // The entry as one transaction, with the ends that are not written yet. 0 or SQLite's code.
+  int writeBegin(OperationEntry& entry) SKEIN_REQUIRES(_mutex);
+  void takeReserve() SKEIN_REQUIRES(_mutex);
+  bool giveReserveUp() SKEIN_REQUIRES(_mutex);
   NSErrorPtr failure(const char* doing, int code) SKEIN_REQUIRES(_mutex);
   // What was not written yet, so that it is read as well.
   void writeEnds() SKEIN_REQUIRES(_mutex);
@@ -113,6 +122,8 @@ class OperationJournal {
   sqlite3_stmt* _setState SKEIN_GUARDED_BY(_mutex) = nullptr;
   bool _isDurable SKEIN_GUARDED_BY(_mutex) = true;  // SQLite's own beginning
   std::set<End> _unwritten SKEIN_GUARDED_BY(_mutex);
+  FileDescriptor _reserve SKEIN_GUARDED_BY(_mutex);
+  bool _hasReserve SKEIN_GUARDED_BY(_mutex) = false;
 };
 
 }  // namespace skein::vald

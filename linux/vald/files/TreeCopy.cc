@@ -11,6 +11,7 @@
 #include "linux/vald/files/AccessList.h"
 #include "linux/vald/files/FileErrors.h"
 #include "linux/vald/files/FileNames.h"
+#include "linux/vald/files/TreeWalk.h"
 
 namespace skein::vald {
 namespace {
@@ -46,6 +47,11 @@ bool isUnchanged(int file, const struct stat& before) {
          isSame(now.st_mtim, before.st_mtim) && isSame(now.st_ctim, before.st_ctim);
 }
 
+NSErrorPtr refused(const std::string& path, const std::string& why) {
+  return fileErrorWithWords(NSFileWriteUnknownError, EINVAL,
+                            "can't bring in \"" + printable(path) + "\": " + why, path);
+}
+
 bool saysImpossible(int number) {
   return number == EOPNOTSUPP || number == ENOTTY || number == EXDEV || number == EINVAL ||
          number == ENOSYS || number == EPERM;
@@ -65,54 +71,103 @@ int TreeCopy::advance(std::uint64_t items, std::uint64_t bytes) {
   return _progress(_state) ? 0 : ECANCELED;
 }
 
+class TreeCopy::Measure final : public TreeWalk {
+ public:
+  explicit Measure(TreeCopy& copy) : _copy(copy) {}
+  const NSErrorPtr& refusal() const { return _refusal; }
+
+ private:
+  int visit(const DirectoryHandle&, const std::string& name, const struct stat& status) override {
+    FileProgress& state = _copy._state;
+    if (++state.totalItems % kTellItems == 0 && _copy._progress && !_copy._progress({})) {
+      return ECANCELED;
+    }
+    // The first one's name is what the caller makes of it.
+    if (depth() > 0) _refusal = refusalOfName(name, false);
+    if (S_ISREG(status.st_mode)) {
+      state.totalBytes += static_cast<std::uint64_t>(status.st_size);
+    } else if (!S_ISLNK(status.st_mode) && !S_ISDIR(status.st_mode)) {
+      _refusal = refused(path(), "it is a device, a pipe or a socket; leave it out");
+    }
+    if (depth() > kDeepestTree) {
+      _refusal = refused(path(), "it is more than " + std::to_string(kDeepestTree) +
+                                     " folders deep; bring in its parts one by one");
+    }
+    return _refusal ? EINVAL : 0;
+  }
+
+  TreeCopy& _copy;
+  NSErrorPtr _refusal;
+};
+
 NSErrorPtr TreeCopy::measure(const DirectoryHandle& folder, const std::string& name,
                              const std::string& path) {
-  struct stat status {};
-  if (const int failure = folder.status(name, status)) {
-    return fileError(failure, "can't read", path);
-  }
-  if (++_state.totalItems % kTellItems == 0 && _progress && !_progress({})) {
-    return fileError(ECANCELED, "can't bring in", path);
-  }
-  if (S_ISREG(status.st_mode)) _state.totalBytes += static_cast<std::uint64_t>(status.st_size);
-  if (S_ISREG(status.st_mode) || S_ISLNK(status.st_mode)) return nullptr;
-  if (!S_ISDIR(status.st_mode)) {
-    return fileErrorWithWords(NSFileWriteUnknownError, EINVAL,
-                              "can't bring in \"" + printable(path) +
-                                  "\": it is a device, a pipe or a socket; leave it out",
-                              path);
-  }
-  DirectoryHandle below;
-  NSErrorPtr error;
-  int failure = folder.openFolder(name, below);
-  if (failure == 0) {
-    failure = below.list([&](const std::string& child) {
-      error = measure(below, child, joinPath(path, child));
-      return error == nullptr;
-    });
-  }
-  return error || failure == 0 ? error : fileError(failure, "can't read", path);
+  Measure measure(*this);
+  const int failure = measure.walk(folder, name, path);
+  if (failure == 0 || measure.refusal()) return measure.refusal();
+  return fileError(failure, failure == ECANCELED ? "can't bring in" : "can't read", measure.path());
 }
+
+class TreeCopy::Copy final : public TreeWalk {
+ public:
+  Copy(TreeCopy& copy, const DirectoryHandle& to, const std::string& newName)
+      : _copy(copy), _to(to), _newName(newName) {}
+
+ private:
+  // The folder of the copy that is being filled, and the name in it.
+  const DirectoryHandle& into() const { return depth() == 0 ? _to : _made; }
+  const std::string& named(const std::string& name) const { return depth() == 0 ? _newName : name; }
+
+  int visit(const DirectoryHandle& from, const std::string& name,
+            const struct stat& status) override {
+    const std::string& made = named(name);
+    if (S_ISDIR(status.st_mode)) return _copy._files.makeFolder(into().get(), made, 0700);
+    if (S_ISREG(status.st_mode)) return _copy.copyFile(from, name, into(), made);
+    std::string target;
+    int failure = S_ISLNK(status.st_mode) ? from.readLink(name, target) : EINVAL;
+    if (failure == 0) failure = _copy._files.makeLink(target, into().get(), made);
+    const timespec times[2] = {status.st_atim, status.st_mtim};
+    if (failure == 0) failure = _copy._files.setTimes(into().get(), made, times);
+    return failure != 0 ? failure : _copy.advance(1, 0);
+  }
+  int enter(const DirectoryHandle&, const std::string& name) override {
+    const bool isFirst = depth() == 1;
+    DirectoryHandle made;
+    const int failure = (isFirst ? _to : _made).openFolder(isFirst ? _newName : name, made);
+    _made = std::move(made);
+    return failure;
+  }
+  int leave(const DirectoryHandle& from, bool) override {
+    struct stat status {};
+    int failure = from.status(status);
+    if (failure == 0) failure = _copy.copyAttributes(from.get(), _made.get());
+    // Also from a read-only medium the owner gets a folder that can be filled and moved.
+    if (failure == 0) failure = _copy.copyAccess(from.get(), _made.get(), status, 0700);
+    const timespec times[2] = {status.st_atim, status.st_mtim};
+    if (failure == 0) failure = _copy._files.setTimes(_made.get(), {}, times);
+    if (failure == 0) failure = _copy.advance(1, 0);
+    DirectoryHandle above;
+    if (failure == 0) failure = _made.openParent(above);
+    _made = std::move(above);
+    return failure;
+  }
+
+  TreeCopy& _copy;
+  const DirectoryHandle& _to;
+  const std::string& _newName;
+  DirectoryHandle _made;  // the copy of the folder that is being read
+};
 
 NSErrorPtr TreeCopy::copy(const DirectoryHandle& from, const std::string& name,
                           const std::string& path, const DirectoryHandle& to,
                           const std::string& newName) {
-  struct stat status {};
-  if (const int failure = from.status(name, status)) return fileError(failure, "can't read", path);
-  if (S_ISDIR(status.st_mode)) return copyFolder(from, name, path, status, to, newName);
-  if (S_ISREG(status.st_mode)) return copyFile(from, name, path, to, newName);
-  std::string target;
-  int failure = S_ISLNK(status.st_mode) ? from.readLink(name, target) : EINVAL;
-  if (failure == 0) failure = _files.makeLink(target, to.get(), newName);
-  const timespec times[2] = {status.st_atim, status.st_mtim};
-  if (failure == 0) failure = _files.setTimes(to.get(), newName, times);
-  if (failure == 0) failure = advance(1, 0);
-  return failure == 0 ? nullptr : fileError(failure, "can't bring in", path);
+  Copy copy(*this, to, newName);
+  const int failure = copy.walk(from, name, path);
+  return failure == 0 ? nullptr : fileError(failure, "can't bring in", copy.path());
 }
 
-NSErrorPtr TreeCopy::copyFile(const DirectoryHandle& from, const std::string& name,
-                              const std::string& path, const DirectoryHandle& to,
-                              const std::string& newName) {
+int TreeCopy::copyFile(const DirectoryHandle& from, const std::string& name,
+                       const DirectoryHandle& to, const std::string& newName) {
   FileDescriptor source;
   FileLease lease;  // after the file, so that it is given up first
   FileDescriptor made;
@@ -132,32 +187,7 @@ NSErrorPtr TreeCopy::copyFile(const DirectoryHandle& from, const std::string& na
   if (failure == 0) failure = copyAccess(source.get(), made.get(), status, 0400);
   const timespec times[2] = {status.st_atim, status.st_mtim};
   if (failure == 0) failure = _files.setTimes(made.get(), {}, times);
-  if (failure == 0) failure = advance(1, 0);
-  return failure == 0 ? nullptr : fileError(failure, "can't bring in", path);
-}
-
-NSErrorPtr TreeCopy::copyFolder(const DirectoryHandle& from, const std::string& name,
-                                const std::string& path, const struct stat& status,
-                                const DirectoryHandle& to, const std::string& newName) {
-  DirectoryHandle source;
-  DirectoryHandle made;
-  int failure = from.openFolder(name, source);
-  if (failure == 0) failure = _files.makeFolder(to.get(), newName, 0700);
-  if (failure == 0) failure = to.openFolder(newName, made);
-  if (failure != 0) return fileError(failure, "can't bring in", path);
-  NSErrorPtr error;
-  failure = source.list([&](const std::string& child) {
-    error = copy(source, child, joinPath(path, child), made, child);
-    return error == nullptr;
-  });
-  if (error) return error;
-  if (failure == 0) failure = copyAttributes(source.get(), made.get());
-  // Also from a read-only medium the owner gets a folder that can be filled and moved.
-  if (failure == 0) failure = copyAccess(source.get(), made.get(), status, 0700);
-  const timespec times[2] = {status.st_atim, status.st_mtim};
-  if (failure == 0) failure = _files.setTimes(made.get(), {}, times);
-  if (failure == 0) failure = advance(1, 0);
-  return failure == 0 ? nullptr : fileError(failure, "can't bring in", path);
+  return failure != 0 ? failure : advance(1, 0);
 }
 
 int TreeCopy::copyContents(int from, int to, const struct stat& status) {
@@ -284,34 +314,30 @@ int TreeCopy::copyList(int to, const char* name, const std::string& list) {
   return attributeOf(to, name).empty() ? 0 : _files.removeAttribute(descriptorPath(to), name);
 }
 
-NSErrorPtr TreeCopy::sync(const DirectoryHandle& to, const std::string& newName,
-                          const std::string& path) {
-  int failure = _state.totalItems > kFewItems ? _files.syncAll(to.get()) : syncTree(to, newName);
-  // The disk may have taken its time.
-  if (failure == 0 && _progress && !_progress(_state)) failure = ECANCELED;
-  return failure == 0 ? nullptr : fileError(failure, "can't bring in", path);
-}
+class TreeCopy::Sync final : public TreeWalk {
+ public:
+  explicit Sync(FileLayer& files) : _files(files) {}
 
-int TreeCopy::syncTree(const DirectoryHandle& folder, const std::string& name) {
-  struct stat status {};
-  if (const int failure = folder.status(name, status)) return failure;
-  if (S_ISLNK(status.st_mode)) return 0;
-  if (S_ISREG(status.st_mode)) {
+ private:
+  int visit(const DirectoryHandle& folder, const std::string& name,
+            const struct stat& status) override {
+    if (!S_ISREG(status.st_mode)) return 0;
     FileDescriptor file;
     const int failure = folder.openFile(name, file);
     return failure != 0 ? failure : _files.sync(file.get());
   }
-  DirectoryHandle below;
-  int failure = folder.openFolder(name, below);
-  int first = 0;
-  if (failure == 0) {
-    failure = below.list([&](const std::string& child) {
-      first = syncTree(below, child);
-      return first == 0;
-    });
-  }
-  if (failure == 0) failure = first;
-  return failure != 0 ? failure : _files.sync(below.get());
+  int leave(const DirectoryHandle& folder, bool) override { return _files.sync(folder.get()); }
+
+  FileLayer& _files;
+};
+
+NSErrorPtr TreeCopy::sync(const DirectoryHandle& to, const std::string& newName,
+                          const std::string& path) {
+  int failure = _state.totalItems > kFewItems ? _files.syncAll(to.get())
+                                              : Sync(_files).walk(to, newName, path);
+  // The disk may have taken its time.
+  if (failure == 0 && _progress && !_progress(_state)) failure = ECANCELED;
+  return failure == 0 ? nullptr : fileError(failure, "can't bring in", path);
 }
 
 }  // namespace skein::vald

@@ -38,7 +38,8 @@ class TreeCopy {
       : _files(files), _progress(std::move(progress)) {}
 
   // Counts what is there, before anything is made. An error for what cannot be copied
-  // (devices, pipes, sockets, what may not be read), naming it.
+  // (devices, pipes, sockets, what may not be read, reserved names, what is more than
+  // kDeepestTree folders deep), naming it.
   NSErrorPtr measure(const DirectoryHandle& folder, const std::string& name,
                      const std::string& path);
   // After measure(). On an error a part may have been made; the caller removes it.
@@ -49,11 +50,13 @@ class TreeCopy {
   NSErrorPtr sync(const DirectoryHandle& to, const std::string& newName, const std::string& path);
 
  private:
-  NSErrorPtr copyFile(const DirectoryHandle& from, const std::string& name, const std::string& path,
-                      const DirectoryHandle& to, const std::string& newName);
-  NSErrorPtr copyFolder(const DirectoryHandle& from, const std::string& name,
-                        const std::string& path, const struct stat& status,
-                        const DirectoryHandle& to, const std::string& newName);
+  class Measure;
+  class Copy;
+  class Sync;
+
+  // These answer 0 or an errno.
+  int copyFile(const DirectoryHandle& from, const std::string& name, const DirectoryHandle& to,
+               const std::string& newName);
   int copyContents(int from, int to, const struct stat& status);
   int copyRange(int from, int to, std::int64_t offset, std::int64_t end, bool untilEnd);
   int copyByReading(int from, int to, std::int64_t offset, std::int64_t end, bool untilEnd);
@@ -65,7 +68,6 @@ class TreeCopy {
   bool isDisturbed() const { return _lease != nullptr && !_lease->isUndisturbed(); }
   // ECANCELED when the handler wants no more.
   int advance(std::uint64_t items, std::uint64_t bytes);
-  int syncTree(const DirectoryHandle& folder, const std::string& name);
 
   FileLayer& _files;
   const FileProgressHandler _progress;

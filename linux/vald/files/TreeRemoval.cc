@@ -4,71 +4,83 @@
 #include <unistd.h>
 
 #include <cerrno>
-#include <vector>
 
 #include "linux/vald/files/FileErrors.h"
-#include "linux/vald/files/FileNames.h"
+#include "linux/vald/files/TreeWalk.h"
 
 namespace skein::vald {
 
+namespace {
+
+class Obstacle final : public TreeWalk {
+ public:
+  explicit Obstacle(const std::function<bool()>& goesOn) : _goesOn(goesOn) {}
+
+ private:
+  int visit(const DirectoryHandle& folder, const std::string& name,
+            const struct stat& status) override {
+    if (!S_ISDIR(status.st_mode)) return 0;
+    if (!_goesOn()) return ECANCELED;
+    return folder.mountOf(name) != folder.mountOf() ? EBUSY : 0;
+  }
+  int leave(const DirectoryHandle& folder, bool isEmpty) override {
+    if (isEmpty || ::faccessat(folder.get(), ".", W_OK | X_OK, AT_EACCESS) == 0) return 0;
+    return errno;
+  }
+
+  const std::function<bool()>& _goesOn;
+};
+
+// Goes on past what cannot be deleted.
+class Remover final : public TreeWalk {
+ public:
+  explicit Remover(FileLayer& files) : _files(files) {}
+
+  int first() const { return _first; }
+  bool hasRemoved() const { return _hasRemoved; }
+
+ private:
+  int visit(const DirectoryHandle& folder, const std::string& name,
+            const struct stat& status) override {
+    if (!S_ISDIR(status.st_mode)) return note(_files.unlink(folder.get(), name));
+    if (folder.mountOf(name) == folder.mountOf()) return 0;
+    note(EBUSY);
+    return kStepOver;
+  }
+  int didLeave(const DirectoryHandle& parent, const std::string& name) override {
+    return note(_files.removeFolder(parent.get(), name));
+  }
+  int unreadable(int failure) override { return note(failure); }
+
+  int note(int failure) {
+    if (failure == 0) _hasRemoved = true;
+    if (failure != 0 && failure != ENOENT && _first == 0) _first = failure;
+    return 0;
+  }
+
+  FileLayer& _files;
+  int _first = 0;
+  bool _hasRemoved = false;
+};
+
+}  // namespace
+
 NSErrorPtr obstacleToRemoval(const DirectoryHandle& folder, const std::string& name,
                              const std::string& path, const std::function<bool()>& goesOn) {
-  const char* const doing = "can't remove";
-  struct stat status {};
-  if (const int failure = folder.status(name, status)) return fileError(failure, doing, path);
-  if (!S_ISDIR(status.st_mode)) return nullptr;
-  if (!goesOn()) return fileError(ECANCELED, doing, path);
-  if (folder.mountOf(name) != folder.mountOf()) return fileError(EBUSY, doing, path);
-  DirectoryHandle below;
-  if (const int failure = folder.openFolder(name, below)) return fileError(failure, doing, path);
-  NSErrorPtr error;
-  bool empty = true;
-  const int failure = below.list([&](const std::string& child) {
-    empty = false;
-    struct stat childStatus {};
-    if (below.status(child, childStatus) == 0 && S_ISDIR(childStatus.st_mode)) {
-      error = obstacleToRemoval(below, child, joinPath(path, child), goesOn);
-    }
-    return error == nullptr;
-  });
-  if (error) return error;
-  if (failure != 0) return fileError(failure, doing, path);
-  if (!empty && ::faccessat(below.get(), ".", W_OK | X_OK, AT_EACCESS) != 0) {
-    return fileError(errno, doing, path);
-  }
-  return nullptr;
+  Obstacle obstacle(goesOn);
+  const int failure = obstacle.walk(folder, name, path);
+  return failure == 0 ? nullptr : fileError(failure, "can't remove", obstacle.path());
 }
 
 int removeTree(FileLayer& files, const DirectoryHandle& folder, const std::string& name) {
-  struct stat status {};
-  int failure = folder.status(name, status);
-  if (failure != 0) return failure == ENOENT ? 0 : failure;
-  if (!S_ISDIR(status.st_mode)) {
-    failure = files.unlink(folder.get(), name);
-    return failure == ENOENT ? 0 : failure;
+  for (;;) {
+    Remover remover(files);
+    const int failure = remover.walk(folder, name, {});
+    if (failure == ENOENT) return 0;
+    const int first = remover.first() != 0 ? remover.first() : failure;
+    // Some file systems lose their place in a folder from which entries go.
+    if (first != ENOTEMPTY || !remover.hasRemoved()) return first;
   }
-  if (folder.mountOf(name) != folder.mountOf()) return EBUSY;
-  DirectoryHandle below;
-  if ((failure = folder.openFolder(name, below)) != 0) return failure;
-  // Some file systems lose their place in a folder from which entries go, so a pass that
-  // removed something is followed by another.
-  int first = 0;
-  for (bool removed = true; removed && first == 0;) {
-    removed = false;
-    failure = below.list([&](const std::string& child) {
-      const int own = removeTree(files, below, child);
-      if (own == 0) {
-        removed = true;
-      } else if (first == 0) {
-        first = own;
-      }
-      return true;
-    });
-    if (first == 0) first = failure;
-  }
-  if (first != 0) return first;
-  failure = files.removeFolder(folder.get(), name);
-  return failure == ENOENT ? 0 : failure;
 }
 
 }  // namespace skein::vald

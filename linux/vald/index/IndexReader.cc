@@ -135,13 +135,20 @@ std::vector<FolderRow> IndexReader::trashes() {
 }
 
 bool IndexReader::isTrashed(FolderKey folder) {
-  if (folder == kNoFolder || folder == kDriveFolder) return false;
-  const auto known = _trashed.find(folder);
-  if (known != _trashed.end()) return known->second;
-  _trashed[folder] = false;  // a ring ends here
-  const auto row = this->folder(folder);
-  const bool answer = row && (isTrashFolderName(row->name) || isTrashed(row->parent));
-  _trashed[folder] = answer;
+  bool answer = false;
+  std::vector<FolderKey> below;
+  while (folder != kNoFolder && folder != kDriveFolder) {
+    // A ring ends where it began.
+    const auto [known, isNew] = _trashed.try_emplace(folder, false);
+    answer = known->second;
+    if (!isNew) break;
+    below.push_back(folder);
+    const auto row = this->folder(folder);
+    answer = row && isTrashFolderName(row->name);
+    if (!row || answer) break;
+    folder = row->parent;
+  }
+  for (const FolderKey key : below) _trashed[key] = answer;
   return answer;
 }
 

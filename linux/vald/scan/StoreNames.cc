@@ -18,10 +18,7 @@ std::int64_t nanoseconds(NSDate date) { return date.time_since_epoch().count(); 
 }  // namespace
 
 bool isHiddenFromStore(std::string_view name) {
-  if (!name.starts_with('.')) return false;
-  if (name == "." || name == ".." || name.starts_with(kTrashBeginning)) return true;
-  const std::string whole(name);
-  return isStagingName(whole) || isCloudTemporaryName(whole);
+  return name == "." || name == ".." || useOfReservedName(name) != nullptr;
 }
 
 std::string ownTrashFolderName() {

@@ -9,8 +9,7 @@
 
 namespace skein::vald {
 
-// Whether a name is never listed: the trash, and what this system puts into folders for a
-// moment.
+// Whether a name is never listed: those that useOfReservedName() tells of.
 bool isHiddenFromStore(std::string_view name);
 
 // What the folder table calls a root's trash: a way of two names, which no folder has.
