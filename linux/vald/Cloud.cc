@@ -3,11 +3,14 @@
 #include <fcntl.h>
 #include <linux/fs.h>
 #include <sys/ioctl.h>
+#include <sys/statvfs.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <utility>
 
 #include "linux/vald/cloud/CloudRecovery.h"
+#include "linux/vald/files/FileErrors.h"
 #include "linux/vald/files/FileNames.h"
 
 namespace skein::vald {
@@ -35,6 +38,10 @@ std::unique_ptr<Cloud> Cloud::open(Options options, FileOperations& operations, 
     return nullptr;
   }
   cloud->_records = std::move(*records);
+  if (NSErrorPtr failed = CloudCollector(cloud->places(), cloud->_clock).begin()) {
+    error.store(failed);
+    return nullptr;
+  }
   // What stays as it is stays noted; the drive is no worse for it.
   if (const NSErrorPtr left = recoverUnfinishedWork(cloud->places())) {
     VL_ERROR(log, "[ERROR] not all that was cut off could be mended: %@",
@@ -102,23 +109,42 @@ void Cloud::start(FolderStore& store) {
   auto feed = std::make_shared<UploadFeed>(
       UploadFeed::Parts{store, *_records, _options.policy, _log, [this](VLFileObjectID document) {
                           if (const auto told = thumbnails()) told->documentWasUploaded(document);
+                          if (const auto told = rounds()) told->contentsDidChange();
                         }});
   _uploader = std::make_unique<Uploader>(UploadServices{_operations.roots(), _operations.layer(),
                                                         *_contents, *_records, _conditions, _clock},
                                          *feed, _uploadThreads, _options.uploads);
   feed->start(*_uploader);
+  auto rounds = std::make_shared<CollectionRounds>(CollectionRounds::Parts{
+      places(), _clock, _log, [this] { return collectionRule(); },
+      [&store] {
+        LocalDaemonStatus status;
+        store.status(status);
+        return status.scan == LocalDaemonStatus::Scan::Idle;
+      },
+      [this] {
+        const auto asked = thumbnails();
+        if (!asked) return;
+        const auto collected = asked->collectGarbage();
+        if (collected) return;
+        VL_ERROR(_log, "[ERROR] old pictures stay: %@", collected.error()->localizedDescription());
+      }});
   MutexLock lock(_mutex);
   _feed = std::move(feed);
+  _rounds = std::move(rounds);
 }
 
 void Cloud::stop() {
   std::shared_ptr<UploadFeed> feed;
   std::shared_ptr<ThumbnailService> thumbnails;
+  std::shared_ptr<CollectionRounds> rounds;
   {
     MutexLock lock(_mutex);
     feed.swap(_feed);
     thumbnails.swap(_thumbnails);
+    rounds.swap(_rounds);
   }
+  if (rounds) rounds->stop();
   if (feed) feed->stop();
   _answers->close();
   // While the executors run: both wait for what they have begun.
@@ -136,6 +162,33 @@ std::shared_ptr<UploadFeed> Cloud::feed() {
 std::shared_ptr<ThumbnailService> Cloud::thumbnails() {
   MutexLock lock(_mutex);
   return _thumbnails;
+}
+
+std::shared_ptr<CollectionRounds> Cloud::rounds() {
+  MutexLock lock(_mutex);
+  return _rounds;
+}
+
+Outcome<CollectionRounds::Rule> Cloud::collectionRule() {
+  const auto keeping = _records->keeping();
+  if (!keeping) return keeping.error();
+  const auto kept = _records->kept();
+  if (!kept) return kept.error();
+  struct statvfs disk {};
+  if (statvfs(_options.folder.c_str(), &disk) != 0) {
+    return fileError(errno, "can't measure the disk of", _options.folder);
+  }
+  CollectionRounds::Rule rule;
+  rule.time = std::chrono::hours(24) * keeping->days;
+  rule.bytes = disk.f_blocks / 100 * keeping->percent * disk.f_frsize;
+  // Where copies take room the bound is of all that is there; what is kept makes room first.
+  if (_options.policy.uploads == LocalCloudStatus::Uploads::Bounded) {
+    const std::uint64_t used = _records->usedBytes();
+    const std::uint64_t limit = _options.policy.limit;
+    rule.bytes = std::min(rule.bytes, limit - std::min(used, limit));
+  }
+  rule.taken = kept->bytes - kept->givenUpBytes;
+  return rule;
 }
 
 void Cloud::documentWasEvicted(const std::string& path, VLFileObjectID document) {

@@ -5,6 +5,7 @@
 
 #include "linux/protocol/LocalCloud.h"
 #include "linux/vald/ClosableExecutor.h"
+#include "linux/vald/CollectionRounds.h"
 #include "linux/vald/UploadFeed.h"
 #include "linux/vald/cloud/CloudPlaces.h"
 #include "linux/vald/cloud/Downloader.h"
@@ -61,6 +62,9 @@ class Cloud final : public LocalCloud {
   void startThumbnails(FolderStore& store) SKEIN_EXCLUDES(_mutex);
   // Null unless thumbnails are made.
   std::shared_ptr<ThumbnailService> thumbnails() SKEIN_EXCLUDES(_mutex);
+  std::shared_ptr<CollectionRounds> rounds() SKEIN_EXCLUDES(_mutex);
+  // How long, and how much, of what no record refers to is kept.
+  Outcome<CollectionRounds::Rule> collectionRule();
   // Whether a copy of a document shares its blocks.
   bool probeSharing();
 
@@ -81,6 +85,7 @@ class Cloud final : public LocalCloud {
   Mutex _mutex;
   std::shared_ptr<UploadFeed> _feed SKEIN_GUARDED_BY(_mutex);
   std::shared_ptr<ThumbnailService> _thumbnails SKEIN_GUARDED_BY(_mutex);
+  std::shared_ptr<CollectionRounds> _rounds SKEIN_GUARDED_BY(_mutex);
 };
 
 }  // namespace skein::vald

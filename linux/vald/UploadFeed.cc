@@ -174,7 +174,9 @@ void UploadFeed::forgetDead() {
 
 bool UploadFeed::mayUpload(const FolderStore::Unsettled& document) {
   if (_parts.policy.uploads != Uploads::Bounded) return true;
-  const std::uint64_t used = _parts.records.usedBytes();
+  // What may be the only copy of something makes room for nothing.
+  const auto kept = _parts.records.kept();
+  const std::uint64_t used = _parts.records.usedBytes() + (kept ? kept->givenUpBytes : 0);
   const auto record = _parts.records.record(document.id);
   MutexLock lock(_mutex);
   // What is there already is looked at again in any case.

@@ -99,6 +99,18 @@ CloudRig::CloudRig(std::filesystem::path where) : top(std::move(where)) {
   auto openRecords = CloudRecords::open((top / "cloud/records").string());
   EXPECT_TRUE(openRecords);
   records = std::move(*openRecords);
+  EXPECT_EQ(brief(CloudCollector(places(), clock).begin()), "none");
+}
+
+Outcome<CloudCollector::Result> CloudRig::collect(std::chrono::nanoseconds time,
+                                                  std::uint64_t bytes) {
+  Cancellation cancellation;
+  return CloudCollector(places(), clock).collect(time, bytes, cancellation);
+}
+
+bool CloudRig::hasObject(const ContentHash& hash) const {
+  return std::filesystem::exists(top / "cloud/objects" / hash.asString().substr(0, 2) /
+                                 hash.asString());
 }
 
 CloudPlaces CloudRig::places() {

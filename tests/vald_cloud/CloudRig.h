@@ -11,6 +11,7 @@
 #include <vector>
 
 #include "base/Mutex.h"
+#include "linux/vald/cloud/CloudCollector.h"
 #include "linux/vald/cloud/Downloader.h"
 #include "linux/vald/cloud/Eviction.h"
 #include "linux/vald/cloud/Uploader.h"
@@ -83,6 +84,8 @@ struct CloudRig {
   NSErrorPtr evict(VLFileObjectID document, const std::string& path);
   // On this thread, without a downloader.
   NSErrorPtr download(VLFileObjectID document, const std::string& path);
+  Outcome<CloudCollector::Result> collect(std::chrono::nanoseconds time, std::uint64_t bytes);
+  bool hasObject(const ContentHash& hash) const;
   // What is in the drive: the names, sorted.
   std::vector<std::string> names() const;
 

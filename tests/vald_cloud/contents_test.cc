@@ -27,10 +27,7 @@ class ContentsTest : public testing::Test {
   void upload(std::uint64_t number, const std::string& path) {
     ASSERT_TRUE(std::holds_alternative<UploadDone>(rig.upload(documentNumber(number), path)));
   }
-  CloudContents::Garbage collect() {
-    return *rig.contents->collectGarbage(
-        [&](const ContentHash& hash) { return *rig.records->references(hash) > 0; });
-  }
+  CloudContents::Garbage collect() { return rig.collect(std::chrono::nanoseconds(0), 0)->freed; }
 
   TemporaryFolder folder;
   CloudRig rig{folder.path()};

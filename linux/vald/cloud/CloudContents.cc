@@ -26,22 +26,24 @@ FileDescriptor openFolder(int folder, const char* name) {
   return FileDescriptor(openat(folder, name, O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
 }
 
-// The names in a folder, but "." and "..". Empty with errno set when it cannot be read.
-std::vector<std::string> entries(int folder) {
-  std::vector<std::string> names;
+// The names in a folder, but "." and "..". 0 or the errno.
+int entries(int folder, std::vector<std::string>& names) {
   const int copy = openat(folder, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC);
   DIR* directory = copy >= 0 ? fdopendir(copy) : nullptr;
   if (directory == nullptr) {
+    const int code = errno;
     if (copy >= 0) close(copy);
-    return names;
+    return code;
   }
   errno = 0;
   while (const dirent* entry = readdir(directory)) {
     const std::string name = entry->d_name;
     if (name != "." && name != "..") names.push_back(name);
+    errno = 0;
   }
+  const int code = errno;
   closedir(directory);
-  return names;
+  return code;
 }
 
 // Reading here, without the cloud's conditions.
@@ -114,7 +116,11 @@ Outcome<std::unique_ptr<CloudContents>> CloudContents::open(const std::string& f
   FileDescriptor objects = openFolder(top.get(), "objects");
   FileDescriptor incoming = openFolder(top.get(), "incoming");
   if (!objects || !incoming) return fileError(errno, "can't open the cloud's folder", folder);
-  for (const std::string& name : entries(incoming.get())) {
+  std::vector<std::string> left;
+  if (const int code = entries(incoming.get(), left)) {
+    return fileError(code, "can't read the cloud's folder", folder + "/incoming");
+  }
+  for (const std::string& name : left) {
     if (const int code = files.unlink(incoming.get(), name)) {
       return fileError(code, "can't remove", joinPath(folder + "/incoming", name));
     }
@@ -212,34 +218,58 @@ NSErrorPtr CloudContents::verify(const ContentHash& hash, StreamObserver& observ
   return found->hash == hash ? nullptr : corruptError(hash.asString());
 }
 
-Outcome<CloudContents::Garbage> CloudContents::collectGarbage(
-    const std::function<bool(const ContentHash&)>& isReferred) {
-  Garbage garbage;
-  for (const std::string& shard : entries(_objects.get())) {
-    if (NSErrorPtr error = collectShard(shard, isReferred, garbage)) return error;
+NSErrorPtr CloudContents::list(const std::function<NSErrorPtr(const HashedContents&)>& each) {
+  std::vector<std::string> shards;
+  if (const int code = entries(_objects.get(), shards)) {
+    return fileError(code, "can't read the cloud's folder", _folder + "/objects");
   }
-  return garbage;
-}
-
-NSErrorPtr CloudContents::collectShard(const std::string& shard,
-                                       const std::function<bool(const ContentHash&)>& isReferred,
-                                       Garbage& garbage) {
-  const FileDescriptor folder = openFolder(_objects.get(), shard.c_str());
-  if (!folder)
-    return fileError(errno, "can't read the cloud's folder", _folder + "/objects/" + shard);
-  for (const std::string& name : entries(folder.get())) {
-    const auto hash = ContentHash::parse(name);
-    struct stat status {};
-    if (!hash || fstatat(folder.get(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) != 0) continue;
-    if (!beginCollecting(*hash)) continue;
-    const int code = isReferred(*hash) ? -1 : _files.unlink(folder.get(), name);
-    endCollecting(*hash);
-    if (code > 0) return fileError(code, "can't remove from the cloud", objectPath(name));
-    if (code < 0) continue;
-    ++garbage.files;
-    garbage.bytes += static_cast<std::uint64_t>(status.st_size);
+  for (const std::string& shard : shards) {
+    const FileDescriptor folder = openFolder(_objects.get(), shard.c_str());
+    std::vector<std::string> names;
+    if (const int code = folder ? entries(folder.get(), names) : errno) {
+      return fileError(code, "can't read the cloud's folder", _folder + "/objects/" + shard);
+    }
+    for (const std::string& name : names) {
+      const auto hash = ContentHash::parse(name);
+      struct stat status {};
+      if (!hash || fstatat(folder.get(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) != 0 ||
+          isHeld(*hash)) {
+        continue;
+      }
+      NSErrorPtr error = each({*hash, static_cast<std::uint64_t>(status.st_size)});
+      if (error != nullptr) return error;
+    }
   }
   return nullptr;
+}
+
+Outcome<CloudContents::Garbage> CloudContents::remove(const std::vector<ContentHash>& contents,
+                                                      const Release& release) {
+  std::vector<ContentHash> unheld;
+  for (const ContentHash& hash : contents) {
+    if (beginCollecting(hash)) unheld.push_back(hash);
+  }
+  const auto released = release(unheld);
+  const auto freed = released ? unlinkAll(*released) : Outcome<Garbage>(released.error());
+  endCollecting(unheld);
+  return freed;
+}
+
+Outcome<CloudContents::Garbage> CloudContents::unlinkAll(const std::vector<ContentHash>& contents) {
+  Garbage garbage;
+  for (const ContentHash& hash : contents) {
+    const std::string object = hash.asString();
+    struct stat status {};
+    const FileDescriptor shard = openFolder(_objects.get(), shardOf(object).c_str());
+    int code = shard && fstatat(shard.get(), object.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0
+                   ? 0
+                   : errno;
+    if (code == 0) code = _files.unlink(shard.get(), object);
+    if (code == ENOENT) continue;
+    if (code != 0) return fileError(code, "can't remove from the cloud", objectPath(object));
+    garbage += {1, static_cast<std::uint64_t>(status.st_size)};
+  }
+  return garbage;
 }
 
 CloudContents::Hold CloudContents::takeHold(const ContentHash& hash) {
@@ -259,10 +289,15 @@ bool CloudContents::beginCollecting(const ContentHash& hash) {
   return !_holds.contains(hash) && _collecting.insert(hash).second;
 }
 
-void CloudContents::endCollecting(const ContentHash& hash) {
+void CloudContents::endCollecting(const std::vector<ContentHash>& contents) {
   MutexLock lock(_mutex);
-  _collecting.erase(hash);
+  for (const ContentHash& hash : contents) _collecting.erase(hash);
   _collected.notifyAll();
+}
+
+bool CloudContents::isHeld(const ContentHash& hash) {
+  MutexLock lock(_mutex);
+  return _holds.contains(hash);
 }
 
 }  // namespace skein::vald

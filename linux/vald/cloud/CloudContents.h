@@ -8,6 +8,7 @@
 #include <set>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "base/Mutex.h"
 #include "linux/protocol/FileDescriptor.h"
@@ -72,9 +73,25 @@ class CloudContents {
   struct Garbage {
     std::uint64_t files = 0;
     std::uint64_t bytes = 0;
+    Garbage& operator+=(const Garbage& other) {
+      files += other.files;
+      bytes += other.bytes;
+      return *this;
+    }
+    Garbage& operator-=(const Garbage& other) {
+      files -= other.files;
+      bytes -= other.bytes;
+      return *this;
+    }
   };
-  // Removes the contents that nobody holds and `isReferred` does not know.
-  Outcome<Garbage> collectGarbage(const std::function<bool(const ContentHash&)>& isReferred)
+  // Calls `each` with all contents but those that somebody holds, without a lock. An error: of
+  // `each`, or of a folder that cannot be read.
+  NSErrorPtr list(const std::function<NSErrorPtr(const HashedContents&)>& each)
+      SKEIN_EXCLUDES(_mutex);
+  // Removes contents. `release` is called once, with those that nobody holds, and answers
+  // which of them may go; until they are gone, whoever wants to hold one of them waits.
+  using Release = std::function<Outcome<std::vector<ContentHash>>(const std::vector<ContentHash>&)>;
+  Outcome<Garbage> remove(const std::vector<ContentHash>& contents, const Release& release)
       SKEIN_EXCLUDES(_mutex);
 
  private:
@@ -91,11 +108,10 @@ class CloudContents {
   void releaseHold(const ContentHash& hash) SKEIN_EXCLUDES(_mutex);
   // False when somebody holds them.
   bool beginCollecting(const ContentHash& hash) SKEIN_EXCLUDES(_mutex);
-  void endCollecting(const ContentHash& hash) SKEIN_EXCLUDES(_mutex);
+  void endCollecting(const std::vector<ContentHash>& contents) SKEIN_EXCLUDES(_mutex);
+  bool isHeld(const ContentHash& hash) SKEIN_EXCLUDES(_mutex);
 
-  NSErrorPtr collectShard(const std::string& shard,
-                          const std::function<bool(const ContentHash&)>& isReferred,
-                          Garbage& garbage) SKEIN_EXCLUDES(_mutex);
+  Outcome<Garbage> unlinkAll(const std::vector<ContentHash>& contents);
   bool contains(const HashedContents& contents) const;
   std::string objectPath(const std::string& object) const;
   // Moves what was written into its place. The hash is held.

@@ -62,7 +62,10 @@ bool CloudStatement::step() {
   return code == SQLITE_ROW;
 }
 
-void CloudStatement::reset() { sqlite3_reset(_statement); }
+void CloudStatement::reset() {
+  sqlite3_reset(_statement);
+  sqlite3_clear_bindings(_statement);
+}
 
 NSErrorPtr CloudStatement::run() {
   while (step()) {

@@ -35,7 +35,7 @@ class CloudStatement {
 
   // Whether there is another row.
   bool step();
-  // Ready to be bound and stepped again.
+  // Ready to be bound and stepped again, with nothing bound.
   void reset();
   // Runs a statement that answers no rows; null on success.
   NSErrorPtr run();

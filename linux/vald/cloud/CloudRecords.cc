@@ -30,6 +30,16 @@ constexpr char kSchema2[] = R"sql(
   ALTER TABLE work ADD COLUMN hash BLOB NOT NULL DEFAULT x'';
 )sql";
 
+constexpr char kSchema3[] = R"sql(
+  CREATE TABLE unreferenced(
+    hash BLOB PRIMARY KEY, since INTEGER NOT NULL, missed INTEGER, size INTEGER NOT NULL);
+  CREATE TABLE given_up(hash BLOB PRIMARY KEY) WITHOUT ROWID;
+  CREATE TABLE settings(name TEXT PRIMARY KEY, value INTEGER NOT NULL);
+)sql";
+constexpr char kDays[] = "keep_days";
+constexpr char kPercent[] = "keep_percent";
+constexpr char kAdopted[] = "adopted";
+
 constexpr char kColumns[] =
     "SELECT document, zone, owner, hash, size, modified, created, uploaded, revision, thumbnail "
     "FROM records ";
@@ -76,7 +86,7 @@ bool countsForQuota(const CloudRecord& record) {
 }  // namespace
 
 Outcome<std::unique_ptr<CloudRecords>> CloudRecords::open(const std::string& path) {
-  auto database = CloudDatabase::open(path, {kSchema1, kSchema2});
+  auto database = CloudDatabase::open(path, {kSchema1, kSchema2, kSchema3});
   if (!database) return database.error();
   std::unique_ptr<CloudRecords> records(new CloudRecords(std::move(*database)));
   if (NSErrorPtr error = records->measure()) return error;
@@ -107,6 +117,14 @@ Outcome<CloudRecord> CloudRecords::put(CloudRecord record, const UploadStamp& st
   }
   NSErrorPtr error = _database->transact([&]() SKEIN_NO_THREAD_SAFETY_ANALYSIS {
     NSErrorPtr failed = write(record);
+    if (failed == nullptr) {
+      failed = _database->prepare("DELETE FROM unreferenced WHERE hash = ?")
+                   ->bindBytes(1, bytesOf(record.contents.hash))
+                   .run();
+    }
+    if (failed == nullptr && *before) {
+      failed = noteUnreferenced((*before)->contents, record.uploaded);
+    }
     return failed != nullptr ? failed : writeStamp(record.document, stamp);
   });
   if (error != nullptr) return error;
@@ -177,7 +195,8 @@ NSErrorPtr CloudRecords::remove(VLFileObjectID document) {
           _database->prepare(std::string("DELETE FROM ") + table + " WHERE document = ?");
       if (NSErrorPtr failed = statement->bind(1, key(document)).run()) return failed;
     }
-    return nullptr;
+    return *before ? noteUnreferenced((*before)->contents, std::chrono::system_clock::now())
+                   : nullptr;
   });
   if (error == nullptr && *before && countsForQuota(**before)) {
     _usedBytes -= (*before)->contents.size;
@@ -222,6 +241,167 @@ Outcome<std::uint64_t> CloudRecords::references(const ContentHash& hash) {
   const auto count = _database->prepare("SELECT COUNT(*) FROM records WHERE hash = ?");
   if (!count->bindBytes(1, bytesOf(hash)).step()) return count->error();
   return static_cast<std::uint64_t>(count->integer(0));
+}
+
+NSErrorPtr CloudRecords::noteUnreferenced(const HashedContents& contents, NSDate since) {
+  return _database
+      ->prepare(
+          "INSERT OR REPLACE INTO unreferenced(hash, since, size) SELECT ?1, ?2, ?3 "
+          "WHERE NOT EXISTS (SELECT 1 FROM records WHERE hash = ?1)")
+      ->bindBytes(1, bytesOf(contents.hash))
+      .bind(2, nanoseconds(since))
+      .bind(3, static_cast<std::int64_t>(contents.size))
+      .run();
+}
+
+NSErrorPtr CloudRecords::noteGivenUp(const ContentHash& hash) {
+  return _database->prepare("INSERT OR IGNORE INTO given_up VALUES(?)")
+      ->bindBytes(1, bytesOf(hash))
+      .run();
+}
+
+Outcome<std::vector<CloudRecords::Unreferenced>> CloudRecords::noteLook(
+    const std::vector<ContentHash>& named, NSDate look) {
+  MutexLock lock(_mutex);
+  std::vector<Unreferenced> all;
+  NSErrorPtr error = _database->transact([&]() SKEIN_NO_THREAD_SAFETY_ANALYSIS -> NSErrorPtr {
+    const auto row = _database->prepare(
+        "SELECT hash, size, since, missed, EXISTS (SELECT 1 FROM given_up "
+        "WHERE given_up.hash = unreferenced.hash) FROM unreferenced ORDER BY since");
+    while (row->step()) {
+      Unreferenced one{{hashOf(row->text(0)), static_cast<std::uint64_t>(row->integer(1))},
+                       date(row->integer(2)),
+                       std::nullopt,
+                       row->integer(4) != 0};
+      if (!row->isNull(3)) one.missed = date(row->integer(3));
+      all.push_back(one);
+    }
+    if (NSErrorPtr failed = row->error()) return failed;
+    const auto note = _database->prepare(
+        "UPDATE unreferenced SET since = ?2, missed = ?3 WHERE hash = ?1 "
+        "AND (since IS NOT ?2 OR missed IS NOT ?3)");
+    for (Unreferenced& one : all) {
+      const bool isNamed = std::binary_search(named.begin(), named.end(), one.contents.hash);
+      // A clock that was put back makes nothing stay longer than that.
+      one.since = isNamed ? look : std::min(one.since, look);
+      if (one.missed) one.missed = std::min(*one.missed, look);
+      if (isNamed) {
+        one.missed = std::nullopt;
+        one.givenUp = true;
+        if (NSErrorPtr failed = noteGivenUp(one.contents.hash)) return failed;
+      }
+      note->bindBytes(1, bytesOf(one.contents.hash)).bind(2, nanoseconds(one.since));
+      if (!isNamed) note->bind(3, nanoseconds(one.missed.value_or(look)));
+      if (NSErrorPtr failed = note->run()) return failed;
+      note->reset();
+    }
+    return nullptr;
+  });
+  if (error != nullptr) return error;
+  return all;
+}
+
+Outcome<std::vector<ContentHash>> CloudRecords::release(const std::vector<ContentHash>& contents,
+                                                        NSDate look) {
+  MutexLock lock(_mutex);
+  std::vector<ContentHash> released;
+  NSErrorPtr error = _database->transact([&]() SKEIN_NO_THREAD_SAFETY_ANALYSIS -> NSErrorPtr {
+    const auto row = _database->prepare(
+        "DELETE FROM unreferenced WHERE hash = ?1 AND since < ?2 "
+        "AND NOT EXISTS (SELECT 1 FROM records WHERE hash = ?1) RETURNING 1");
+    const auto mark = _database->prepare("DELETE FROM given_up WHERE hash = ?");
+    for (const ContentHash& hash : contents) {
+      row->bindBytes(1, bytesOf(hash)).bind(2, nanoseconds(look));
+      bool isReleased = false;
+      while (row->step()) isReleased = true;
+      if (NSErrorPtr failed = row->error()) return failed;
+      row->reset();
+      if (!isReleased) continue;
+      released.push_back(hash);
+      if (NSErrorPtr failed = mark->bindBytes(1, bytesOf(hash)).run()) return failed;
+      mark->reset();
+    }
+    return nullptr;
+  });
+  if (error != nullptr) return error;
+  return released;
+}
+
+Outcome<bool> CloudRecords::isKnown(const ContentHash& hash) {
+  MutexLock lock(_mutex);
+  const auto row = _database->prepare(
+      "SELECT EXISTS (SELECT 1 FROM records WHERE hash = ?1) "
+      "OR EXISTS (SELECT 1 FROM unreferenced WHERE hash = ?1)");
+  if (!row->bindBytes(1, bytesOf(hash)).step()) return row->error();
+  return row->integer(0) != 0;
+}
+
+NSErrorPtr CloudRecords::addUnknown(const HashedContents& contents, NSDate now) {
+  MutexLock lock(_mutex);
+  return _database->transact([&]() SKEIN_NO_THREAD_SAFETY_ANALYSIS {
+    NSErrorPtr failed = noteGivenUp(contents.hash);
+    return failed != nullptr ? failed : noteUnreferenced(contents, now);
+  });
+}
+
+NSErrorPtr CloudRecords::adopt(const std::vector<HashedContents>& contents, NSDate now) {
+  MutexLock lock(_mutex);
+  return _database->transact([&]() SKEIN_NO_THREAD_SAFETY_ANALYSIS -> NSErrorPtr {
+    for (const HashedContents& one : contents) {
+      if (NSErrorPtr failed = noteGivenUp(one.hash)) return failed;
+      if (NSErrorPtr failed = noteUnreferenced(one, now)) return failed;
+    }
+    return writeSetting(kAdopted, 1);
+  });
+}
+
+Outcome<bool> CloudRecords::hasAdopted() {
+  MutexLock lock(_mutex);
+  const auto value = setting(kAdopted, 0);
+  return value ? Outcome<bool>(*value != 0) : value.error();
+}
+
+Outcome<CloudRecords::Kept> CloudRecords::kept() {
+  MutexLock lock(_mutex);
+  const auto sum = _database->prepare(
+      "SELECT COUNT(*), COALESCE(SUM(size), 0), "
+      "COALESCE(SUM(size) FILTER (WHERE hash IN (SELECT hash FROM given_up)), 0) "
+      "FROM unreferenced");
+  if (!sum->step()) return sum->error();
+  return Kept{static_cast<std::uint64_t>(sum->integer(0)),
+              static_cast<std::uint64_t>(sum->integer(1)),
+              static_cast<std::uint64_t>(sum->integer(2))};
+}
+
+Outcome<CloudRecords::Keeping> CloudRecords::keeping() {
+  MutexLock lock(_mutex);
+  const auto days = setting(kDays, Keeping().days);
+  if (!days) return days.error();
+  const auto percent = setting(kPercent, Keeping().percent);
+  if (!percent) return percent.error();
+  return Keeping{static_cast<std::uint32_t>(*days), static_cast<std::uint32_t>(*percent)};
+}
+
+NSErrorPtr CloudRecords::setKeeping(const Keeping& keeping) {
+  MutexLock lock(_mutex);
+  return _database->transact([&]() SKEIN_NO_THREAD_SAFETY_ANALYSIS {
+    NSErrorPtr failed = writeSetting(kDays, keeping.days);
+    return failed != nullptr ? failed : writeSetting(kPercent, keeping.percent);
+  });
+}
+
+Outcome<std::int64_t> CloudRecords::setting(const char* name, std::int64_t unset) {
+  const auto row = _database->prepare("SELECT value FROM settings WHERE name = ?");
+  const bool found = row->bind(1, std::string_view(name)).step();
+  if (NSErrorPtr error = row->error()) return error;
+  return found ? row->integer(0) : unset;
+}
+
+NSErrorPtr CloudRecords::writeSetting(const char* name, std::int64_t value) {
+  return _database->prepare("INSERT OR REPLACE INTO settings VALUES(?, ?)")
+      ->bind(1, std::string_view(name))
+      .bind(2, value)
+      .run();
 }
 
 std::uint64_t CloudRecords::usedBytes() {
@@ -283,11 +463,16 @@ Outcome<bool> CloudRecords::isPinned(VLFileObjectID document) {
 
 Outcome<CloudRecords::Work> CloudRecords::beginWork(Work work) {
   MutexLock lock(_mutex);
-  const auto row = _database->prepare("INSERT INTO work(path, folder, hash) VALUES(?, ?, ?)");
-  row->bindBytes(1, work.path)
-      .bind(2, static_cast<std::int64_t>(work.folder))
-      .bindBytes(3, bytesOf(work.contents));
-  if (NSErrorPtr error = row->run()) return error;
+  NSErrorPtr error = _database->transact([&]() SKEIN_NO_THREAD_SAFETY_ANALYSIS {
+    NSErrorPtr failed = noteGivenUp(work.contents);
+    if (failed != nullptr) return failed;
+    return _database->prepare("INSERT INTO work(path, folder, hash) VALUES(?, ?, ?)")
+        ->bindBytes(1, work.path)
+        .bind(2, static_cast<std::int64_t>(work.folder))
+        .bindBytes(3, bytesOf(work.contents))
+        .run();
+  });
+  if (error != nullptr) return error;
   work.number = _database->lastInsertedRow();
   return work;
 }

@@ -55,7 +55,8 @@ class CloudRecords {
       SKEIN_EXCLUDES(_mutex);
   Outcome<std::vector<CloudRecord>> recordsInZone(const CKRecordZoneID& zone)
       SKEIN_EXCLUDES(_mutex);
-  // Forgets all about the document; its contents become garbage unless others refer to them.
+  // Forgets all about the document. Its contents are unreferenced from now on, unless another
+  // record refers to them.
   NSErrorPtr remove(VLFileObjectID document) SKEIN_EXCLUDES(_mutex);
   // Only while the record still is of these contents: a thumbnail takes a while to make. A
   // power cut may lose it: it is then missing, and made again.
@@ -70,6 +71,46 @@ class CloudRecords {
   Outcome<std::uint64_t> references(const ContentHash& hash) SKEIN_EXCLUDES(_mutex);
   // What one's own documents take, equal contents counted for each: the quota's measure.
   std::uint64_t usedBytes() SKEIN_EXCLUDES(_mutex);
+
+  // Contents that no record refers to any more. They are kept for a while: see CloudCollector.
+  struct Unreferenced {
+    HashedContents contents;
+    NSDate since;
+    std::optional<NSDate> missed;  // when a look at the drive first saw no marker that names them
+    bool givenUp = false;          // a document was evicted to them, or nobody knows
+  };
+  // Notes what a look at the drive that began at `look` saw: `named`, sorted, are the contents
+  // that markers name, whose time begins anew. Answers all, the oldest first, as they were
+  // `missed` before this look.
+  Outcome<std::vector<Unreferenced>> noteLook(const std::vector<ContentHash>& named, NSDate look)
+      SKEIN_EXCLUDES(_mutex);
+  // Forgets those of the contents that no record refers to, and that have been so since before
+  // the look: these may be removed.
+  Outcome<std::vector<ContentHash>> release(const std::vector<ContentHash>& contents, NSDate look)
+      SKEIN_EXCLUDES(_mutex);
+  // Whether a record refers to the contents, or they are known as unreferenced.
+  Outcome<bool> isKnown(const ContentHash& hash) SKEIN_EXCLUDES(_mutex);
+  // Contents of which nothing is known count as given up.
+  NSErrorPtr addUnknown(const HashedContents& contents, NSDate now) SKEIN_EXCLUDES(_mutex);
+  // The same, once, of all contents that were there before these records.
+  NSErrorPtr adopt(const std::vector<HashedContents>& contents, NSDate now) SKEIN_EXCLUDES(_mutex);
+  Outcome<bool> hasAdopted() SKEIN_EXCLUDES(_mutex);
+
+  struct Kept {
+    std::uint64_t files = 0;
+    std::uint64_t bytes = 0;
+    std::uint64_t givenUpBytes = 0;  // of them, in contents that were given up
+  };
+  // What unreferenced contents take.
+  Outcome<Kept> kept() SKEIN_EXCLUDES(_mutex);
+
+  // How long they are kept, and how much of the disk they may take.
+  struct Keeping {
+    std::uint32_t days = 30;
+    std::uint32_t percent = 10;
+  };
+  Outcome<Keeping> keeping() SKEIN_EXCLUDES(_mutex);
+  NSErrorPtr setKeeping(const Keeping& keeping) SKEIN_EXCLUDES(_mutex);
 
   // The file as which the document was uploaded; nil while it is evicted, too.
   Outcome<std::optional<UploadStamp>> stamp(VLFileObjectID document) SKEIN_EXCLUDES(_mutex);
@@ -87,6 +128,7 @@ class CloudRecords {
     std::uint64_t folder = 0;  // the inode of its folder: where it is found after a move
     ContentHash contents;      // what the marker stands for
   };
+  // From now on the contents count as given up.
   Outcome<Work> beginWork(Work work) SKEIN_EXCLUDES(_mutex);
   // A power cut may lose it: recovery then finds nothing to do.
   NSErrorPtr endWork(const Work& work) SKEIN_EXCLUDES(_mutex);
@@ -98,8 +140,14 @@ class CloudRecords {
   NSErrorPtr measure() SKEIN_EXCLUDES(_mutex);
   Outcome<std::optional<CloudRecord>> find(VLFileObjectID document) SKEIN_REQUIRES(_mutex);
   NSErrorPtr write(const CloudRecord& record) SKEIN_REQUIRES(_mutex);
+  // The contents of a record that is gone, or has others now.
+  NSErrorPtr noteUnreferenced(const HashedContents& contents, NSDate since) SKEIN_REQUIRES(_mutex);
+  NSErrorPtr noteGivenUp(const ContentHash& hash) SKEIN_REQUIRES(_mutex);
   NSErrorPtr writeStamp(VLFileObjectID document, const std::optional<UploadStamp>& stamp)
       SKEIN_REQUIRES(_mutex);
+  // `unset`: what it is while nobody has set it.
+  Outcome<std::int64_t> setting(const char* name, std::int64_t unset) SKEIN_REQUIRES(_mutex);
+  NSErrorPtr writeSetting(const char* name, std::int64_t value) SKEIN_REQUIRES(_mutex);
 
   Mutex _mutex;
   const std::unique_ptr<CloudDatabase> _database SKEIN_PT_GUARDED_BY(_mutex);

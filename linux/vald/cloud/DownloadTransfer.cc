@@ -113,6 +113,8 @@ NSErrorPtr DownloadTransfer::transfer(const FileDescriptor& part) {
 
 NSErrorPtr DownloadTransfer::fetch(const FileDescriptor& part) {
   const HashedContents& wanted = _marker->marker.contents;
+  // Nothing is held when they are not there; that shows at once.
+  const auto hold = _places.contents.hold(wanted);
   const auto source = _places.contents.read(wanted.hash);
   if (!source) return source.error();
   struct stat status {};

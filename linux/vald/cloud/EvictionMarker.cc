@@ -190,7 +190,7 @@ std::string documentNameOfMarker(const std::string& markerName) {
   return markerName.substr(1, markerName.size() - 1 - kSuffix.size());
 }
 
-std::optional<EvictionMarker> readMarkerText(int file) {
+std::optional<EvictionMarker> readMarkerText(int file, int* unread) {
   struct stat status {};
   if (fstat(file, &status) != 0 || !S_ISREG(status.st_mode) || status.st_uid != geteuid()) {
     return std::nullopt;
@@ -200,9 +200,21 @@ std::optional<EvictionMarker> readMarkerText(int file) {
   do {
     size = pread(file, text.data(), text.size(), 0);
   } while (size < 0 && errno == EINTR);
+  if (size < 0 && unread != nullptr) *unread = errno;
   if (size < 0 || static_cast<std::size_t>(size) > kLargestMarker) return std::nullopt;
   text.resize(static_cast<std::size_t>(size));
   return EvictionMarker::parse(text);
+}
+
+bool isDamagedMarker(int file) {
+  struct stat status {};
+  if (fstat(file, &status) != 0 || !S_ISREG(status.st_mode) || status.st_uid != geteuid()) {
+    return false;
+  }
+  std::array<char, kFirstLine.size()> beginning{};
+  const ssize_t size = pread(file, beginning.data(), beginning.size(), 0);
+  return size == static_cast<ssize_t>(kFirstLine.size()) &&
+         std::string_view(beginning.data(), beginning.size()) == kFirstLine;
 }
 
 Outcome<OpenMarker> openMarker(const DirectoryHandle& folder, const std::string& markerName,

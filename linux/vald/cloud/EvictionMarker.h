@@ -86,8 +86,11 @@ std::string documentNameOfMarker(const std::string& markerName);
 // A document's name longer than this may be shortened in its marker's.
 inline constexpr std::size_t kLongestMarkerBeginning = 200;
 // What an open file says, if it is a plain file of this user's and a marker. Its position
-// stays.
-std::optional<EvictionMarker> readMarkerText(int file);
+// stays. `unread` is set to the errno when the file could not be read.
+std::optional<EvictionMarker> readMarkerText(int file, int* unread = nullptr);
+
+// Whether a file that is no marker begins as one: it was one. Only of this user's plain files.
+bool isDamagedMarker(int file);
 
 // A marker and the open file it was read from. NSCocoaErrorDomain 4 when there is no such
 // file, 259 when it is no marker. `path` is for errors.
