@@ -4,6 +4,7 @@
 #include <cerrno>
 #include <utility>
 
+#include "linux/vald/cloud/CloudRecovery.h"
 #include "linux/vald/files/FileErrors.h"
 #include "linux/vald/files/FileNames.h"
 
@@ -22,6 +23,15 @@ Files::Subject Files::subjectAt(const std::string& path) {
   Subject subject{findDocument(_parts.operations.roots(), path), nullptr};
   subject.item = _parts.store.itemAtPath(subject.place.path, false, nullptr);
   return subject;
+}
+
+NSErrorPtr Files::willLeave(const Subject& subject) const {
+  if (subject.place.isEvicted() || !subject.item ||
+      subject.item->fileObjectID().isFolderOrAliasID()) {
+    return nullptr;
+  }
+  return removeMarkerOfOlderVersion(_parts.places, subject.place.path,
+                                    subject.item->fileObjectID());
 }
 
 FileRequest Files::request(const Subject& subject, RequestOrigin origin) const {
@@ -146,6 +156,7 @@ void Files::answerMove(URLReply& reply, const Subject& subject, RequestOrigin or
 void Files::rename(NSURLPtr url, std::string newName, RequestOrigin origin, URLReply reply) {
   answer("url", url, std::move(reply), [=, this](URLReply& answered) {
     const Subject subject = subjectAt(url->path());
+    if (NSErrorPtr error = willLeave(subject)) return answerError(answered, error);
     answerMove(answered, subject, origin, [&](const FileRequest& asked) {
       return subject.place.isEvicted()
                  ? renameEvicted(subject, newName, asked)
@@ -158,6 +169,7 @@ void Files::move(NSURLPtr url, NSURLPtr folder, std::optional<std::string> newNa
                  RequestOrigin origin, URLReply reply) {
   answer("url", folder ? url : nullptr, std::move(reply), [=, this](URLReply& answered) {
     const Subject subject = subjectAt(url->path());
+    if (NSErrorPtr error = willLeave(subject)) return answerError(answered, error);
     answerMove(answered, subject, origin, [&](const FileRequest& asked) {
       return subject.place.isEvicted()
                  ? moveEvicted(subject, folder->path(), newName, bounce, asked)
@@ -172,6 +184,7 @@ std::shared_ptr<NSProgress> Files::remove(NSURLPtr url, RequestOrigin origin,
   auto progress = NSProgress::progressWithTotalUnitCount(0);
   answer("url", url, std::move(reply), [=, this](Reply<NSErrorPtr>& answered) {
     const Subject subject = subjectAt(url->path());
+    if (NSErrorPtr error = willLeave(subject)) return answered(error);
     FileRequest asked = request(subject, origin);
     const auto goesOn = [&] { return !progress->isCancelled(); };
     Task deletion;
@@ -199,6 +212,7 @@ std::shared_ptr<NSProgress> Files::remove(NSURLPtr url, RequestOrigin origin,
 void Files::trash(NSURLPtr url, RequestOrigin origin, URLReply reply) {
   answer("url", url, std::move(reply), [=, this](URLReply& answered) {
     const Subject subject = subjectAt(url->path());
+    if (NSErrorPtr error = willLeave(subject)) return answerError(answered, error);
     answerResult(answered,
                  _parts.operations.trash(subject.place.physical, request(subject, origin)),
                  {subject.place.path});

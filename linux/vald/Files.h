@@ -102,6 +102,8 @@ class Files final : public LocalFiles {
                });
   }
   Subject subjectAt(const std::string& path);
+  // Before the subject leaves its place. Null, or why it must not.
+  NSErrorPtr willLeave(const Subject& subject) const;
   FileRequest request(const Subject& subject, RequestOrigin origin) const;
   // Lets the store look, and answers with the path that people know.
   void answerResult(URLReply& reply, const FileResult& result, std::vector<std::string> touched);

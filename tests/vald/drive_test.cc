@@ -426,6 +426,29 @@ TEST_F(DriveTest, WhatIsTrashedKeepsItsIdentifierWhoeverTrashesIt) {
   EXPECT_EQ(history[0].identifier, folder.asString());
 }
 
+TEST_F(DriveTest, AnOlderVersionDoesNotComeBackWhenTheNewerFileLeaves) {
+  std::filesystem::create_directory(at("folder"));
+  open();
+  const std::function<std::string()> ways[] = {
+      [&] { return renamed("doc.txt", "other.txt"); }, [&] { return moved("doc.txt", "folder"); },
+      [&] { return trashed("doc.txt"); }, [&] { return removed("doc.txt"); }};
+  for (const auto& leave : ways) {
+    write("doc.txt", "old");
+    settle();
+    ASSERT_TRUE(uploaded("doc.txt"));
+    const std::string before = id("doc.txt");
+    ASSERT_EQ(evicted("doc.txt"), "");
+    write("doc.txt", "a newer version by another program");
+    settle();
+    ASSERT_TRUE(eventually([&] { return id("doc.txt") == before && exists("doc.txt"); }));
+    const std::string answer = leave();
+    EXPECT_FALSE(answer.starts_with('!')) << answer;
+    settle();
+    EXPECT_FALSE(exists(".doc.txt.skein")) << answer;
+    EXPECT_FALSE(item("doc.txt")) << answer;
+  }
+}
+
 TEST_F(DriveTest, HistoryTellsRequestsFromRemovalsByOthers) {
   write("mine.txt");
   write("theirs.txt");

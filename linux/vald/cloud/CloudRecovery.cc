@@ -1,9 +1,12 @@
 #include "linux/vald/cloud/CloudRecovery.h"
 
-#include <cerrno>
-#include <filesystem>
+#include <sys/stat.h>
 
+#include <cerrno>
+
+#include "linux/vald/cloud/CloudErrors.h"
 #include "linux/vald/cloud/EvictionMarker.h"
+#include "linux/vald/cloud/MarkerWalk.h"
 #include "linux/vald/cloud/UploadStamp.h"
 #include "linux/vald/files/FileErrors.h"
 #include "linux/vald/files/FileNames.h"
@@ -134,26 +137,25 @@ bool isFolderOf(const StorePlace& place, const CloudRecords::Work& work) {
 // folder itself wherever it is. Nil when it is in no root any more.
 Outcome<std::optional<StorePlace>> placeOf(const CloudPlaces& places,
                                            const CloudRecords::Work& work) {
-  namespace fs = std::filesystem;
   StorePlace place;
   NSErrorPtr error = places.roots.locate(work.path, place);
   if (error == nullptr && isFolderOf(place, work)) return std::optional(std::move(place));
   if (error != nullptr && error->code() != NSFileNoSuchFileError) return error;
-  for (const auto& root : places.roots.list()) {
-    std::error_code failure;
-    fs::recursive_directory_iterator entry(root->path,
-                                           fs::directory_options::skip_permission_denied, failure);
-    for (; !failure && entry != fs::recursive_directory_iterator(); entry.increment(failure)) {
-      std::error_code ignored;
-      if (!entry->is_directory(ignored) || entry->is_symlink(ignored)) continue;
-      const std::string path = joinPath(entry->path().string(), nameOfPath(work.path));
-      StorePlace moved;
-      if (places.roots.locate(path, moved) == nullptr && isFolderOf(moved, work)) {
-        return std::optional(std::move(moved));
-      }
-    }
-    if (failure) return fileError(failure.value(), "can't look for", work.path);
-  }
+  std::optional<StorePlace> found;
+  NSErrorPtr stopped = walkEntries(
+      places.roots, Unreadable::IsSkipped, Cancellation(),
+      [&](const std::string& folderPath, const DirectoryHandle&, const std::string& name,
+          const struct stat& status) -> NSErrorPtr {
+        if (!S_ISDIR(status.st_mode) || status.st_ino != work.folder) return nullptr;
+        StorePlace moved;
+        const std::string path = joinPath(joinPath(folderPath, name), nameOfPath(work.path));
+        if (places.roots.locate(path, moved) == nullptr && isFolderOf(moved, work)) {
+          found = std::move(moved);
+        }
+        return found ? cancelledError() : nullptr;  // that is all
+      });
+  if (found) return found;
+  if (stopped != nullptr) return stopped;
   return error == nullptr ? std::optional(std::move(place)) : std::nullopt;
 }
 
@@ -204,6 +206,23 @@ NSErrorPtr removeStaleMarker(const CloudPlaces& places, const StorePlace& place,
   int code = places.files.unlink(place.folder.get(), names.marker);
   if (code == 0) code = places.files.sync(place.folder.get());
   return code == 0 ? nullptr : fileError(code, "can't remove the old marker of", place.path());
+}
+
+NSErrorPtr removeMarkerOfOlderVersion(const CloudPlaces& places, const std::string& path,
+                                      VLFileObjectID document) {
+  StorePlace place;
+  if (places.roots.locate(path, place) != nullptr || place.isRoot()) return nullptr;
+  const MarkerNames names(place.name);
+  if (!place.folder.exists(names.marker)) return nullptr;
+  const auto lock = places.coordinate(path);
+  if (!lock) return lock.error();
+  const auto marker = openMarker(place.folder, names.marker, path);
+  if (!marker || marker->marker.document != document || !place.folder.exists(place.name)) {
+    return nullptr;
+  }
+  int code = places.files.unlink(place.folder.get(), names.marker);
+  if (code == 0) code = places.files.sync(place.folder.get());
+  return code == 0 ? nullptr : fileError(code, "can't remove the old marker of", path);
 }
 
 NSErrorPtr recoverUnfinishedWork(const CloudPlaces& places) {

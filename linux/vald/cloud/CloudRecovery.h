@@ -28,7 +28,13 @@ NSErrorPtr recoverNoted(const CloudPlaces& places, const StorePlace& place);
 NSErrorPtr removeStaleMarker(const CloudPlaces& places, const StorePlace& place,
                              VLFileObjectID document);
 
-// The same for everything that was under way when the process ended. At start, before the
+// A document's file that is about to leave its place would leave the marker of an older version
+// behind, which would then stand for the document: removes that. Nothing happens where there is
+// no such marker. Takes the place's lock.
+NSErrorPtr removeMarkerOfOlderVersion(const CloudPlaces& places, const std::string& path,
+                                      VLFileObjectID document);
+
+// recoverPlace() for everything that was under way when the process ended. At start, before the
 // first eviction or download. Goes on after a place that cannot be mended, which stays noted
 // for the next start, and answers the first error. A folder that was moved is looked for; one
 // that is gone is in order.
