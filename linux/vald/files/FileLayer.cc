@@ -198,7 +198,7 @@ int FileLayer::writeBehind(int file, std::uint64_t from, std::uint64_t to) {
 }
 
 int FileLayer::sync(int file) {
-  if (const int fault = beforeStep(FileStep::Sync, {})) return fault;
+  if (const int fault = beforeStep(FileStep::Sync, descriptorPath(file))) return fault;
   const int failure = result([&] { return ::fsync(file); });
   return failure == EINVAL || failure == ENOSYS ? 0 : failure;
 }
