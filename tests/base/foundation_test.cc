@@ -7,6 +7,7 @@
 #include <vector>
 
 #include "platform/fileprovider/NSFileProviderError.h"
+#include "platform/foundation/NSData.h"
 #include "platform/foundation/NSNotificationCenter.h"
 #include "platform/foundation/NSProgress.h"
 #include "platform/foundation/NSURL.h"
@@ -101,6 +102,19 @@ TEST(URL, TakesPathsApartAndComparesByPathAlone) {
   EXPECT_TRUE(isEqualURL(url, copy));
   EXPECT_FALSE(isEqualURL(url, nullptr));
   EXPECT_TRUE(isEqualURL(nullptr, nullptr));
+}
+
+TEST(Data, ComesFromPlainFilesAloneAndWhole) {
+  const auto read = [](const char* path) {
+    return NSData::dataWithContentsOfURL(NSURL::fileURLWithPath(path));
+  };
+  // Longer than its size tells.
+  ASSERT_TRUE(read("/proc/self/status"));
+  EXPECT_GT(read("/proc/self/status")->length(), 100u);
+  EXPECT_FALSE(read("/dev/null"));
+  EXPECT_FALSE(read("/proc/self/mem"));  // cannot be read at its start
+  EXPECT_FALSE(read("/"));
+  EXPECT_FALSE(NSData::dataWithContentsOfURL(nullptr));
 }
 
 TEST(FileObjectID, ParsesExactlyWhatItPrints) {

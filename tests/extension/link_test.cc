@@ -40,6 +40,10 @@ TEST_F(Link, AFailedSetupLeavesItUnlinkedAndTheNextTriesAgain) {
   setUpReceiving();
   daemon.senders.next()->reply(nullptr, kVellum9);
   EXPECT_EQ(env.run(), (Lines{"daemon: sender", "set up: VLVellumErrorDomain 9"}));
+  // A sender beside an error is not used.
+  setUpReceiving();
+  daemon.senders.next()->reply(daemon.makeSender(), kVellum9);
+  EXPECT_EQ(env.run(), (Lines{"daemon: sender", "set up: VLVellumErrorDomain 9"}));
   setUpReceiving();
   daemon.senders.next()->fail(kCocoa14);
   // The connection's error ends it at once, on the reply thread.

@@ -49,6 +49,8 @@ TEST_F(ContainerIcons, SizesAreCutToASquareOfAtMost120) {
   }
   EXPECT_EQ(env.run(), Lines{});
   EXPECT_EQ(vl_stringWithSize({1, 2.345}), "{1.00, 2.35}");
+  // Nothing is cut: 60 digits before each point.
+  EXPECT_EQ(vl_stringWithSize({1e60, 1e60}).size(), 130u);
 }
 
 TEST_F(ContainerIcons, AnIconAndWhetherItIsAnAppsOrWhyThereIsNone) {
