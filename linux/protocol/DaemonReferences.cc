@@ -3,7 +3,6 @@
 #include <utility>
 
 #include "linux/protocol/Answer.h"
-#include "linux/protocol/DocumentURL.h"
 #include "linux/protocol/LinkBreaking.h"
 #include "vellum/VLErrors.h"
 
@@ -140,8 +139,7 @@ kj::Promise<void> SenderObject::boostPriority(BoostPriorityContext context) {
 
 kj::Promise<void> SenderObject::watchItem(WatchItemContext context) {
   const auto params = context.getParams();
-  NSURLPtr url = urlFromClient(params.getUrl());
-  if (url && params.hasItem()) url = documentURL(url->path(), codec::decode(params.getItem()));
+  const NSURLPtr url = itemURLFromClient(params);
   const std::uint64_t options = params.getOptions();
   return answer(
       _service, context,

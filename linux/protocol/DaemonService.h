@@ -11,6 +11,7 @@
 #include "base/Executor.h"
 #include "linux/protocol/CallFaults.h"
 #include "linux/protocol/Codec.h"
+#include "linux/protocol/DocumentURL.h"
 #include "linux/protocol/LocalDaemon.h"
 #include "linux/protocol/RpcConnection.h"
 #include "linux/protocol/RpcLoop.h"
@@ -59,5 +60,11 @@ using DaemonServicePtr = std::shared_ptr<DaemonService>;
 
 // A client's path: absolute, without NUL, "." and ".."; null otherwise.
 NSURLPtr urlFromClient(capnp::Data::Reader path);
+
+// The same of a call's parameters, as the place of the item that they name, where they name one.
+NSURLPtr itemURLFromClient(const auto& params) {
+  NSURLPtr url = urlFromClient(params.getUrl());
+  return url && params.hasItem() ? documentURL(url->path(), codec::decode(params.getItem())) : url;
+}
 
 }  // namespace skein

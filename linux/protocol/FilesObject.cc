@@ -87,7 +87,7 @@ kj::Promise<void> FilesObject::makeAlias(MakeAliasContext context) {
 kj::Promise<void> FilesObject::rename(RenameContext context) {
   const auto params = context.getParams();
   return answerURL(context, [&](auto reply) {
-    files().rename(urlFromClient(params.getUrl()), codec::text(params.getNewName()),
+    files().rename(itemURLFromClient(params), codec::text(params.getNewName()),
                    codec::text(params.getOrigin()), std::move(reply));
   });
 }
@@ -95,7 +95,7 @@ kj::Promise<void> FilesObject::rename(RenameContext context) {
 kj::Promise<void> FilesObject::move(MoveContext context) {
   const auto params = context.getParams();
   return answerURL(context, [&](auto reply) {
-    files().move(urlFromClient(params.getUrl()), urlFromClient(params.getFolder()),
+    files().move(itemURLFromClient(params), urlFromClient(params.getFolder()),
                  nameOf(params.hasNewName(), params.getNewName()), params.getBounce(),
                  codec::text(params.getOrigin()), std::move(reply));
   });
@@ -104,7 +104,7 @@ kj::Promise<void> FilesObject::move(MoveContext context) {
 kj::Promise<void> FilesObject::remove(RemoveContext context) {
   const auto params = context.getParams();
   return startTransfer(context, [&](LocalFiles::URLReply reply) {
-    return files().remove(urlFromClient(params.getUrl()), codec::text(params.getOrigin()),
+    return files().remove(itemURLFromClient(params), codec::text(params.getOrigin()),
                           errorAlone(std::move(reply)));
   });
 }
@@ -112,8 +112,7 @@ kj::Promise<void> FilesObject::remove(RemoveContext context) {
 kj::Promise<void> FilesObject::trash(TrashContext context) {
   const auto params = context.getParams();
   return answerURL(context, [&](auto reply) {
-    files().trash(urlFromClient(params.getUrl()), codec::text(params.getOrigin()),
-                  std::move(reply));
+    files().trash(itemURLFromClient(params), codec::text(params.getOrigin()), std::move(reply));
   });
 }
 
@@ -139,7 +138,7 @@ kj::Promise<void> FilesObject::capabilityToMove(CapabilityToMoveContext context)
 
 kj::Promise<void> FilesObject::coordinateDeletion(CoordinateDeletionContext context) {
   return answerURL(context, [&](auto reply) {
-    files().coordinateDeletion(urlFromClient(context.getParams().getUrl()), std::move(reply));
+    files().coordinateDeletion(itemURLFromClient(context.getParams()), std::move(reply));
   });
 }
 
@@ -160,7 +159,7 @@ kj::Promise<void> FilesObject::setTagNames(SetTagNamesContext context) {
   return answer(
       _service, context,
       [&](auto reply) {
-        files().setTagNames(urlFromClient(params.getUrl()), codec::decode(params.getNames()),
+        files().setTagNames(itemURLFromClient(params), codec::decode(params.getNames()),
                             std::move(reply));
       },
       codec::encodeError);
@@ -173,7 +172,7 @@ kj::Promise<void> FilesObject::setLastOpenDate(SetLastOpenDateContext context) {
   return answer(
       _service, context,
       [&](auto reply) {
-        files().setLastOpenDate(urlFromClient(params.getUrl()), date, std::move(reply));
+        files().setLastOpenDate(itemURLFromClient(params), date, std::move(reply));
       },
       codec::encodeError);
 }
@@ -185,7 +184,7 @@ kj::Promise<void> FilesObject::setFavoriteRank(SetFavoriteRankContext context) {
   return answer(
       _service, context,
       [&](auto reply) {
-        files().setFavoriteRank(urlFromClient(params.getUrl()), rank, std::move(reply));
+        files().setFavoriteRank(itemURLFromClient(params), rank, std::move(reply));
       },
       codec::encodeError);
 }
@@ -202,7 +201,7 @@ kj::Promise<void> FilesObject::tagsInUse(TagsInUseContext context) {
 kj::Promise<void> FilesObject::download(DownloadContext context) {
   const auto params = context.getParams();
   return startTransfer(context, [&](LocalFiles::URLReply reply) {
-    return files().download(urlFromClient(params.getUrl()), params.getCurrentVersion(),
+    return files().download(itemURLFromClient(params), params.getCurrentVersion(),
                             errorAlone(std::move(reply)));
   });
 }
@@ -210,9 +209,7 @@ kj::Promise<void> FilesObject::download(DownloadContext context) {
 kj::Promise<void> FilesObject::evict(EvictContext context) {
   return answer(
       _service, context,
-      [&](auto reply) {
-        files().evict(urlFromClient(context.getParams().getUrl()), std::move(reply));
-      },
+      [&](auto reply) { files().evict(itemURLFromClient(context.getParams()), std::move(reply)); },
       codec::encodeError);
 }
 
@@ -221,7 +218,7 @@ kj::Promise<void> FilesObject::setPinned(SetPinnedContext context) {
   return answer(
       _service, context,
       [&](auto reply) {
-        files().setPinned(urlFromClient(params.getUrl()), params.getPinned(), std::move(reply));
+        files().setPinned(itemURLFromClient(params), params.getPinned(), std::move(reply));
       },
       codec::encodeError);
 }

@@ -3,6 +3,7 @@
 #include <utility>
 
 #include "linux/protocol/DaemonCalls.h"
+#include "linux/protocol/DocumentURL.h"
 #include "linux/protocol/FilesCodec.h"
 #include "linux/protocol/TransferProxy.h"
 
@@ -13,12 +14,24 @@ NSURLPtr urlOf(const auto& results) {
   return results.hasUrl() ? NSURL::fileURLWithPath(codec::text(results.getUrl())) : nullptr;
 }
 
+// The URL, and the item that was looked up there.
+void setItemURL(auto& request, const NSURLPtr& url) {
+  if (!url) return;
+  request.setUrl(codec::bytes(url->path()));
+  if (const auto item = fileObjectIDOfDocumentURL(url)) codec::encode(request.initItem(), *item);
+}
+
 // For an answer that is a URL or an error.
 auto urlReply(LocalFiles::URLReply reply) {
   return [reply = std::move(reply)](const auto& results) mutable -> Task {
     return [reply = std::move(reply), url = urlOf(results),
             error = codec::errorOf(results)]() mutable { reply(std::move(url), std::move(error)); };
   };
+}
+
+// `url` as a place of the item that was asked about, where one was.
+NSURLPtr ofItem(const std::optional<VLFileObjectID>& item, NSURLPtr url) {
+  return url && item ? documentURL(url->path(), *item) : url;
 }
 
 // For an answer that is a list or an error.
@@ -82,7 +95,7 @@ class FilesProxy final : public LocalFiles {
     change(
         [=](wire::Files::Client& files) {
           auto request = files.renameRequest();
-          if (url) request.setUrl(codec::bytes(url->path()));
+          setItemURL(request, url);
           request.setNewName(codec::bytes(newName));
           request.setOrigin(codec::bytes(origin));
           return request.send();
@@ -95,7 +108,7 @@ class FilesProxy final : public LocalFiles {
     change(
         [=](wire::Files::Client& files) {
           auto request = files.moveRequest();
-          if (url) request.setUrl(codec::bytes(url->path()));
+          setItemURL(request, url);
           if (folder) request.setFolder(codec::bytes(folder->path()));
           if (newName) request.setNewName(codec::bytes(*newName));
           request.setBounce(bounce);
@@ -110,7 +123,7 @@ class FilesProxy final : public LocalFiles {
     return transfer(
         [=](wire::Files::Client& files) {
           auto request = files.removeRequest();
-          if (url) request.setUrl(codec::bytes(url->path()));
+          setItemURL(request, url);
           request.setOrigin(codec::bytes(origin));
           return request;
         },
@@ -123,7 +136,7 @@ class FilesProxy final : public LocalFiles {
     change(
         [=](wire::Files::Client& files) {
           auto request = files.trashRequest();
-          if (url) request.setUrl(codec::bytes(url->path()));
+          setItemURL(request, url);
           request.setOrigin(codec::bytes(origin));
           return request.send();
         },
@@ -160,10 +173,13 @@ class FilesProxy final : public LocalFiles {
     change(
         [=](wire::Files::Client& files) {
           auto request = files.coordinateDeletionRequest();
-          if (url) request.setUrl(codec::bytes(url->path()));
+          setItemURL(request, url);
           return request.send();
         },
-        urlReply(std::move(reply)));
+        urlReply([item = fileObjectIDOfDocumentURL(url), reply = std::move(reply)](
+                     NSURLPtr there, NSErrorPtr error) mutable {
+          reply(ofItem(item, std::move(there)), std::move(error));
+        }));
   }
 
   void physicalURL(NSURLPtr url, Reply<NSURLPtr, bool, NSErrorPtr> reply) override {
@@ -173,8 +189,9 @@ class FilesProxy final : public LocalFiles {
           if (url) request.setUrl(codec::bytes(url->path()));
           return request.send();
         },
-        [reply = std::move(reply)](const auto& results) mutable -> Task {
-          return [reply = std::move(reply), physical = urlOf(results),
+        [item = fileObjectIDOfDocumentURL(url),
+         reply = std::move(reply)](const auto& results) mutable -> Task {
+          return [reply = std::move(reply), physical = ofItem(item, urlOf(results)),
                   isMarker = results.getIsMarker(), error = codec::errorOf(results)]() mutable {
             reply(std::move(physical), isMarker, std::move(error));
           };
@@ -185,7 +202,7 @@ class FilesProxy final : public LocalFiles {
     change(
         [=](wire::Files::Client& files) {
           auto request = files.setTagNamesRequest();
-          if (url) request.setUrl(codec::bytes(url->path()));
+          setItemURL(request, url);
           codec::encode(request.initNames(static_cast<unsigned>(names.size())), names);
           return request.send();
         },
@@ -196,7 +213,7 @@ class FilesProxy final : public LocalFiles {
     change(
         [=](wire::Files::Client& files) {
           auto request = files.setLastOpenDateRequest();
-          if (url) request.setUrl(codec::bytes(url->path()));
+          setItemURL(request, url);
           request.setHasDate(date.has_value());
           if (date) request.setDate(codec::moment(*date));
           return request.send();
@@ -209,7 +226,7 @@ class FilesProxy final : public LocalFiles {
     change(
         [=](wire::Files::Client& files) {
           auto request = files.setFavoriteRankRequest();
-          if (url) request.setUrl(codec::bytes(url->path()));
+          setItemURL(request, url);
           request.setHasRank(rank.has_value());
           if (rank) request.setRank(*rank);
           return request.send();
@@ -232,7 +249,7 @@ class FilesProxy final : public LocalFiles {
     return transfer(
         [=](wire::Files::Client& files) {
           auto request = files.downloadRequest();
-          if (url) request.setUrl(codec::bytes(url->path()));
+          setItemURL(request, url);
           request.setCurrentVersion(currentVersion);
           return request;
         },
@@ -245,7 +262,7 @@ class FilesProxy final : public LocalFiles {
     change(
         [=](wire::Files::Client& files) {
           auto request = files.evictRequest();
-          if (url) request.setUrl(codec::bytes(url->path()));
+          setItemURL(request, url);
           return request.send();
         },
         errorReply(std::move(reply)));
@@ -255,7 +272,7 @@ class FilesProxy final : public LocalFiles {
     change(
         [=](wire::Files::Client& files) {
           auto request = files.setPinnedRequest();
-          if (url) request.setUrl(codec::bytes(url->path()));
+          setItemURL(request, url);
           request.setPinned(pinned);
           return request.send();
         },

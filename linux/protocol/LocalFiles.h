@@ -48,7 +48,9 @@ struct TagUse {
 // Asynchronous, as VLDaemon: a call returns at once; its reply runs later, once, on a reply
 // thread, or the proxy's error handler runs instead. URLs are absolute file URLs in the
 // store unless said otherwise; a null one is answered with an invalid-parameter error. An
-// item that is not present is named by the URL it would have.
+// item that is not present is named by the URL it would have. A URL that remembers an item (see
+// DocumentURL.h) names that item: another one that stands there by now is left alone, and the
+// answer is that the item is not there.
 //
 // Errors: NSCocoaErrorDomain 4 for what is not there, 516 with the colliding URL for a name
 // that is taken, 513 for what permissions or the move rule forbid, 514 for a name that cannot

@@ -4,6 +4,7 @@
 #include <cerrno>
 #include <utility>
 
+#include "linux/protocol/DocumentURL.h"
 #include "linux/vald/cloud/CloudRecovery.h"
 #include "linux/vald/files/FileErrors.h"
 #include "linux/vald/files/FileNames.h"
@@ -19,9 +20,28 @@ NSURLPtr urlOf(const std::string& path) {
 
 }  // namespace
 
-Files::Subject Files::subjectAt(const std::string& path) {
-  Subject subject{findDocument(_parts.operations.roots(), path), nullptr};
-  subject.item = _parts.store.itemAtPath(subject.place.path, false, nullptr);
+Files::Subject Files::subjectAt(const NSURLPtr& url) {
+  const StoreRoots& roots = _parts.operations.roots();
+  Subject subject{findDocument(roots, url->path()), nullptr, std::nullopt, nullptr};
+  const auto id = fileObjectIDOfDocumentURL(url);
+  StorePlace there;
+  bool mayMove = true;  // roots and their trashes stay, and are no items of a folder
+  if (!roots.locate(url->path(), there)) {
+    const auto trashed = trashedPath(there.relative);
+    mayMove = !there.isRoot() && !(trashed && trashed->name.empty());
+  }
+  if (!id || !mayMove) {
+    subject.item = _parts.store.itemAtPath(subject.place.path, false, nullptr);
+    return subject;
+  }
+  if (recognize(subject, *id)) return subject;
+  // What happened a moment ago may be unknown yet: the file was saved, or has moved.
+  _parts.store.catchUp(subject.place.path);
+  subject.place = findDocument(roots, url->path());
+  if (recognize(subject, *id)) return subject;
+  const bool isTaken =
+      !roots.locate(subject.place.physical, there) && there.folder.exists(there.name);
+  subject.error = fileError(isTaken ? ESTALE : ENOENT, "can't find", subject.place.path);
   return subject;
 }
 
@@ -34,10 +54,29 @@ NSErrorPtr Files::willLeave(const Subject& subject) const {
                                     subject.item->fileObjectID());
 }
 
+bool Files::recognize(Subject& subject, VLFileObjectID id) {
+  const auto known = _parts.store.knownItem(id);
+  StorePlace there;
+  FileKey file;
+  if (!known || known->path != subject.place.path ||
+      _parts.operations.roots().locate(subject.place.physical, there) ||
+      readFileKey(there.folder.get(), there.name, file) != 0 || !known->file.names(file)) {
+    return false;
+  }
+  subject.item = known->item;
+  subject.file = file;
+  return true;
+}
+
+void Files::lookAgainAfter(const NSErrorPtr& error, const Subject& subject) {
+  if (isAnotherFileError(error)) _parts.store.catchUp(subject.place.path);
+}
+
 FileRequest Files::request(const Subject& subject, RequestOrigin origin) const {
   FileRequest request;
   request.origin = std::move(origin);
   if (subject.item) request.document = subject.item->fileObjectID().asString();
+  request.file = subject.file;
   return request;
 }
 
@@ -150,12 +189,14 @@ void Files::answerMove(URLReply& reply, const Subject& subject, RequestOrigin or
     // It was taken back.
     _parts.store.lookAtPaths(places);
   }
+  lookAgainAfter(result.error, subject);
   answerResult(reply, result, std::move(places));
 }
 
 void Files::rename(NSURLPtr url, std::string newName, RequestOrigin origin, URLReply reply) {
   answer("url", url, std::move(reply), [=, this](URLReply& answered) {
-    const Subject subject = subjectAt(url->path());
+    const Subject subject = subjectAt(url);
+    if (subject.error) return answerError(answered, subject.error);
     if (NSErrorPtr error = willLeave(subject)) return answerError(answered, error);
     answerMove(answered, subject, origin, [&](const FileRequest& asked) {
       return subject.place.isEvicted()
@@ -168,7 +209,8 @@ void Files::rename(NSURLPtr url, std::string newName, RequestOrigin origin, URLR
 void Files::move(NSURLPtr url, NSURLPtr folder, std::optional<std::string> newName, bool bounce,
                  RequestOrigin origin, URLReply reply) {
   answer("url", folder ? url : nullptr, std::move(reply), [=, this](URLReply& answered) {
-    const Subject subject = subjectAt(url->path());
+    const Subject subject = subjectAt(url);
+    if (subject.error) return answerError(answered, subject.error);
     if (NSErrorPtr error = willLeave(subject)) return answerError(answered, error);
     answerMove(answered, subject, origin, [&](const FileRequest& asked) {
       return subject.place.isEvicted()
@@ -183,7 +225,8 @@ std::shared_ptr<NSProgress> Files::remove(NSURLPtr url, RequestOrigin origin,
                                           Reply<NSErrorPtr> reply) {
   auto progress = NSProgress::progressWithTotalUnitCount(0);
   answer("url", url, std::move(reply), [=, this](Reply<NSErrorPtr>& answered) {
-    const Subject subject = subjectAt(url->path());
+    const Subject subject = subjectAt(url);
+    if (subject.error) return answered(subject.error);
     if (NSErrorPtr error = willLeave(subject)) return answered(error);
     FileRequest asked = request(subject, origin);
     const auto goesOn = [&] { return !progress->isCancelled(); };
@@ -202,6 +245,7 @@ std::shared_ptr<NSProgress> Files::remove(NSURLPtr url, RequestOrigin origin,
         places.push_back(documentPath(&_parts.operations.roots(), result.path));
       }
       _parts.store.lookAtPaths(places);
+      lookAgainAfter(result.error, subject);
     }
     answered(result.error);
     if (deletion) _parts.importExecutor->post(std::move(deletion));
@@ -211,11 +255,13 @@ std::shared_ptr<NSProgress> Files::remove(NSURLPtr url, RequestOrigin origin,
 
 void Files::trash(NSURLPtr url, RequestOrigin origin, URLReply reply) {
   answer("url", url, std::move(reply), [=, this](URLReply& answered) {
-    const Subject subject = subjectAt(url->path());
+    const Subject subject = subjectAt(url);
+    if (subject.error) return answerError(answered, subject.error);
     if (NSErrorPtr error = willLeave(subject)) return answerError(answered, error);
-    answerResult(answered,
-                 _parts.operations.trash(subject.place.physical, request(subject, origin)),
-                 {subject.place.path});
+    const FileResult result =
+        _parts.operations.trash(subject.place.physical, request(subject, origin));
+    lookAgainAfter(result.error, subject);
+    answerResult(answered, result, {subject.place.path});
   });
 }
 
@@ -242,16 +288,20 @@ void Files::capabilityToMove(NSURLPtr url, NSURLPtr toURL, Reply<std::uint64_t, 
 
 void Files::coordinateDeletion(NSURLPtr url, URLReply reply) {
   answer("url", url, std::move(reply), [=, this](URLReply& answered) {
-    const Subject subject = subjectAt(url->path());
+    const Subject subject = subjectAt(url);
     NSErrorPtr error = _parts.operations.waitFor(subject.place.physical);
     std::string path = subject.place.path;
+    auto id = fileObjectIDOfDocumentURL(url);
+    if (!id && subject.item) id = subject.item->fileObjectID();
     // What it waited for may have moved the item.
-    if (error && error->code() == NSFileNoSuchFileError && subject.item) {
-      const auto now = _parts.store.pathForID(subject.item->fileObjectID(), nullptr);
+    if (error && error->code() == NSFileNoSuchFileError && id) {
+      const auto now = _parts.store.pathForID(*id, nullptr);
       if (now && *now != path) {
         path = *now;
         error = nullptr;
       }
+    } else if (!error) {
+      error = subject.error;
     }
     answered(error ? nullptr : urlOf(path), error);
   });

@@ -89,7 +89,10 @@ class Files final : public LocalFiles {
   // A request about one item: where it is, and who it is.
   struct Subject {
     DocumentPlace place;
-    VLQueryItemPtr item;  // null when the store does not know it
+    VLQueryItemPtr item;          // null when the store does not know it
+    std::optional<FileKey> file;  // of an item that was named by its identifier
+    // Why nothing can be done: the item that was named is not at the URL any more.
+    NSErrorPtr error;
   };
 
   // Posts `work(reply)`, or the answer that a URL is missing.
@@ -101,9 +104,13 @@ class Files final : public LocalFiles {
                  error ? answerError(answered, error) : work(answered);
                });
   }
-  Subject subjectAt(const std::string& path);
+  Subject subjectAt(const NSURLPtr& url);
   // Before the subject leaves its place. Null, or why it must not.
   NSErrorPtr willLeave(const Subject& subject) const;
+  // Whether the item is at the subject's place; then the subject is that item.
+  bool recognize(Subject& subject, VLFileObjectID id);
+  // After an error: another file that came between is looked at.
+  void lookAgainAfter(const NSErrorPtr& error, const Subject& subject);
   FileRequest request(const Subject& subject, RequestOrigin origin) const;
   // Lets the store look, and answers with the path that people know.
   void answerResult(URLReply& reply, const FileResult& result, std::vector<std::string> touched);
@@ -126,7 +133,7 @@ class Files final : public LocalFiles {
   NSErrorPtr changeDetails(const Subject& subject, std::function<void(ItemDetails&)> change);
   void answerDetails(const NSURLPtr& url, std::function<void(ItemDetails&)> change,
                      Reply<NSErrorPtr> reply);
-  void startDownload(const std::string& path, const std::shared_ptr<NSProgress>& progress,
+  void startDownload(const NSURLPtr& url, const std::shared_ptr<NSProgress>& progress,
                      Reply<NSErrorPtr> reply);
   // Everything in the trash, what was thrown away last first.
   TrashListings::Items trashInOrder(NSErrorOut error);

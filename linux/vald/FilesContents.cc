@@ -14,20 +14,21 @@ std::shared_ptr<NSProgress> Files::download(NSURLPtr url, bool, Reply<NSErrorPtr
   // it, and a marker stands for it.
   auto progress = NSProgress::progressWithTotalUnitCount(0);
   answer("url", url, std::move(reply), [=, this](Reply<NSErrorPtr>& answered) {
-    startDownload(url->path(), progress, std::move(answered));
+    startDownload(url, progress, std::move(answered));
   });
   return progress;
 }
 
-void Files::startDownload(const std::string& path, const std::shared_ptr<NSProgress>& progress,
+void Files::startDownload(const NSURLPtr& url, const std::shared_ptr<NSProgress>& progress,
                           Reply<NSErrorPtr> reply) {
-  const Subject subject = subjectAt(path);
+  const Subject subject = subjectAt(url);
+  if (subject.error) return reply(subject.error);
   const DocumentPlace& place = subject.place;
   if (!place.isEvicted()) {
     StorePlace there;
-    NSErrorPtr error = _parts.operations.roots().locate(path, there);
+    NSErrorPtr error = _parts.operations.roots().locate(place.path, there);
     if (!error && !there.isRoot() && !there.folder.exists(there.name)) {
-      error = fileError(ENOENT, "can't download", path);
+      error = fileError(ENOENT, "can't download", place.path);
     }
     reply(error);
     return;
@@ -59,7 +60,8 @@ void Files::startDownload(const std::string& path, const std::shared_ptr<NSProgr
 
 void Files::evict(NSURLPtr url, Reply<NSErrorPtr> reply) {
   answer("url", url, std::move(reply), [=, this](Reply<NSErrorPtr>& answered) {
-    const Subject subject = subjectAt(url->path());
+    const Subject subject = subjectAt(url);
+    if (subject.error) return answered(subject.error);
     Eviction::Request request;
     request.path = subject.place.path;
     if (subject.item) {
@@ -88,7 +90,8 @@ void Files::evict(NSURLPtr url, Reply<NSErrorPtr> reply) {
 
 void Files::setPinned(NSURLPtr url, bool pinned, Reply<NSErrorPtr> reply) {
   answer("url", url, std::move(reply), [=, this](Reply<NSErrorPtr>& answered) {
-    const Subject subject = subjectAt(url->path());
+    const Subject subject = subjectAt(url);
+    if (subject.error) return answered(subject.error);
     if (!subject.item) return answered(fileError(ENOENT, "can't find", url->path()));
     if (subject.item->properties().kind != VLQueryItem::Kind::Document) {
       return answered(fileErrorWithWords(NSFileWriteNoPermissionError, EINVAL,

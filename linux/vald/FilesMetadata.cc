@@ -32,7 +32,8 @@ std::optional<std::int64_t> nanoseconds(const std::optional<NSDate>& date) {
 
 bool Files::writeHint(const Subject& subject) {
   const VLFileObjectID id = subject.item->fileObjectID();
-  return !id.isFolderOrAliasID() && _parts.operations.writeHint(subject.place.physical, id.rawID());
+  return !id.isFolderOrAliasID() &&
+         _parts.operations.writeHint(subject.place.physical, id.rawID(), subject.file);
 }
 
 NSErrorPtr Files::changeDetails(const Subject& subject, std::function<void(ItemDetails&)> change) {
@@ -43,7 +44,8 @@ NSErrorPtr Files::changeDetails(const Subject& subject, std::function<void(ItemD
 void Files::answerDetails(const NSURLPtr& url, std::function<void(ItemDetails&)> change,
                           Reply<NSErrorPtr> reply) {
   answer("url", url, std::move(reply), [=, this](Reply<NSErrorPtr>& answered) {
-    const Subject subject = subjectAt(url->path());
+    const Subject subject = subjectAt(url);
+    if (subject.error) return answered(subject.error);
     NSErrorPtr error = changeDetails(subject, change);
     if (!error && writeHint(subject)) _parts.store.lookAtPaths({subject.place.path});
     answered(std::move(error));
@@ -52,17 +54,21 @@ void Files::answerDetails(const NSURLPtr& url, std::function<void(ItemDetails&)>
 
 void Files::setTagNames(NSURLPtr url, std::vector<std::string> names, Reply<NSErrorPtr> reply) {
   answer("url", url, std::move(reply), [=, this](Reply<NSErrorPtr>& answered) {
-    Subject subject = subjectAt(url->path());
+    Subject subject = subjectAt(url);
+    if (subject.error) return answered(subject.error);
     // Before the tags, so that one look at the file sees both.
     if (subject.item) writeHint(subject);
     // The store looks while the disk is still written to.
     std::function<void()> waitForStore;
-    const TagResult result = _parts.operations.setTags(subject.place.physical, names, [&] {
-      waitForStore = _parts.store.beginLookAtPaths({subject.place.path});
-    });
+    const TagResult result = _parts.operations.setTags(
+        subject.place.physical, names,
+        [&] { waitForStore = _parts.store.beginLookAtPaths({subject.place.path}); }, subject.file);
     if (waitForStore) waitForStore();
-    if (result.storage == TagStorage::Failed) return answered(result.error);
-    if (!subject.item) subject = subjectAt(subject.place.path);
+    if (result.storage == TagStorage::Failed) {
+      lookAgainAfter(result.error, subject);
+      return answered(result.error);
+    }
+    if (!subject.item) subject = subjectAt(url);
     // Also where the file has them: an index that was told is not behind.
     const bool isOnFile = result.storage == TagStorage::Kept;
     const std::string tags = joinTags(names);

@@ -52,6 +52,16 @@ class FolderStore final : public Store {
   void lookAtPaths(const std::vector<std::string>& paths) { beginLookAtPaths(paths)(); }
   // The same; what is answered waits for it, and is called before the store goes.
   std::function<void()> beginLookAtPaths(const std::vector<std::string>& paths);
+  // Looks at what happened up to now on disk in the path's folder and in all that are watched.
+  // An item that moved is found where it is thereby.
+  void catchUp(const std::string& path);
+  // An item that lives in a folder, and the file that it is.
+  struct KnownItem {
+    VLQueryItemPtr item;
+    std::string path;  // absolute
+    FileKey file;
+  };
+  std::optional<KnownItem> knownItem(VLFileObjectID id);
   // Changes what the index alone keeps of an item; durable when it returns.
   NSErrorPtr changeDetails(VLFileObjectID id, std::function<void(ItemDetails&)> change);
   ItemDetails details(VLFileObjectID id);

@@ -35,6 +35,22 @@ std::function<void()> FolderStore::beginLookAtPaths(const std::vector<std::strin
   return [this, posted = std::move(posted)] { _writer->wait(posted); };
 }
 
+void FolderStore::catchUp(const std::string& path) {
+  std::optional<StoreWriter::Place> place;
+  if (auto reader = _readers.lease()) place = placeOf(*reader.get(), path);
+  _writer->perform(
+      [this, folder = place ? place->folder : kNoFolder] { _writer->catchUp(folder); });
+}
+
+std::optional<FolderStore::KnownItem> FolderStore::knownItem(VLFileObjectID id) {
+  auto reader = _readers.lease();
+  const auto found = reader ? reader->itemWithID(id) : std::nullopt;
+  if (!found || found->row.containerID) return std::nullopt;
+  const auto folder = pathOfFolder(*reader.get(), found->row.parent);
+  if (!folder) return std::nullopt;
+  return KnownItem{found->item(), *folder + '/' + found->row.name, found->row.state.key};
+}
+
 NSErrorPtr FolderStore::changeDetails(VLFileObjectID id, std::function<void(ItemDetails&)> change) {
   {
     // What it has already is not written.

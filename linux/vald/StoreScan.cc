@@ -439,6 +439,14 @@ Look StoreWriter::lookAtFolder(FolderKey key, int& error) {
   return snapshot.look;
 }
 
+void StoreWriter::catchUp(FolderKey folder) {
+  if (_isBulk) endBulkLoad();
+  _watcher.drain();
+  reconcileDirt();
+  int error = 0;
+  if (isUnwatched(folder)) lookAtFolder(folder, error);
+}
+
 Look StoreWriter::lookAtName(FolderKey folder, const std::string& name) {
   return lookAtNames({{folder, name}});
 }

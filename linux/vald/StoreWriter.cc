@@ -213,7 +213,10 @@ void StoreWriter::takeDirt() {
     endBulkLoad();
   }
   const bool isDue = since && (isSettling || now - *since >= kGatherWindow);
-  if (!isDue && _later.empty()) return;
+  if (isDue || !_later.empty()) reconcileDirt();
+}
+
+void StoreWriter::reconcileDirt() {
   DirtySet dirty = _watcher.take();
   for (auto& [folder, names] : std::exchange(_later, {}).folders) {
     DirtyFolder& entry = dirty.folders[folder];

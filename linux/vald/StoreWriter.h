@@ -64,6 +64,8 @@ class StoreWriter {
     std::string name;
   };
   Look lookAtNames(const std::vector<Place>& places);
+  // Decides what the kernel has told up to now, and looks at the folder when it is not watched.
+  void catchUp(FolderKey folder);
   // False when there is no such item, or it could not be written. Durable.
   bool changeDetails(VLFileObjectID id, const std::function<void(ItemDetails&)>& change);
   // What the cloud has now; said of a file that looks otherwise by now, it is ignored.
@@ -118,6 +120,8 @@ class StoreWriter {
   void accept(FolderKey folder, const FolderSnapshot& snapshot, bool inRound, bool isOld);
   void loadFolder(FolderKey folder, const FolderSnapshot& snapshot);
   void endBulkLoad();
+  // What the watcher has, and what was left for later.
+  void reconcileDirt();
   void reconcile(DirtySet& dirty);
   // What changed in one folder that is open.
   void gather(FolderKey folder, int descriptor, const DirtyFolder& changes);

@@ -11,6 +11,7 @@
 #include <functional>
 #include <tuple>
 
+#include "linux/protocol/DocumentURL.h"
 #include "tests/vald/DriveFixture.h"
 
 namespace skein::vald {
@@ -355,6 +356,86 @@ TEST_F(DriveTest, WhatTheDiskRefusesIsTakenBackWhereverItFails) {
       EXPECT_EQ(portrait("doc.txt"), before);
     }
   }
+}
+
+// Named by its item, also when it was replaced so lately that nobody knows yet.
+TEST_F(DriveTest, WhatIsDoneToADocumentIsDoneToThatOneAndNoOther) {
+  open();
+  const auto of = [&](const std::string& path, const VLFileObjectID& id) {
+    return documentURL(at(path), id);
+  };
+  using Request = std::function<std::string(const NSURLPtr&)>;
+  const auto answered = [this](auto request) {
+    return Request([this, request](const NSURLPtr& url) {
+      return outcome([&](LocalFiles& files, auto reply) { request(files, url, std::move(reply)); });
+    });
+  };
+  const auto placed = [this](auto request) {
+    return Request([this, request](const NSURLPtr& url) {
+      return path([&](LocalFiles& files, auto reply) { request(files, url, std::move(reply)); });
+    });
+  };
+  const std::vector<Request> requests = {
+      answered(
+          [](auto& files, auto& url, auto reply) { files.remove(url, "t", std::move(reply)); }),
+      placed([](auto& files, auto& url, auto reply) { files.trash(url, "t", std::move(reply)); }),
+      placed([](auto& files, auto& url, auto reply) {
+        files.coordinateDeletion(url, std::move(reply));
+      }),
+      placed([](auto& files, auto& url, auto reply) {
+        files.rename(url, "z", "t", std::move(reply));
+      }),
+      placed([this](auto& files, auto& url, auto reply) {
+        files.move(url, this->url("folder"), std::nullopt, true, "t", std::move(reply));
+      }),
+      answered([](auto& files, auto& url, auto reply) {
+        files.setTagNames(url, {"t"}, std::move(reply));
+      }),
+      answered([](auto& files, auto& url, auto reply) {
+        files.setFavoriteRank(url, 3, std::move(reply));
+      }),
+      answered(
+          [](auto& files, auto& url, auto reply) { files.setPinned(url, true, std::move(reply)); }),
+      answered([](auto& files, auto& url, auto reply) { files.evict(url, std::move(reply)); }),
+      answered(
+          [](auto& files, auto& url, auto reply) { files.download(url, false, std::move(reply)); }),
+  };
+  std::filesystem::create_directory(at("folder"));
+  for (std::size_t i = 0; i < requests.size(); ++i) {
+    write("a", "meant");
+    write("c", "other");
+    settle();
+    const VLFileObjectID meant = item("a")->fileObjectID();
+    const VLFileObjectID other = item("c")->fileObjectID();
+    rename("a", "b");
+    rename("c", "a");
+    EXPECT_EQ(requests[i](of("a", meant)), "!4") << i;
+    EXPECT_EQ(read("a"), "other") << i;
+    EXPECT_EQ(read("b"), "meant") << i;
+    // It is known by now where each is.
+    EXPECT_EQ(id("b"), meant.asString()) << i;
+    EXPECT_EQ(id("a"), other.asString()) << i;
+    EXPECT_TRUE(tags("a").empty());
+    EXPECT_EQ(answered([](auto& files, auto& url, auto reply) {
+                files.remove(url, "t", std::move(reply));
+              })(of("b", meant)),
+              "");
+    EXPECT_FALSE(exists("b"));
+    EXPECT_EQ(removed("a"), "");
+  }
+
+  // One that was saved is the same document, and not another.
+  write("doc");
+  settle();
+  const VLFileObjectID doc = item("doc")->fileObjectID();
+  write("doc.tmp", "saved");
+  rename("doc.tmp", "doc");
+  EXPECT_EQ(placed([](auto& files, auto& url, auto reply) {
+              files.rename(url, "new", "t", std::move(reply));
+            })(of("doc", doc)),
+            "new");
+  EXPECT_EQ(id("new"), doc.asString());
+  EXPECT_EQ(read("new"), "saved");
 }
 
 TEST_F(DriveTest, WhatIsTrashedKeepsItsIdentifierWhoeverTrashesIt) {

@@ -107,6 +107,14 @@ TEST_F(StoreIdentity, RenamedAwayAndANewFileUnderTheName) {
            "doc-2023.txt");
   survives({[&] { rename("doc.txt", "folder/kept.txt"); }, [&] { write("doc.txt", "another"); }},
            "folder/kept.txt");
+  // Also where that is a document of its own that just came.
+  survives({[&] {
+             write("young.txt", "another");
+             if (store) settle();
+             rename("doc.txt", "doc-2023.txt");
+             rename("young.txt", "doc.txt");
+           }},
+           "doc-2023.txt");
 }
 
 TEST_F(StoreIdentity, OldDocumentsThatReplaceOrExchangeMove) {

@@ -599,5 +599,84 @@ TEST(Provenance, TellsWhoseRequestRemovedAPathAndIsBounded) {
   EXPECT_EQ(journal->openEntries(&error).size(), 1u);
 }
 
+// Does something just before the next renaming, as another program may.
+class BusyLayer final : public FileLayer {
+ public:
+  std::function<void()> beforeRename;
+
+ protected:
+  int beforeStep(FileStep step, std::string_view) override {
+    if (const auto now =
+            step == FileStep::Rename ? std::exchange(beforeRename, nullptr) : nullptr) {
+      now();
+    }
+    return 0;
+  }
+};
+
+TEST(Operations, LeaveAnotherFileAloneThatTookTheName) {
+  using Operation =
+      std::function<NSErrorPtr(FileOperations&, const TestDrive&, const FileRequest&)>;
+  const std::vector<Operation> operations = {
+      [](auto& files, auto& drive, auto& request) {
+        return files.remove(drive.at("a"), request).error;
+      },
+      [](auto& files, auto& drive, auto& request) {
+        return files.trash(drive.at("a"), request).error;
+      },
+      [](auto& files, auto& drive, auto& request) {
+        return files.rename(drive.at("a"), "z", request).error;
+      },
+      [](auto& files, auto& drive, auto& request) {
+        return files.move(drive.at("a"), drive.at("folder"), std::nullopt, true, request).error;
+      },
+      [](auto& files, auto& drive, auto& request) {
+        return files.setTags(drive.at("a"), {"red"}, nullptr, request.file).error;
+      }};
+  enum class Swap { Before, InTheLastMoment, AndTheNameIsTakenAgain };
+  for (std::size_t i = 0; i < operations.size(); ++i) {
+    for (const Swap when : {Swap::Before, Swap::InTheLastMoment, Swap::AndTheNameIsTakenAgain}) {
+      if (i == 4 && when != Swap::Before) continue;  // it goes by an open file
+      TestDrive drive;
+      BusyLayer layer;
+      FileOperationsOptions options;
+      options.roots = {drive.store};
+      options.stateDirectory = drive.state;
+      const auto files = FileOperations::open(options, layer, drive.log, nullptr);
+      ASSERT_NE(files, nullptr);
+      drive.write("a", "meant");
+      drive.write("c", "other");
+      drive.makeFolder("folder");
+      FileRequest request{"a test", {}, {}};
+      ASSERT_EQ(readFileKey(AT_FDCWD, drive.at("a"), request.file.emplace()), 0);
+      const auto swap = [&] {
+        std::filesystem::rename(drive.at("a"), drive.at("b"));
+        std::filesystem::rename(drive.at("c"), drive.at("a"));
+        if (when == Swap::AndTheNameIsTakenAgain) {
+          layer.beforeRename = [&] { drive.write("a", "third"); };
+        }
+      };
+      if (when == Swap::Before) {
+        swap();
+      } else {
+        layer.beforeRename = swap;
+      }
+      const NSErrorPtr error = operations[i](*files, drive, request);
+      EXPECT_EQ(codeOf(error), NSFileNoSuchFileError);
+      EXPECT_TRUE(isAnotherFileError(error));
+      const bool isThird = when == Swap::AndTheNameIsTakenAgain;
+      EXPECT_EQ(TestDrive::get(drive.at("b")), "meant");
+      EXPECT_EQ(TestDrive::get(drive.at(isThird ? "a 2" : "a")), "other");
+      if (isThird) EXPECT_EQ(TestDrive::get(drive.at("a")), "third");
+      std::size_t all = 0;
+      for (const auto& entry : std::filesystem::recursive_directory_iterator(drive.store)) {
+        all += entry.is_directory() ? 0 : 1;
+      }
+      EXPECT_EQ(all, isThird ? 3u : 2u) << i;
+      EXPECT_TRUE(files->tags(drive.at("a")).names.empty());
+    }
+  }
+}
+
 }  // namespace
 }  // namespace skein::vald

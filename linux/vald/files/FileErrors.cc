@@ -36,6 +36,10 @@ Reading readingOf(int number) {
               "another program is writing to it; try again when that is over, or leave it out"};
     case ELOOP: return {NSFileWriteUnknownError, "a symbolic link is in the way"};
     case ENOTDIR: return {NSFileNoSuchFileError, "what should be a folder is none"};
+    case ESTALE:
+      return {NSFileNoSuchFileError,
+              "another program moved or replaced it a moment ago; look at what is there now and "
+              "name it again"};
     default: return {NSFileWriteUnknownError, nullptr};
   }
 }
@@ -77,6 +81,11 @@ NSErrorPtr fileError(int number, const std::string& doing, const std::string& pa
       reading.words != nullptr ? reading.words : std::generic_category().message(number);
   return fileErrorWithWords(reading.code, number, doing + " \"" + printable(path) + "\": " + why,
                             path);
+}
+
+bool isAnotherFileError(const NSErrorPtr& error) {
+  const NSErrorPtr cause = error ? error->underlyingError() : nullptr;
+  return cause && cause->domain() == NSPOSIXErrorDomain && cause->code() == ESTALE;
 }
 
 }  // namespace skein::vald

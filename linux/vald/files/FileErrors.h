@@ -18,7 +18,7 @@ inline constexpr std::int64_t NSFileWriteVolumeReadOnlyError = 642;
 
 // `number`: an errno, not 0. `doing`: what was tried, such as "can't rename". The POSIX
 // error lies underneath; the path is named as NSURLErrorKey. ENOENT is "no such file",
-// EEXIST "file exists" (then `path` must be the colliding one), EACCES and EPERM "no
+// ESTALE too, EEXIST "file exists" (then `path` must be the colliding one), EACCES and EPERM "no
 // permission", ENOSPC and EDQUOT "out of space", EROFS "read only", ENAMETOOLONG
 // "invalid name", ECANCELED "cancelled"; the rest is the general write error.
 NSErrorPtr fileError(int number, const std::string& doing, const std::string& path);
@@ -26,6 +26,9 @@ NSErrorPtr fileError(int number, const std::string& doing, const std::string& pa
 // The same shape with words of its own; `posix` 0: nothing underneath.
 NSErrorPtr fileErrorWithWords(std::int64_t cocoaCode, int posix, std::string words,
                               const std::string& path);
+
+// Whether `error` says, by ESTALE, that another file has the name than the one that was meant.
+bool isAnotherFileError(const NSErrorPtr& error);
 
 // A path for people: bytes that are no text, and control characters, as "?".
 std::string printable(const std::string& path);

@@ -74,7 +74,7 @@ FileResult FileOperations::rename(const std::string& path, const std::string& ne
   // The name first: what cannot be is refused before anything is waited for.
   if (NSErrorPtr error = refusalOfName(newName, false)) return {{}, error};
   const std::string newPath = joinPath(parentOfPath(path), newName);
-  if (NSErrorPtr error = take(path, {path, newPath}, from, hold)) return {{}, error};
+  if (NSErrorPtr error = take(path, {path, newPath}, request, from, hold)) return {{}, error};
   if (trashedPath(from.relative)) {
     return {{}, refused("it is in the trash; put it back first", path)};
   }
@@ -90,7 +90,7 @@ FileResult FileOperations::move(const std::string& path, const std::string& fold
   std::string name = newName.value_or(nameOfPath(path));
   StorePlace from;
   Hold hold;
-  if (NSErrorPtr error = take(path, {path, joinPath(folder, name)}, from, hold)) {
+  if (NSErrorPtr error = take(path, {path, joinPath(folder, name)}, request, from, hold)) {
     return {{}, error};
   }
   OperationKind kind = OperationKind::Move;
@@ -157,14 +157,18 @@ NSErrorPtr FileOperations::moveOnce(const StorePlace& from, const StorePlace& to
     scope.discard();
     return fileError(EEXIST, doing, to.path());
   }
-  if (failure == 0 && request.moved) request.moved(to.path());
-  if (failure == 0 && (failure = syncFolders(to.folder, &from.folder)) != 0) {
-    if (_files.renameWithoutReplacing(to.folder.get(), to.name, from.folder.get(), from.name)) {
-      scope.leaveOpen();
-      return fileError(failure, "moved, but perhaps not for good,", to.path());
-    }
-  }
   if (failure != 0) return fileError(failure, doing, from.path());
+  if (isAsked(request, to.folder, to.name)) {
+    if (request.moved) request.moved(to.path());
+    failure = syncFolders(to.folder, &from.folder);
+  } else {
+    failure = ESTALE;
+  }
+  if (failure != 0) {
+    if (putBack(to.folder, to.name, from) == 0) return fileError(failure, doing, from.path());
+    scope.leaveOpen();
+    return fileError(failure, "moved, but perhaps not for good,", to.path());
+  }
   scope.done();
   if (kind == OperationKind::PutBack && removeTrashInfo(from) != 0) {
     // It is back; that the trash forgets it is finished at the next start.

@@ -16,6 +16,11 @@
 #include "linux/vald/files/TrashInfo.h"
 
 namespace skein::vald {
+namespace {
+
+constexpr unsigned kMostNames = 10'000;
+
+}  // namespace
 
 std::unique_ptr<FileOperations> FileOperations::open(FileOperationsOptions options,
                                                      FileLayer& files, Log& log, NSErrorOut error) {
@@ -73,10 +78,11 @@ NSErrorPtr FileOperations::coordinate(const std::string& path, std::shared_ptr<v
 NSErrorPtr FileOperations::waitFor(const std::string& path) {
   Hold hold;
   StorePlace place;
-  return take(path, {path}, place, hold);
+  return take(path, {path}, {}, place, hold);
 }
 
-bool FileOperations::writeHint(const std::string& path, std::uint64_t document) {
+bool FileOperations::writeHint(const std::string& path, std::uint64_t document,
+                               const std::optional<FileKey>& asked) {
   FileCoordinator::Claim held;
   StorePlace place;
   FileDescriptor entry;
@@ -86,6 +92,8 @@ bool FileOperations::writeHint(const std::string& path, std::uint64_t document) 
       place.folder.openEntry(place.name, entry) != 0) {
     return false;
   }
+  FileKey key;
+  if (asked && (readFileKey(entry.get(), {}, key) != 0 || !asked->names(key))) return false;
   DocumentHint hint{document, status.st_ino, 0};
   int generation = 0;
   FileDescriptor file;
@@ -106,8 +114,24 @@ bool FileOperations::writeHint(const std::string& path, std::uint64_t document) 
   return true;
 }
 
+bool FileOperations::isAsked(const FileRequest& request, const DirectoryHandle& folder,
+                             const std::string& name) {
+  FileKey key;
+  return !request.file || (readFileKey(folder.get(), name, key) == 0 && request.file->names(key));
+}
+
+int FileOperations::putBack(const DirectoryHandle& folder, const std::string& name,
+                            const StorePlace& place) {
+  int failure = EEXIST;
+  for (unsigned number = 1; failure == EEXIST && number <= kMostNames; ++number) {
+    failure = _files.renameWithoutReplacing(folder.get(), name, place.folder.get(),
+                                            numberedName(place.name, number, ' '));
+  }
+  return failure;
+}
+
 NSErrorPtr FileOperations::take(const std::string& path, std::vector<std::string> paths,
-                                StorePlace& place, Hold& hold) {
+                                const FileRequest& request, StorePlace& place, Hold& hold) {
   const auto until = deadline();
   if (NSErrorPtr error = claim(std::move(paths), until, hold.claim)) return error;
   if (NSErrorPtr error = _roots.locate(path, place)) return error;
@@ -124,6 +148,7 @@ NSErrorPtr FileOperations::take(const std::string& path, std::vector<std::string
   if (const int failure = place.folder.status(place.name, status)) {
     return fileError(failure, "can't find", path);
   }
+  if (!isAsked(request, place.folder, place.name)) return fileError(ESTALE, "can't find", path);
   return hold.lock.acquire(place.folder, place.name, place.path(), until);
 }
 
@@ -197,13 +222,15 @@ TagResult FileOperations::tags(const std::string& path) const {
 }
 
 TagResult FileOperations::setTags(const std::string& path, const std::vector<std::string>& names,
-                                  const std::function<void()>& written) {
+                                  const std::function<void()>& written,
+                                  const std::optional<FileKey>& asked) {
   FileCoordinator::Claim held;
   StorePlace place;
   NSErrorPtr error = claim({path}, deadline(), held);
   if (!error) error = _roots.locate(path, place);
   if (error) return {TagStorage::Failed, {}, error};
-  return writeTags(_files, place.folder, place.isRoot() ? "." : place.name, path, names, written);
+  return writeTags(_files, place.folder, place.isRoot() ? "." : place.name, path, names, written,
+                   asked);
 }
 
 }  // namespace skein::vald

@@ -10,6 +10,7 @@
 
 #include "base/Executor.h"
 #include "linux/vald/files/FileCoordinator.h"
+#include "linux/vald/files/FileKey.h"
 #include "linux/vald/files/FileLayer.h"
 #include "linux/vald/files/OperationJournal.h"
 #include "linux/vald/files/OperationScope.h"
@@ -47,6 +48,9 @@ struct FileRequest {
   // Removing alone: is given what deletes a removed folder, to be run after the answer; what
   // never runs is done by the next start. Null: it is deleted before remove() returns.
   std::function<void(Task)> deleteLater = {};
+  // The file that the request is about; another one that has its name by now is left alone, or
+  // put back, and answered as ESTALE. Nil: whatever has the name.
+  std::optional<FileKey> file = {};
 };
 
 // Where the item is now, or why it is where it was.
@@ -124,14 +128,16 @@ class FileOperations {
 
   // Notes on a document's file which document it is (see DocumentHint.h). Nothing depends on
   // it while the index lives, so a file that cannot have it is none of an error's. Whether the
-  // file was changed.
-  bool writeHint(const std::string& path, std::uint64_t document);
+  // file was changed. `asked`: as of a request's file.
+  bool writeHint(const std::string& path, std::uint64_t document,
+                 const std::optional<FileKey>& asked = std::nullopt);
 
   TagResult tags(const std::string& path) const;
   // `written` is called when the file has them, while the disk is yet to be written; that may
-  // fail after this call.
+  // fail after this call. `asked`: as of a request's file.
   TagResult setTags(const std::string& path, const std::vector<std::string>& names,
-                    const std::function<void()>& written = nullptr);
+                    const std::function<void()>& written = nullptr,
+                    const std::optional<FileKey>& asked = std::nullopt);
 
  private:
   // What an operation holds while it runs.
@@ -149,10 +155,17 @@ class FileOperations {
   bool isTaken(const StorePlace& place) const;
   // The place's name is free, but one of its other names is not, and not by `from` itself.
   bool isTakenByAnother(const StorePlace& from, const StorePlace& to) const;
-  // Claims `paths`, finds the item and locks it: Cocoa 4 when it is gone. Refuses roots
-  // and the trash's own folders.
-  NSErrorPtr take(const std::string& path, std::vector<std::string> paths, StorePlace& place,
-                  Hold& hold);
+  // Claims `paths`, finds the item and locks it: Cocoa 4 when it is gone, or another file has
+  // its name. Refuses roots and the trash's own folders.
+  NSErrorPtr take(const std::string& path, std::vector<std::string> paths,
+                  const FileRequest& request, StorePlace& place, Hold& hold);
+  // Whether the entry is the file that the request is about. Asked once more when it was
+  // renamed, since no claim keeps other programs from renaming in the last moment.
+  static bool isAsked(const FileRequest& request, const DirectoryHandle& folder,
+                      const std::string& name);
+  // Renames an entry back to where it was; with a number when the name was taken since. 0 or an
+  // errno.
+  int putBack(const DirectoryHandle& folder, const std::string& name, const StorePlace& place);
   // Claims a place where something new shall be; refuses taken names and the trash.
   NSErrorPtr takeNew(const std::string& folder, const std::string& name, StorePlace& place,
                      Hold& hold);

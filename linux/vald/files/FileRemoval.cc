@@ -28,7 +28,7 @@ FileResult cancelledRemoval(const StorePlace& place, const std::string& name) {
 FileResult FileOperations::remove(const std::string& path, const FileRequest& request) {
   StorePlace place;
   Hold hold;
-  if (NSErrorPtr error = take(path, {path}, place, hold)) return {{}, error};
+  if (NSErrorPtr error = take(path, {path}, request, place, hold)) return {{}, error};
   const auto goesOn = [&] { return !request.progress || request.progress({}); };
   if (NSErrorPtr error = obstacleToRemoval(place.folder, place.name, place.path(), goesOn)) {
     return {{}, error};
@@ -59,13 +59,16 @@ FileResult FileOperations::removeAside(const StorePlace& place, const FileReques
     again = true;
     return {{}, fileError(failure, "can't remove", path)};
   }
+  if (failure != 0) return {{}, fileError(failure, "can't remove", path)};
   std::string name;
   // Gone for good before the first part of it is deleted: a power cut shall not bring
   // half a tree back.
-  if (failure == 0 && (failure = syncFolders(place.folder, &aside->folder)) != 0) {
+  failure = isAsked(request, aside->folder, aside->name) ? syncFolders(place.folder, &aside->folder)
+                                                         : ESTALE;
+  if (failure != 0) {
     if (putBackRemoved(*aside, place, name) != 0) scope->leaveOpen();
+    return {{}, fileError(failure, "can't remove", path)};
   }
-  if (failure != 0) return {{}, fileError(failure, "can't remove", path)};
   if (request.removed && !request.removed()) {
     failure = putBackRemoved(*aside, place, name);
     if (failure == 0) return cancelledRemoval(place, name);

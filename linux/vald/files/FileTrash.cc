@@ -57,7 +57,7 @@ NSErrorPtr FileOperations::openTrash(const OpenRoot& root, DirectoryHandle& file
 FileResult FileOperations::trash(const std::string& path, const FileRequest& request) {
   StorePlace place;
   Hold hold;
-  if (NSErrorPtr error = take(path, {path}, place, hold)) return {{}, error};
+  if (NSErrorPtr error = take(path, {path}, request, place, hold)) return {{}, error};
   if (trashedPath(place.relative)) {
     return {{},
             fileErrorWithWords(NSFileWriteNoPermissionError, EACCES,
@@ -107,15 +107,16 @@ NSErrorPtr FileOperations::trashAs(const StorePlace& place, const std::string& n
     failure = _files.renameWithoutReplacing(place.folder.get(), place.name, trashed.get(), name);
     taken = failure == EEXIST;
   }
-  if (failure == 0 && (failure = syncFolders(trashed, &place.folder)) != 0) {
-    if (_files.renameWithoutReplacing(trashed.get(), name, place.folder.get(), place.name) != 0) {
+  if (failure == 0) {
+    failure = isAsked(request, trashed, name) ? syncFolders(trashed, &place.folder) : ESTALE;
+    if (failure == 0) {
+      scope.done();
+      return nullptr;
+    }
+    if (putBack(trashed, name, place) != 0) {
       scope.leaveOpen();
       return fileError(failure, "trashed, but perhaps not for good,", path);
     }
-  }
-  if (failure == 0) {
-    scope.done();
-    return nullptr;
   }
   if (taken) scope.discard();
   if (_files.unlink(info.get(), infoName) != 0) scope.leaveOpen();

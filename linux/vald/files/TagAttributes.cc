@@ -110,12 +110,16 @@ TagResult readTags(const DirectoryHandle& folder, const std::string& name,
 
 TagResult writeTags(FileLayer& files, const DirectoryHandle& folder, const std::string& name,
                     const std::string& path, const std::vector<std::string>& names,
-                    const std::function<void()>& written) {
+                    const std::function<void()>& written, const std::optional<FileKey>& asked) {
   if (NSErrorPtr refusal = refusalOfTags(names)) return {TagStorage::Failed, {}, refusal};
   const char* const doing = "can't set the tags of";
   FileDescriptor entry;
   if (const int failure = folder.openEntry(name, entry)) {
     return {TagStorage::Failed, {}, fileError(failure, doing, path)};
+  }
+  FileKey key;
+  if (asked && (readFileKey(entry.get(), {}, key) != 0 || !asked->names(key))) {
+    return {TagStorage::Failed, {}, fileError(ESTALE, doing, path)};
   }
   const std::string own = descriptorPath(entry.get());
   const std::string value = joinTags(names);

@@ -2,10 +2,12 @@
 #pragma once
 
 #include <functional>
+#include <optional>
 #include <string>
 #include <vector>
 
 #include "linux/vald/files/DirectoryHandle.h"
+#include "linux/vald/files/FileKey.h"
 #include "linux/vald/files/FileLayer.h"
 #include "platform/foundation/NSError.h"
 
@@ -37,9 +39,11 @@ std::vector<std::string> splitTags(const std::string& value);
 TagResult readTags(const DirectoryHandle& folder, const std::string& name, const std::string& path);
 // Replaces the whole set, in one step that is on the disk when this returns; no names
 // removes the attribute. `written` (or null) is called between the two. What the file has
-// already is neither written nor waited for.
+// already is neither written nor waited for. `asked`: another file of that name is left as it
+// is, which is ESTALE.
 TagResult writeTags(FileLayer& files, const DirectoryHandle& folder, const std::string& name,
                     const std::string& path, const std::vector<std::string>& names,
-                    const std::function<void()>& written);
+                    const std::function<void()>& written,
+                    const std::optional<FileKey>& asked = std::nullopt);
 
 }  // namespace skein::vald

@@ -2,27 +2,12 @@
 
 #include <cstdint>
 
+#include "linux/vald/files/FileKey.h"
 #include "vellum/VLQueryItem.h"
 
 namespace skein::vald {
 
 using ItemKind = VLQueryItem::Kind;
-
-// What tells one file of a file system from every other, also from one that gets the same
-// inode number later. Asking for the generation costs a system call of its own, so a first
-// scan leaves a document's open (0) and keeps its birth time, which tells the rest.
-struct FileKey {
-  std::uint64_t inode = 0;
-  std::uint32_t generation = 0;  // 0: not asked for
-  std::int64_t born = 0;         // nanoseconds since 1970; 0: the file system does not know
-
-  // Whether both are the same file.
-  bool names(const FileKey& other) const {
-    if (inode == 0 || inode != other.inode) return false;
-    if (generation != 0 && other.generation != 0) return generation == other.generation;
-    return born == other.born;
-  }
-};
 
 // What the disk says of one name in a folder. Times in nanoseconds since 1970.
 struct FileState {

@@ -11,7 +11,6 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
-#include <limits>
 #include <utility>
 
 #include "linux/vald/cloud/EvictionMarker.h"
@@ -22,39 +21,6 @@ namespace {
 
 constexpr unsigned kMask = STATX_BASIC_STATS | STATX_BTIME;
 constexpr int kFolderFlags = O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC;
-
-std::int64_t nanoseconds(const statx_timestamp& time) {
-  std::int64_t result = 0;
-  if (__builtin_mul_overflow(time.tv_sec, std::int64_t{1'000'000'000}, &result) ||
-      __builtin_add_overflow(result, std::int64_t{time.tv_nsec}, &result)) {
-    return time.tv_sec < 0 ? std::numeric_limits<std::int64_t>::min() + 1
-                           : std::numeric_limits<std::int64_t>::max();
-  }
-  return result;
-}
-
-// The inode's generation as the file's handle tells it; 0 when the file system has none.
-std::uint32_t generationOf(int folder, const char* name, int flags, std::uint64_t inode) {
-  alignas(file_handle) char storage[sizeof(file_handle) + MAX_HANDLE_SZ];
-  auto* handle = reinterpret_cast<file_handle*>(storage);
-  handle->handle_bytes = MAX_HANDLE_SZ;
-  int mount = 0;
-  if (name_to_handle_at(folder, name, handle, &mount, flags) != 0) return 0;
-  constexpr int kInode32AndGeneration = 1;
-  std::uint32_t words[2] = {};
-  if (handle->handle_type == kInode32AndGeneration && handle->handle_bytes == sizeof words) {
-    std::memcpy(words, storage + sizeof(file_handle), sizeof words);
-    if (words[0] == inode && words[1] != 0) return words[1];
-  }
-  // Any other layout: the whole handle names the file, so a digest of it tells it from the
-  // next owner of the inode.
-  std::uint32_t digest = 2166136261U;
-  const char* bytes = storage + sizeof(file_handle);
-  for (unsigned i = 0; i < handle->handle_bytes; ++i) {
-    digest = (digest ^ static_cast<unsigned char>(bytes[i])) * 16777619U;
-  }
-  return digest != 0 ? digest : 1;
-}
 
 enum class Kept : std::uint8_t { Yes, No };
 
@@ -69,10 +35,10 @@ Kept fill(const struct statx& status, FileState& state) {
     return Kept::No;
   }
   state.key.inode = status.stx_ino;
-  state.key.born = (status.stx_mask & STATX_BTIME) != 0 ? nanoseconds(status.stx_btime) : 0;
+  state.key.born = fileBirth(status);
   state.size = state.kind == ItemKind::Folder ? 0 : status.stx_size;
-  state.modified = nanoseconds(status.stx_mtime);
-  state.changed = nanoseconds(status.stx_ctime);
+  state.modified = nanosecondsOf(status.stx_mtime);
+  state.changed = nanosecondsOf(status.stx_ctime);
   return Kept::Yes;
 }
 
@@ -147,7 +113,7 @@ bool readSelf(int folder, FileState& state) {
   struct statx status {};
   if (statx(folder, "", AT_EMPTY_PATH, kMask, &status) != 0) return false;
   if (fill(status, state) == Kept::No) return false;
-  state.key.generation = generationOf(folder, "", AT_EMPTY_PATH, state.key.inode);
+  state.key.generation = fileGeneration(folder, "", AT_EMPTY_PATH, state.key.inode);
   return true;
 }
 
@@ -219,7 +185,7 @@ Look readEntry(int folder, const std::string& name, FileState& state, int& error
   if (fill(status, seen) == Kept::No) return Look::Gone;
   const std::string document = readMarker(folder, found, seen);
   if (found == name ? !document.empty() : document != name) return Look::Gone;
-  seen.key.generation = generationOf(folder, found.c_str(), 0, seen.key.inode);
+  seen.key.generation = fileGeneration(folder, found.c_str(), 0, seen.key.inode);
   state = seen;
   return Look::Seen;
 }
@@ -269,7 +235,7 @@ FolderSnapshot readFolder(int folder, Detail detail) {
     FileState state;
     if (fill(status, state) == Kept::No) continue;
     if (detail == Detail::Full || state.kind != ItemKind::Document || state.key.born == 0) {
-      state.key.generation = generationOf(folder, name, 0, state.key.inode);
+      state.key.generation = fileGeneration(folder, name, 0, state.key.inode);
     }
     std::string document;
     if (name[0] == '.') document = readMarker(folder, name, state);

@@ -212,11 +212,21 @@ void Reconciler::replaced(const Difference& difference) {
     return;
   }
 
+  // Where the old file went decides whether this was a save.
+  const auto whereItWent =
+      std::find_if(_deciding.begin(), _deciding.end(), [&](const Difference& other) {
+        return other.state.kind == ItemKind::Document && old->state.key.names(other.state.key);
+      });
+  const bool livesElsewhere =
+      whereItWent != _deciding.end() && !isBackupNameOf(whereItWent->place.name, place.name);
   if (const std::optional<ItemRow> mover = moverTo(place, state)) {
     const Place from{mover->parent, mover->name};
     FileState there;
     const Whereabouts where = whereabouts(*mover, there);
-    if (where == Whereabouts::Displaced && old->state.key.names(there.key)) {
+    if (livesElsewhere) {
+      move(*old, whereItWent->place, whereItWent->state);
+      move(*mover, place, state);
+    } else if (where == Whereabouts::Displaced && old->state.key.names(there.key)) {
       if (isYoung(*mover) || isYoung(*old)) {
         retarget(*old, state);
         retarget(*mover, there);
@@ -236,12 +246,7 @@ void Reconciler::replaced(const Difference& difference) {
     return;
   }
 
-  // The file is new. Where the old one went decides whether this was a save.
-  const auto whereItWent =
-      std::find_if(_deciding.begin(), _deciding.end(), [&](const Difference& other) {
-        return other.state.kind == ItemKind::Document && old->state.key.names(other.state.key);
-      });
-  if (whereItWent != _deciding.end() && !isBackupNameOf(whereItWent->place.name, place.name)) {
+  if (livesElsewhere) {
     move(*old, whereItWent->place, whereItWent->state);
     insertNew(place, state);
     return;

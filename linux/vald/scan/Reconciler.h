@@ -10,7 +10,8 @@
 //     file lives on under any other name, it is the document, and the name's is new.
 //  3. A young document (it came within the last minute) that is renamed over another hands
 //     its file over and dies: the name keeps its document. An old document renamed over
-//     another moves, and the replaced one dies.
+//     another moves, and the replaced one dies. Neither holds when the other's file lives on
+//     elsewhere (rule 2): then both moved.
 //  4. Two names that exchanged their files keep their documents when one of them is young;
 //     two old ones moved.
 //  5. A document that vanished keeps its number for the grace window: what comes to its
