@@ -167,6 +167,33 @@ void StoreWriter::noteUploads(const std::vector<UploadedFile>& files) {
   commit();
 }
 
+bool StoreWriter::takeHint(ItemRow& row, bool& waits) {
+  const auto hinted = _details.hinted(row, waits);
+  if (!hinted || *hinted == row.id) return false;
+  // The index was lost, and the file has kept its number.
+  const std::int64_t now = std::chrono::duration_cast<std::chrono::milliseconds>(
+                               std::chrono::system_clock::now().time_since_epoch())
+                               .count();
+  _journal.bury(row, now);
+  row.id = *hinted;
+  _details.recall(row);
+  _details.refresh(row, true);
+  _journal.insert(row);
+  return true;
+}
+
+void StoreWriter::takeWaitingHints() {
+  _attributesWaiting = kNothingWaits;
+  _disk.forget();
+  for (const VLFileObjectID id : _details.endExpecting()) {
+    auto row = _index.rowWithID(id);
+    bool waits = false;
+    if (!row) continue;
+    begin();
+    takeHint(*row, waits);
+  }
+}
+
 void StoreWriter::readSomeAttributes() {
   if (!_isReadingAttributes || _isBulk || _inRound || _inTransaction) return;
   _disk.forget();
@@ -176,28 +203,26 @@ void StoreWriter::readSomeAttributes() {
     _attributesAt = row.rank;
     if (!_details.mayHaveAttributes(row)) continue;
     begin();
-    const auto hinted = _details.hinted(row);
-    if (hinted && *hinted != row.id) {
-      // The index was lost, and the file has kept its number.
-      const std::int64_t now = std::chrono::duration_cast<std::chrono::milliseconds>(
-                                   std::chrono::system_clock::now().time_since_epoch())
-                                   .count();
-      _journal.bury(row, now);
-      row.id = *hinted;
-      _details.recall(row);
-      _details.refresh(row, true);
-      _journal.insert(row);
-    } else if (_details.refresh(row, true)) {
-      _journal.updateDetails(row);
+    bool waits = false;
+    const std::uint64_t rank = row.rank;
+    if (takeHint(row, waits)) continue;
+    if (waits) {
+      _details.wait(row.id);
+      _attributesWaiting = std::min(_attributesWaiting, rank - 1);
     }
+    if (_details.refresh(row, true)) _journal.updateDetails(row);
   }
   const bool isDone = rows.size() < kAttributesAtOnce;
-  if (isDone) _attributesAt = _attributesUntil;
+  if (isDone) {
+    _attributesAt = _attributesUntil;
+    takeWaitingHints();
+  }
   // What a power cut makes it forget is read again.
   if (_inTransaction || isDone ||
       before / kAttributesUnsaved != _attributesAt / kAttributesUnsaved) {
     begin();
-    _index.setSetting(kAttributesRead, std::to_string(_attributesAt));
+    // After a crash those that waited are asked again.
+    _index.setSetting(kAttributesRead, std::to_string(std::min(_attributesAt, _attributesWaiting)));
     if (!commit()) return;
   }
   _isReadingAttributes = !isDone;

@@ -221,6 +221,7 @@ void StoreWriter::startRound(LocalDaemonStatus::Scan kind) {
   }
   ++_round;
   _inRound = true;
+  _details.expectMore();
   _scanned = 0;
   _scanKind = kind;
   std::vector<FolderKey> roots;
@@ -240,6 +241,7 @@ void StoreWriter::finishRound() {
   _reconciler.endRound();
   afterDecisions();
   _index.setSetting(kComplete, "1");
+  if (!_isReadingAttributes) takeWaitingHints();
   _inRound = false;
   _scanKind = LocalDaemonStatus::Scan::Idle;
   if (!commit()) return;

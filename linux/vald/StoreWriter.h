@@ -127,6 +127,10 @@ class StoreWriter {
   void gather(FolderKey folder, int descriptor, const DirtyFolder& changes);
   // A piece of the round over attributes that follows a first scan.
   void readSomeAttributes();
+  // Gives the item the number that its file says it has. False when it says none, or has to wait.
+  bool takeHint(ItemRow& row, bool& waits);
+  // Every file was asked: what is left is a copy of none that is here. In or before a transaction.
+  void takeWaitingHints();
 
   // Transactions.
   enum class Durability {
@@ -174,6 +178,9 @@ class StoreWriter {
   // The attributes of rows with ranks from here to there are yet to be read.
   std::uint64_t _attributesAt = 0;
   std::uint64_t _attributesUntil = 0;
+  // The rank before the first row whose hint waits for the others.
+  static constexpr std::uint64_t kNothingWaits = ~std::uint64_t{0};
+  std::uint64_t _attributesWaiting = kNothingWaits;
   Instant _lastTick;
   Instant _lastSlowRound;
   bool _isBroken = false;  // the index is damaged: nothing is written any more

@@ -144,6 +144,26 @@ TEST_F(DriveTest, AFirstScanFindsTagsAndNumbersLater) {
   settle();
   EXPECT_NE(id("copy.txt"), copied);
   EXPECT_EQ(id("doc.txt"), copied);
+
+  // Also when the index is lost then, whichever is read first; and a copy that is all there is
+  // left is the document.
+  rename("copy.txt", "a copy.txt");
+  const auto loseIndex = [&] {
+    for (const char* part : {"", "-wal", "-shm"}) {
+      std::filesystem::remove(options.store.databasePath + part);
+    }
+  };
+  close();
+  loseIndex();
+  open();
+  EXPECT_TRUE(eventually([&] { return !drive->store().isReadingAttributes(); }));
+  EXPECT_EQ(id("doc.txt"), copied);
+  EXPECT_NE(id("a copy.txt"), copied);
+  close();
+  loseIndex();
+  std::filesystem::remove(at("doc.txt"));
+  open();
+  EXPECT_TRUE(eventually([&] { return id("a copy.txt") == copied; }));
 }
 
 TEST_F(DriveTest, AnEvictedDocumentIsTheSameOneOnAllItsWays) {

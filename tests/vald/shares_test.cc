@@ -172,6 +172,11 @@ TEST_F(SharesTest, ASaveThatCannotBeDoneChangesNothing) {
   wrong.values[CKShareTypeKey] = "folder";
   EXPECT_EQ(codeOf(save(wrong).second), "VLVellumErrorDomain 15");
   EXPECT_FALSE(isShared("A.txt"));
+  makeFolder("Team");
+  wrong = *this->fresh("Team").first;
+  wrong.values.erase(CKShareTypeKey);
+  EXPECT_EQ(codeOf(save(wrong).second), "VLVellumErrorDomain 15");
+  EXPECT_FALSE(isShared("Team"));
 
   const CKShare first = create("A.txt");
   EXPECT_EQ(codeOf(save(fresh).second), "CKErrorDomain 14");  // shared meanwhile
@@ -257,11 +262,17 @@ TEST_F(SharesTest, RefreshingBringsTheStoreInLineWithTheCloud) {
   EXPECT_FALSE(refresh());
   EXPECT_FALSE(isShared("Team"));
 
+  // What is away for a moment keeps its share.
   create("Team");
-  std::filesystem::remove_all(drive.path + "/Team");
+  const std::string away = drive.path + "-away";
+  std::filesystem::rename(drive.path + "/Team", away);
   settle();
   EXPECT_EQ(codeOf(refresh()), "NSCocoaErrorDomain 4");
-  EXPECT_TRUE(records->shares()->empty());
+  std::filesystem::rename(away, drive.path + "/Team");
+  settle();
+  EXPECT_EQ(id("Team").asString(), team);
+  EXPECT_FALSE(refresh());
+  EXPECT_TRUE(isShared("Team"));
 }
 
 }  // namespace

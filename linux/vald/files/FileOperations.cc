@@ -1,7 +1,5 @@
 #include "linux/vald/files/FileOperations.h"
 
-#include <linux/fs.h>
-#include <sys/ioctl.h>
 #include <sys/xattr.h>
 
 #include <algorithm>
@@ -93,15 +91,8 @@ bool FileOperations::writeHint(const std::string& path, std::uint64_t document,
     return false;
   }
   FileKey key;
-  if (asked && (readFileKey(entry.get(), {}, key) != 0 || !asked->names(key))) return false;
-  DocumentHint hint{document, status.st_ino, 0};
-  int generation = 0;
-  FileDescriptor file;
-  // Where the file system has one.
-  if (place.folder.openFile(place.name, file) == 0 &&
-      ::ioctl(file.get(), FS_IOC_GETVERSION, &generation) == 0) {
-    hint.generation = static_cast<std::uint32_t>(generation);
-  }
+  if (readFileKey(entry.get(), {}, key) != 0 || (asked && !asked->names(key))) return false;
+  const DocumentHint hint{document, key.inode, key.generation};
   const std::string own = descriptorPath(entry.get());
   const std::string text = hint.asText();
   char known[128];

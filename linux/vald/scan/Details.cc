@@ -73,18 +73,26 @@ void Details::put(ItemRow& row, const ItemDetails& details) {
   row.hasDetails = !details.isEmpty();
 }
 
-std::optional<VLFileObjectID> Details::hinted(const ItemRow& row) {
+std::optional<VLFileObjectID> Details::hinted(const ItemRow& row, bool& waits) {
+  waits = false;
   if (row.state.kind != ItemKind::Document) return std::nullopt;
   std::uint64_t document = row.state.markedDocument;
+  bool isOwn = true;
   std::string text;
   if (document == 0 && read(row, kHintAttribute, text) == Read::Value) {
     const auto hint = DocumentHint::parse(text);
-    if (hint) document = hint->document;
+    if (hint) {
+      const FileKey& key = row.state.key;
+      document = hint->document;
+      isOwn = hint->inode == key.inode &&
+              (hint->generation == 0 || key.generation == 0 || hint->generation == key.generation);
+    }
   }
   if (document == 0) return std::nullopt;
   const auto id = VLFileObjectID::documentWithRawID(document);
   if (_index.rowWithID(id)) return std::nullopt;
-  return id;
+  waits = !isOwn && _expectsMore;
+  return waits ? std::nullopt : std::optional(id);
 }
 
 }  // namespace skein::vald

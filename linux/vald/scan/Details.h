@@ -2,6 +2,8 @@
 
 #include <optional>
 #include <string>
+#include <utility>
+#include <vector>
 
 #include "linux/vald/index/IndexWriter.h"
 #include "linux/vald/scan/Disk.h"
@@ -30,9 +32,19 @@ class Details {
   // Writes details and the row's mark of them.
   void put(ItemRow& row, const ItemDetails& details);
 
-  // The document whose hint a new file has (see DocumentHint.h), unless that document lives
-  // as another file: then this one is a copy.
-  std::optional<VLFileObjectID> hinted(const ItemRow& row);
+  // The document that a new file says it is, by being its marker or by its hint (see
+  // DocumentHint.h), unless that document lives as another file: then this one is a copy. The
+  // hint of another file, as copies and restored files have it, counts too, but not while the
+  // document's own file may yet be found: then `waits`, and the row's number is to be told to
+  // wait() once it has one.
+  std::optional<VLFileObjectID> hinted(const ItemRow& row, bool& waits);
+  void wait(VLFileObjectID id) { _waiting.push_back(id); }
+  // From now on hints of other files wait; and the end of it: what waited.
+  void expectMore() { _expectsMore = true; }
+  std::vector<VLFileObjectID> endExpecting() {
+    _expectsMore = false;
+    return std::exchange(_waiting, {});
+  }
 
  private:
   enum class Read { Value, Absent, Unknown };
@@ -42,6 +54,8 @@ class Details {
 
   IndexWriter& _index;
   Disk& _disk;
+  bool _expectsMore = false;
+  std::vector<VLFileObjectID> _waiting;
 };
 
 }  // namespace skein::vald

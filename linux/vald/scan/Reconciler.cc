@@ -472,8 +472,10 @@ void Reconciler::insertNew(const Place& place, const FileState& state) {
   row.parent = place.folder;
   row.name = place.name;
   row.state = state;
-  const auto hinted = _details.hinted(row);
+  bool waits = false;
+  const auto hinted = _details.hinted(row, waits);
   row.id = hinted ? *hinted : newID(state);
+  if (waits) _details.wait(row.id);
   // A file that a round finds was there before, unless its dates say otherwise.
   const std::int64_t changed = state.changed / 1'000'000;
   row.seen = _now - changed < kYouth ? _now : 0;

@@ -130,8 +130,9 @@ std::optional<std::string> whyNotShareable(const SharePlace& place) {
 
 NSErrorPtr checkShare(const CKShare& share, const SharePlace& place) {
   const std::string* type = share.objectForKey(CKShareTypeKey);
-  if (type != nullptr && (*type == kFolderType) != place.item->isFolder()) {
-    return vlc_errorInvalidParameter(CKShareTypeKey, *type);
+  // A folder's share must say what it is: who may not save those goes by the type.
+  if ((type != nullptr && *type == kFolderType) != place.item->isFolder()) {
+    return vlc_errorInvalidParameter(CKShareTypeKey, type != nullptr ? *type : "(null)");
   }
   if (share.values.size() > kMostValues) {
     return vlc_errorInvalidParameter("values", std::to_string(share.values.size()) + " of them");

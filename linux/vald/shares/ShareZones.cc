@@ -137,15 +137,8 @@ void Shares::refreshSharingState(NSFileProviderItemIdentifier item, Reply<NSErro
       const bool isMarked = self._parts.shared.now()->items.contains(*id);
       if (place->own.has_value() != isMarked) self.tell(*id, place->own.has_value());
     }
-    NSErrorPtr error = place.error();
-    const bool isGone = id && error != nullptr && error->domain() == NSCocoaErrorDomain &&
-                        error->code() == NSFileNoSuchFileError;
-    if (isGone) {
-      NSErrorPtr failed = self._parts.records.removeZone(*id);
-      if (failed != nullptr) return answered(failed);
-      self.tell(*id, false);
-    }
-    answered(error);
+    // An item that is not there may be back in a moment: its share stays.
+    answered(place.error());
   });
 }
 
