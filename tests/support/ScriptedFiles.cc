@@ -13,7 +13,7 @@ T valueAt(const std::map<std::string, T>& map, const NSURLPtr& url) {
   return found != map.end() ? found->second : T();
 }
 
-std::string quoted(const std::optional<std::string>& text) {
+std::string inQuotes(const std::optional<std::string>& text) {
   return text ? "\"" + *text + "\"" : "nil";
 }
 
@@ -33,19 +33,19 @@ void ScriptedFileOperations::fp_importUnderFolder(const NSURLPtr& url, const NSU
 
 void ScriptedFileOperations::fp_createSubFolder(const NSURLPtr& url, const std::string& name,
                                                 VLURLHandler handler) {
-  hold("create " + quoted(name) + " under " + description(url), std::move(handler));
+  hold("create " + inQuotes(name) + " under " + description(url), std::move(handler));
 }
 
 void ScriptedFileOperations::fp_renameWithNewName(const NSURLPtr& url, const std::string& newName,
                                                   VLURLHandler handler) {
-  hold("rename " + description(url) + " to " + quoted(newName), std::move(handler));
+  hold("rename " + description(url) + " to " + inQuotes(newName), std::move(handler));
 }
 
 void ScriptedFileOperations::fp_reparentUnderFolder_withNewName(const NSURLPtr& url,
                                                                 const NSURLPtr& folder,
                                                                 std::optional<std::string> newName,
                                                                 VLURLHandler handler) {
-  hold("move " + description(url) + " under " + description(folder) + " as " + quoted(newName),
+  hold("move " + description(url) + " under " + description(folder) + " as " + inQuotes(newName),
        std::move(handler));
 }
 
