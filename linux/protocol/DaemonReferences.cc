@@ -15,7 +15,8 @@ constexpr int kMostProgressUnderWay = 16;
 template <class Request, class Then>
 void send(DaemonService& service, Request request, Then then) {
   auto sent = request.send().ignoreResult();
-  service.tasks->add(sent.then(then, [then](kj::Exception&&) mutable { then(); }));
+  auto failed = [then](kj::Exception&&) mutable { then(); };
+  service.tasks->add(sent.then(std::move(then), std::move(failed)));
 }
 
 }  // namespace

@@ -154,8 +154,10 @@ void Files::trashedItems(std::uint64_t offset, std::uint64_t limit,
     for (; place.position < items->size() && page.size() < std::min(limit, kMostTrashed);
          ++place.position) {
       const VLFileObjectID id = (*items)[place.position];
-      const VLQueryItemPtr item = _parts.store.itemWithID(id, nullptr);
-      const auto path = _parts.store.pathForID(id, nullptr);
+      NSErrorPtr error;
+      const VLQueryItemPtr item = _parts.store.itemWithID(id, &error);
+      const auto path = item ? _parts.store.pathForID(id, &error) : std::nullopt;
+      if (error && error->domain() != NSCocoaErrorDomain) return answerError(answered, error);
       // What was put back or removed meanwhile is in the trash no more.
       if (!item || !path || !item->isTrashed()) continue;
       // The path that it had is about as long.
