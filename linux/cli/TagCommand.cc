@@ -20,24 +20,30 @@ struct TagOptions : ItemOptions {
   bool changes() const { return clear || !set.empty() || !add.empty() || !remove.empty(); }
 };
 
-int runList(HostService& host, bool json) {
-  const auto [tags, error] =
-      await<std::vector<TagUse>>([&](auto reply) { host.files().tagsInUse(std::move(reply)); });
-  if (error) return complainAbout(error);
-  Output output;
-  for (const TagUse& tag : tags) {
-    if (json) {
-      output.write("{\"tag\":" + jsonString(tag.name) + jsonBytes("tag", tag.name) +
-                   ",\"items\":" + std::to_string(tag.items) + "}\n");
-    } else {
-      std::string count = std::to_string(tag.items);
-      count.insert(0, count.size() < 6 ? 6 - count.size() : 0, ' ');
-      output.write(count + "  ");
-      output.writeName(tag.name);
-      output.write("\n");
-    }
+void writeUse(Output& output, const TagUse& tag, bool json) {
+  if (json) {
+    output.write("{\"tag\":" + jsonString(tag.name) + jsonBytes("tag", tag.name) +
+                 ",\"items\":" + std::to_string(tag.items) + "}\n");
+  } else {
+    std::string count = std::to_string(tag.items);
+    count.insert(0, count.size() < 6 ? 6 - count.size() : 0, ' ');
+    output.write(count + "  ");
+    output.writeName(tag.name);
+    output.write("\n");
   }
-  return kSuccess;
+}
+
+int runList(HostService& host, bool json) {
+  Output output;
+  std::string after;
+  for (;;) {
+    const auto [tags, error] = await<std::vector<TagUse>>(
+        [&](auto reply) { host.files().tagsInUse(after, std::move(reply)); });
+    if (error) return complainAbout(error);
+    if (tags.empty()) return kSuccess;
+    for (const TagUse& tag : tags) writeUse(output, tag, json);
+    after = tags.back().name;
+  }
 }
 
 // The item's tags after what the options ask for; each once, the old ones first.

@@ -6,6 +6,7 @@
 #include "linux/cli/Commands.h"
 #include "linux/cli/ExitCodes.h"
 #include "linux/cli/Interruption.h"
+#include "linux/protocol/StandardDescriptors.h"
 
 namespace {
 
@@ -22,6 +23,7 @@ items that failed, the first one's.)";
 
 int main(int argc, char** argv) {
   using namespace skein::cli;
+  skein::openStandardDescriptors();
   installInterruption();
   std::signal(SIGPIPE, SIG_IGN);
 

@@ -37,9 +37,13 @@ SocketClient::Options optionsFor(const DrivePaths& paths) {
 class DriveServices final : public SkeinServices {
  public:
   explicit DriveServices(const DrivePaths& paths)
-      : _services(makeHostServicesClient(RpcLoop::start("skein-services"),
-                                         std::make_shared<ThreadPool>(2, "services"),
-                                         optionsFor(paths))) {}
+      : _socket(std::make_shared<SocketClient>(RpcLoop::start("skein-services"),
+                                               std::make_shared<ThreadPool>(2, "services"),
+                                               optionsFor(paths))),
+        _services(makeHostServicesClient(_socket)) {}
+  // The program may end right after this. A connection that it closed must be closed by then,
+  // or skein-host takes it for that of a client that died.
+  ~DriveServices() override { _socket->settle(deadlines::kProbe); }
 
   std::vector<std::string> serviceNames(const std::string& item, NSErrorOut error) override {
     return ask<std::vector<std::string>>(
@@ -85,6 +89,7 @@ class DriveServices final : public SkeinServices {
             [connection = std::move(connection), services = _services] { connection->close(); }};
   }
 
+  const std::shared_ptr<SocketClient> _socket;
   const std::shared_ptr<HostServices> _services;
 };
 

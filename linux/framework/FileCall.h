@@ -13,10 +13,6 @@
 
 namespace skein {
 
-// How long a thread waits for a change. The disk and other programs may hold one up, so it
-// takes longer than a question; but no caller is kept for ever.
-inline constexpr std::chrono::seconds kLongestChange{120};
-
 // Calls start(files, origin, reply). `handler`, whose last value is an error, runs once, on
 // the executor: with what came, or with the error that nothing will. It has the calling
 // thread's origin, which `start` gets too, and its progress.
@@ -44,7 +40,7 @@ std::pair<T, NSErrorPtr> askFiles(const DaemonAccess& access, Start start) {
   const auto call = [&](LocalDaemon& daemon, auto reply) {
     start(daemon.files(), RequestOriginScope::current(), std::move(reply));
   };
-  return askDaemon<T>(access, call, kLongestChange);
+  return askDaemon<T>(access, call, deadlines::kChange);
 }
 
 // For calls whose reply takes an error alone.

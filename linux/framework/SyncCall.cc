@@ -13,9 +13,11 @@ NSErrorPtr errorIfMayNotWait(const DaemonAccess& access) {
   return vl_errorDaemonUnreachable("vald cannot be asked from the thread that reads its answers.");
 }
 
-NSErrorPtr waitedTooLong(std::chrono::seconds limit) {
-  return vl_errorDaemonUnreachable("vald is still at work after " + std::to_string(limit.count()) +
-                                   " s; the disk may be busy. Look again before trying again.");
+NSErrorPtr waitedTooLong(std::chrono::milliseconds limit) {
+  return vl_errorDaemonUnreachable(
+      "vald is still at work after " +
+      std::to_string(duration_cast<std::chrono::seconds>(limit).count()) +
+      " s; the disk may be busy. Look again before trying again.");
 }
 
 }  // namespace skein

@@ -7,6 +7,7 @@
 #include "base/Executor.h"
 #include "base/Mutex.h"
 #include "linux/protocol/DaemonClient.h"
+#include "linux/protocol/Deadlines.h"
 
 namespace skein {
 
@@ -22,14 +23,14 @@ struct DaemonAccess {
 NSErrorPtr errorIfMayNotWait(const DaemonAccess& access);
 
 // The answer of a thread that has waited for `limit`.
-NSErrorPtr waitedTooLong(std::chrono::seconds limit);
+NSErrorPtr waitedTooLong(std::chrono::milliseconds limit);
 
 // Calls start(daemon, reply) and waits until `reply` was called with a value and an error,
 // or the message failed: with the message's deadline, for most, and at the latest after
 // `limit`; what was asked for may happen all the same then. Any thread but the loop's.
 template <class T, class Start>
 std::pair<T, NSErrorPtr> askDaemon(const DaemonAccess& access, Start start,
-                                   std::chrono::seconds limit = std::chrono::seconds(60)) {
+                                   std::chrono::milliseconds limit = deadlines::kAnswer) {
   struct Answer {
     Mutex mutex;
     CondVar came;

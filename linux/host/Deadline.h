@@ -4,6 +4,7 @@
 #include <memory>
 #include <utility>
 
+#include "base/Mutex.h"
 #include "linux/host/Listing.h"
 
 namespace skein {
@@ -22,6 +23,14 @@ class TimedReply final {
     return timed;
   }
 
+  // Keeps `turn` until the answer. False when it was answered: then nobody wants the work.
+  bool keep(std::shared_ptr<void> turn) SKEIN_EXCLUDES(_mutex) {
+    MutexLock lock(_mutex);
+    if (_answered) return false;
+    _turn = std::move(turn);
+    return true;
+  }
+
   void operator()(Values... values, NSErrorPtr error) {
     _timers->cancel(_timer);
     answer(std::move(values)..., std::move(error));
@@ -33,6 +42,11 @@ class TimedReply final {
 
   void answer(Values... values, NSErrorPtr error) {
     if (_answered.exchange(true)) return;
+    std::shared_ptr<void> turn;
+    {
+      MutexLock lock(_mutex);
+      turn.swap(_turn);
+    }
     const auto reply = std::make_shared<Reply<Values..., NSErrorPtr>>(std::move(_reply));
     (*reply)(std::move(values)..., std::move(error));
   }
@@ -41,6 +55,8 @@ class TimedReply final {
   std::atomic<Timers::Key> _timer{0};
   std::atomic<bool> _answered{false};
   Reply<Values..., NSErrorPtr> _reply;  // of whoever sets _answered
+  Mutex _mutex;
+  std::shared_ptr<void> _turn SKEIN_GUARDED_BY(_mutex);
 };
 
 }  // namespace skein

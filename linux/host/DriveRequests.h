@@ -10,6 +10,7 @@
 #include "linux/host/Deadline.h"
 #include "linux/host/FileProviderHost.h"
 #include "linux/host/ItemPaths.h"
+#include "linux/host/RequestTurns.h"
 #include "linux/host/WorkingSetWatch.h"
 #include "linux/protocol/HostTypes.h"
 
@@ -27,7 +28,8 @@ class DriveRequests final : public std::enable_shared_from_this<DriveRequests> {
                 VLContainers& containers)
       : _host(std::move(host)),
         _daemon(std::move(daemon)),
-        _paths(_host->extension(), containers) {}
+        _paths(_host->extension(), containers),
+        _turns(std::make_shared<RequestTurns>(_host->tools().executor)) {}
 
   FileProviderHost& host() const { return *_host; }
   const std::shared_ptr<FileProviderHost>& sharedHost() const { return _host; }
@@ -39,7 +41,8 @@ class DriveRequests final : public std::enable_shared_from_this<DriveRequests> {
   // Runs `work(timed)` on the executor, after vald has answered: the extension's lookups take
   // a vald that cannot be reached for an item that is not there, and its root URL, which is
   // asked once and kept, for a drive without one. So whoever asks after vald was lost waits
-  // here until it is back, or hears that it is not.
+  // here until it is back, or hears that it is not. Then it waits for its turn; work whose
+  // deadline has passed by then is not begun.
   template <class... Values, class Work>
   void withDrive(std::type_identity_t<Reply<Values..., NSErrorPtr>> reply, Work work) {
     withDrive<Values...>(std::move(reply), std::move(work), tools().deadline);
@@ -70,6 +73,7 @@ class DriveRequests final : public std::enable_shared_from_this<DriveRequests> {
   const std::shared_ptr<FileProviderHost> _host;
   const DaemonProxies _daemon;
   const ItemPaths _paths;
+  const std::shared_ptr<RequestTurns> _turns;
 };
 
 // For calls that go straight to vald: its answer, or the connection's error.
@@ -84,12 +88,16 @@ void DriveRequests::withDrive(std::type_identity_t<Reply<Values..., NSErrorPtr>>
   HostTools timing = tools();
   timing.deadline = deadline;
   auto timed = TimedReply<Values...>::begin(timing, std::move(reply));
-  reachVald(kTries, [timed, work = std::move(work)](NSErrorPtr error) mutable {
+  reachVald(kTries, [timed, work = std::move(work), turns = _turns](NSErrorPtr error) mutable {
     if (error) {
       (*timed)(Values()..., std::move(error));
-    } else {
-      work(std::move(timed));
+      return;
     }
+    turns->take(
+        [timed = std::move(timed), work = std::move(work)](RequestTurns::Turn turn) mutable {
+          // Held here too: an answer at the deadline leaves the work's thread waiting.
+          if (timed->keep(turn)) work(std::move(timed));
+        });
   });
 }
 

@@ -16,10 +16,6 @@ using Entries = std::vector<FileHistoryEntry>;
 using ItemCompletion = NSFileProviderExtension::ItemCompletion;
 using TimedTransfer = std::shared_ptr<TimedReply<std::shared_ptr<HostTransfer>>>;
 
-// A tree is removed in as long as it takes. vald's connection notices before that when vald
-// no longer lives; this ends a request that the extension forgot.
-constexpr std::chrono::minutes kChangeDeadline{10};
-
 // Some of the extension's operations may end with neither an item nor an error.
 NSErrorPtr nothingAnsweredError() {
   return NSError::errorWithDomain(
@@ -128,7 +124,7 @@ void HostFileRequests::change(HostTarget target, RequestOrigin origin, ItemReply
         const RequestOriginScope scope(origin);
         operation(*drive, *identifier, completionFor(drive, timed));
       },
-      kChangeDeadline);
+      deadlines::kLongRequest);
 }
 
 template <class Operation>
@@ -190,7 +186,7 @@ void HostFileRequests::evict(HostTarget target, Reply<NSErrorPtr> reply) {
         if (url) error = contents->evict(url);
         (*timed)(error);
       },
-      kChangeDeadline);
+      deadlines::kLongRequest);
 }
 
 void HostFileRequests::setPinned(HostTarget target, bool pinned, Reply<NSErrorPtr> reply) {
@@ -374,11 +370,11 @@ void HostFileRequests::setTags(HostTarget target, std::vector<std::string> names
          });
 }
 
-void HostFileRequests::tagsInUse(Reply<std::vector<TagUse>, NSErrorPtr> reply) {
+void HostFileRequests::tagsInUse(std::string after, Reply<std::vector<TagUse>, NSErrorPtr> reply) {
   auto timed = TimedReply<std::vector<TagUse>>::begin(_drive->tools(), std::move(reply));
   _drive->daemon()(failing(timed))
       ->files()
-      .tagsInUse([timed](std::vector<TagUse> tags, NSErrorPtr error) {
+      .tagsInUse(std::move(after), [timed](std::vector<TagUse> tags, NSErrorPtr error) {
         (*timed)(std::move(tags), std::move(error));
       });
 }

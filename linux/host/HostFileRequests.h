@@ -37,7 +37,7 @@ class HostFileRequests final : public HostFiles {
               Reply<std::shared_ptr<HostTransfer>, NSErrorPtr> reply) override;
   void trashedItems(Reply<std::shared_ptr<HostTrash>, NSErrorPtr> reply) override;
   void setTags(HostTarget target, std::vector<std::string> names, ItemReply reply) override;
-  void tagsInUse(Reply<std::vector<TagUse>, NSErrorPtr> reply) override;
+  void tagsInUse(std::string after, Reply<std::vector<TagUse>, NSErrorPtr> reply) override;
   void setFavoriteRank(HostTarget target, std::optional<std::int64_t> rank,
                        ItemReply reply) override;
   void setLastUsedDate(HostTarget target, std::optional<NSDate> date, ItemReply reply) override;

@@ -59,6 +59,13 @@ Listing::Listing(std::shared_ptr<NSFileProviderEnumerator> enumerator, NSFilePro
       _tools(std::move(tools)),
       _nextPage(std::move(firstPage)) {}
 
+// The last reference may go where the enumerator's lock is held.
+Listing::~Listing() {
+  _tools.timers->cancel(_timer);
+  if (_ended || !_invalidatesAtEnd) return;
+  _tools.executor->post([enumerator = _enumerator] { enumerator->invalidate(); });
+}
+
 void Listing::next(PageReply reply) {
   {
     MutexLock lock(_mutex);
@@ -94,7 +101,7 @@ void Listing::askIfRoom() {
     _asking = true;
     request = ++_request;
     page = _nextPage;
-    _timer = _tools.timers->after(_tools.deadline, [weak = weak_from_this(), request] {
+    _timer = _tools.timers->after(_tools.pageDeadline, [weak = weak_from_this(), request] {
       if (const auto self = weak.lock()) self->deadlineDidPass(request);
     });
   }
@@ -121,7 +128,7 @@ void Listing::pageDidArrive(std::uint64_t request, Answer answer,
 }
 
 void Listing::deadlineDidPass(std::uint64_t request) {
-  pageDidArrive(request, {{}, true, lostAnswerError(_tools.deadline)}, std::nullopt);
+  pageDidArrive(request, {{}, true, lostAnswerError(_tools.pageDeadline)}, std::nullopt);
 }
 
 // One thread at a time, so that pages go out in order.

@@ -9,6 +9,7 @@
 #include "base/Executor.h"
 #include "base/Mutex.h"
 #include "linux/host/Timers.h"
+#include "linux/protocol/Deadlines.h"
 #include "platform/fileprovider/NSFileProviderEnumerating.h"
 
 namespace skein {
@@ -17,8 +18,9 @@ namespace skein {
 struct HostTools {
   std::shared_ptr<Executor> executor;
   std::shared_ptr<Timers> timers;
-  // How long an extension may keep an answer back before it counts as lost.
-  std::chrono::milliseconds deadline{4500};
+  // How long an extension may keep an answer back before it counts as lost; and a page.
+  std::chrono::milliseconds deadline{deadlines::kRequest};
+  std::chrono::milliseconds pageDeadline{deadlines::kPage};
 };
 
 // The error of a request whose answer did not come by the deadline.
@@ -38,6 +40,9 @@ class Listing final : public std::enable_shared_from_this<Listing> {
 
   // Asks for the first page, ahead of the consumer.
   void start() { askIfRoom(); }
+
+  // A listing that goes away, finished or not, has invalidated its own enumerator.
+  ~Listing();
 
   // Hands the next page out, on the executor, when it is there. Several may be asked for at
   // once; they are answered in order. After the last page: an empty last one, or the error.

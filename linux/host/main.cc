@@ -27,6 +27,7 @@
 #include "linux/protocol/HostServer.h"
 #include "linux/protocol/LogFile.h"
 #include "linux/protocol/ProcessLauncher.h"
+#include "linux/protocol/StandardDescriptors.h"
 #include "linux/protocol/UnixSocket.h"
 #include "support/Environment.h"
 
@@ -114,13 +115,19 @@ std::string attributesPath() {
   return folder + "/../share/skein/extension.attributes";
 }
 
-// Goes on in a child when it is not to stay in the foreground; the first process ends with
-// status 0 once the child serves, or 1. Answers where the child says that it does.
+// Goes on in a child; the first process ends with status 0 once the child serves, or 1.
+// Answers where the child says that it does; nothing, with errno, when there is no child.
 FileDescriptor leaveForeground() {
   int ends[2];
   if (pipe2(ends, O_CLOEXEC) != 0) return FileDescriptor();
   const pid_t child = fork();
-  if (child < 0) return FileDescriptor();
+  if (child < 0) {
+    const int code = errno;
+    close(ends[0]);
+    close(ends[1]);
+    errno = code;
+    return FileDescriptor();
+  }
   if (child > 0) {
     close(ends[1]);
     char ready = 0;
@@ -137,8 +144,10 @@ FileDescriptor leaveForeground() {
 
 void report(const FileDescriptor& parent, int code) {
   const char byte = static_cast<char>(code);
-  if (parent) [[maybe_unused]]
-    const ssize_t written = write(parent.get(), &byte, 1);
+  if (!parent) return;
+  // Said all that there was to say to whoever started it.
+  if (code == 0) releaseStandardDescriptors();
+  [[maybe_unused]] const ssize_t written = write(parent.get(), &byte, 1);
 }
 
 enum class Lock : std::uint8_t { Taken, Held, Failed };
@@ -250,6 +259,7 @@ int serve(const Arguments& arguments, const DrivePaths& paths, const FileDescrip
 
 int main(int argc, char** argv) {
   using namespace skein;
+  openStandardDescriptors();
   Arguments arguments;
   bool help = false;
   if (const std::string problem = parse(argc, argv, arguments, help); !problem.empty()) {
@@ -270,7 +280,11 @@ int main(int argc, char** argv) {
   NSErrorPtr error;
   const DrivePaths paths = DrivePaths::forStore(arguments.store, &error);
   if (paths.store.empty()) return fail(kExitFailure, error->localizedDescription());
-  const FileDescriptor parent = arguments.foreground ? FileDescriptor() : leaveForeground();
+  FileDescriptor parent;
+  if (!arguments.foreground && !(parent = leaveForeground())) {
+    return fail(kExitFailure, std::string("it cannot go to the background, try --foreground: ") +
+                                  std::strerror(errno));
+  }
   FileDescriptor lockFile;
   switch (takeLock(paths, lockFile)) {
     case Lock::Held: report(parent, 0); return 0;

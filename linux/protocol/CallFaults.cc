@@ -75,10 +75,10 @@ std::vector<FaultableMethod> faultableMethods() {
 
 std::optional<FaultInjection> takeFault(const DaemonService& service, std::uint64_t interfaceID,
                                         std::uint16_t methodID) {
-  if (!service.faults) return std::nullopt;
+  if (!service.server->faults) return std::nullopt;
   const auto found = allMethods().find({interfaceID, methodID});
   if (found == allMethods().end()) return std::nullopt;
-  return service.faults->take(found->second.name);
+  return service.server->faults->take(found->second.name);
 }
 
 kj::Promise<void> answerWithFault(DaemonService& service, const FaultInjection& fault,
@@ -87,7 +87,7 @@ kj::Promise<void> answerWithFault(DaemonService& service, const FaultInjection& 
   switch (fault.action) {
     case FaultInjection::Action::DropConnection:
       // The call ends unanswered, with its connection.
-      service.dropConnections();
+      service.server->dropConnections();
       return kj::NEVER_DONE;
     case FaultInjection::Action::Delay:
       return service.loop->io()

@@ -18,7 +18,7 @@ class CloudObject : public virtual wire::Cloud::Server {
   kj::Promise<void> cloudStatus(CloudStatusContext context) override;
 
  private:
-  LocalCloud& cloud() const { return _service->daemon->cloud(); }
+  LocalCloud& cloud() const { return _service->server->daemon->cloud(); }
 
   const DaemonServicePtr _service;
 };

@@ -7,6 +7,7 @@
 #include <string>
 
 #include "base/Executor.h"
+#include "linux/protocol/Deadlines.h"
 #include "linux/protocol/LocalDaemon.h"
 #include "linux/protocol/ProcessLauncher.h"
 #include "linux/protocol/RpcLoop.h"
@@ -28,7 +29,7 @@ class DaemonClient {
     std::string socketPath;
     // How to start vald when it does not run; none: that is an error.
     std::optional<ProgramToStart> program;
-    std::chrono::milliseconds deadline{4000};
+    std::chrono::milliseconds deadline{deadlines::kMessage};
   };
 
   DaemonClient(std::shared_ptr<RpcLoop> loop, std::shared_ptr<Executor> executor, Options options);

@@ -16,7 +16,7 @@ template <class Request, class Then>
 void send(DaemonService& service, Request request, Then then) {
   auto sent = request.send().ignoreResult();
   auto failed = [then](kj::Exception&&) mutable { then(); };
-  service.tasks->add(sent.then(std::move(then), std::move(failed)));
+  service.server->tasks->add(sent.then(std::move(then), std::move(failed)));
 }
 
 }  // namespace
@@ -49,7 +49,7 @@ void ReceiverReference::receiveUpdates(const VLQueryItems& items,
                   logicalExtensions);
     codec::encode(request.initPhysicalExtensions(static_cast<unsigned>(physicalExtensions.size())),
                   physicalExtensions);
-    self->_service->tasks->add(request.send().ignoreResult().then(
+    self->_service->server->tasks->add(request.send().ignoreResult().then(
         [executor = self->_service->executor, reply = std::move(reply)]() mutable {
           executor->post([reply = std::move(reply)]() mutable { reply(); });
         }));
@@ -70,7 +70,7 @@ void ReceiverReference::linkDidBreak(NSErrorPtr error) {
   _service->loop->post([self = shared_from_this(), error = std::move(error)] {
     auto request = self->_client->linkDidBreakRequest();
     codec::setError(static_cast<wire::Receiver::LinkDidBreakParams::Builder&>(request), error);
-    self->_service->tasks->add(request.send().ignoreResult());
+    self->_service->server->tasks->add(request.send().ignoreResult());
   });
 }
 

@@ -286,7 +286,7 @@ class DaemonObject : public wire::Daemon::Server,
   }
 
  private:
-  LocalDaemon& daemon() const { return *_service->daemon; }
+  LocalDaemon& daemon() const { return *_service->server->daemon; }
 
   const DaemonServicePtr _service;
   const std::shared_ptr<std::size_t> _senders = std::make_shared<std::size_t>(0);
@@ -297,10 +297,11 @@ class DaemonObject : public wire::Daemon::Server,
 
 class DaemonServer::Implementation {
  public:
-  explicit Implementation(DaemonServicePtr service) : _service(std::move(service)) {}
+  Implementation(std::shared_ptr<RpcLoop> loop, std::shared_ptr<ServedDaemon> served)
+      : _loop(std::move(loop)), _served(std::move(served)) {}
   ~Implementation() {
     sockets.reset();
-    _service->loop->postAndWait([service = _service] { service->close(); });
+    _loop->postAndWait([served = _served] { served->close(); });
   }
   Implementation(const Implementation&) = delete;
   Implementation& operator=(const Implementation&) = delete;
@@ -308,7 +309,8 @@ class DaemonServer::Implementation {
   std::shared_ptr<SocketServer> sockets;
 
  private:
-  const DaemonServicePtr _service;
+  const std::shared_ptr<RpcLoop> _loop;
+  const std::shared_ptr<ServedDaemon> _served;
 };
 
 std::unique_ptr<DaemonServer> DaemonServer::listen(const std::shared_ptr<RpcLoop>& loop,
@@ -317,18 +319,19 @@ std::unique_ptr<DaemonServer> DaemonServer::listen(const std::shared_ptr<RpcLoop
                                                    const std::string& socketPath, Log& log,
                                                    NSErrorOut error,
                                                    const std::shared_ptr<CallFaults>& faults) {
-  const DaemonServicePtr service =
-      loop->own(std::make_unique<DaemonService>(loop, executor, daemon, faults));
-  auto implementation = std::make_unique<Implementation>(service);
+  const std::shared_ptr<ServedDaemon> served =
+      loop->own(std::make_unique<ServedDaemon>(daemon, faults));
+  auto implementation = std::make_unique<Implementation>(loop, served);
   implementation->sockets = SocketServer::listen(
       loop, socketPath,
-      [service]() -> capnp::Capability::Client {
-        return kj::heap<WithFaults<DaemonObject>>(service);
+      [loop, executor, served]() -> capnp::Capability::Client {
+        return kj::heap<WithFaults<DaemonObject>>(
+            std::make_shared<DaemonService>(DaemonService{loop, executor, served}));
       },
       log, {}, error);
   if (!implementation->sockets) return nullptr;
-  loop->post([service, weak = std::weak_ptr(implementation->sockets)] {
-    service->dropConnections = [weak] {
+  loop->post([served, weak = std::weak_ptr(implementation->sockets)] {
+    served->dropConnections = [weak] {
       if (const auto sockets = weak.lock()) sockets->dropConnections();
     };
   });
@@ -339,6 +342,10 @@ DaemonServer::DaemonServer(std::unique_ptr<Implementation> implementation)
     : _implementation(std::move(implementation)) {}
 
 DaemonServer::~DaemonServer() = default;
+
+void DaemonServer::finish(std::chrono::milliseconds patience) {
+  _implementation->sockets->finish(patience);
+}
 
 void DaemonServer::dropConnections() { _implementation->sockets->dropConnections(); }
 

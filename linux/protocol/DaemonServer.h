@@ -1,5 +1,6 @@
 #pragma once
 
+#include <chrono>
 #include <memory>
 #include <string>
 
@@ -34,6 +35,9 @@ class DaemonServer {
   // Closes the socket and every connection. When it returns, the server has let go of the
   // daemon and the log; update senders may still be on their way to the executor.
   ~DaemonServer();
+
+  // Lets every client read what was answered; see SocketServer::finish.
+  void finish(std::chrono::milliseconds patience);
 
   // Closes every connection there is; new ones are accepted. Any thread.
   void dropConnections();

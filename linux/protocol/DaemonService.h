@@ -18,18 +18,10 @@
 
 namespace skein {
 
-// What the objects of one server share. Its fields are used on the loop's thread.
-struct DaemonService final : private kj::TaskSet::ErrorHandler {
-  // Of all connections together.
-  static constexpr std::size_t kMostUnanswered = 8192;
-
-  DaemonService(std::shared_ptr<RpcLoop> rpcLoop, std::shared_ptr<Executor> runner,
-                std::shared_ptr<LocalDaemon> served, std::shared_ptr<CallFaults> planned)
-      : loop(std::move(rpcLoop)),
-        executor(std::move(runner)),
-        daemon(std::move(served)),
-        faults(std::move(planned)),
-        tasks(newTasks()) {}
+// What all connections of one server share. Its fields are used on the loop's thread.
+struct ServedDaemon final : private kj::TaskSet::ErrorHandler {
+  ServedDaemon(std::shared_ptr<LocalDaemon> served, std::shared_ptr<CallFaults> planned)
+      : daemon(std::move(served)), faults(std::move(planned)), tasks(newTasks()) {}
 
   // Lets go of the daemon and of everything on its way to clients. Once there are no more
   // connections.
@@ -39,14 +31,10 @@ struct DaemonService final : private kj::TaskSet::ErrorHandler {
     faults = nullptr;
   }
 
-  const std::shared_ptr<RpcLoop> loop;
-  const std::shared_ptr<Executor> executor;
   std::shared_ptr<LocalDaemon> daemon;
   std::shared_ptr<CallFaults> faults;  // null: no faults
   // Closes every client's connection, soon.
   std::function<void()> dropConnections = [] {};
-  // Calls that vald has not answered, of clients that are gone too.
-  std::size_t unanswered = 0;
   kj::Own<kj::TaskSet> tasks;
 
  private:
@@ -55,6 +43,16 @@ struct DaemonService final : private kj::TaskSet::ErrorHandler {
   }
   // A push that failed. Whoever made it knows, by its reply that goes uncalled.
   void taskFailed(kj::Exception&&) override {}
+};
+
+// What the objects of one connection share. Its fields are used on the loop's thread.
+struct DaemonService {
+  static constexpr std::size_t kMostUnanswered = 4096;
+
+  const std::shared_ptr<RpcLoop> loop;
+  const std::shared_ptr<Executor> executor;
+  const std::shared_ptr<ServedDaemon> server;
+  std::size_t unanswered = 0;  // calls that vald has not answered, also of a client that is gone
 };
 using DaemonServicePtr = std::shared_ptr<DaemonService>;
 

@@ -191,7 +191,10 @@ kj::Promise<void> FilesObject::setFavoriteRank(SetFavoriteRankContext context) {
 
 kj::Promise<void> FilesObject::tagsInUse(TagsInUseContext context) {
   return answer(
-      _service, context, [&](auto reply) { files().tagsInUse(std::move(reply)); },
+      _service, context,
+      [&](auto reply) {
+        files().tagsInUse(codec::text(context.getParams().getAfter()), std::move(reply));
+      },
       [](auto results, const std::vector<TagUse>& tags, const NSErrorPtr& error) {
         encodeAll(results.initTags(static_cast<unsigned>(tags.size())), tags);
         codec::setError(results, error);

@@ -37,7 +37,7 @@ class FilesObject : public virtual wire::Files::Server {
   kj::Promise<void> history(HistoryContext context) override;
 
  private:
-  LocalFiles& files() const { return _service->daemon->files(); }
+  LocalFiles& files() const { return _service->server->daemon->files(); }
   template <class Context, class Start>
   kj::Promise<void> answerURL(Context context, Start start);
   template <class Context, class Start>

@@ -234,8 +234,13 @@ class FilesProxy final : public LocalFiles {
         errorReply(std::move(reply)));
   }
 
-  void tagsInUse(Reply<std::vector<TagUse>, NSErrorPtr> reply) override {
-    ask([](wire::Files::Client& files) { return files.tagsInUseRequest().send(); },
+  void tagsInUse(std::string after, Reply<std::vector<TagUse>, NSErrorPtr> reply) override {
+    ask(
+        [after = std::move(after)](wire::Files::Client& files) {
+          auto request = files.tagsInUseRequest();
+          request.setAfter(codec::bytes(after));
+          return request.send();
+        },
         [reply = std::move(reply)](const auto& results) mutable -> Task {
           return [reply = std::move(reply), tags = decodeAll<TagUse>(results.getTags()),
                   error = codec::errorOf(results)]() mutable {

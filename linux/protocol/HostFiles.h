@@ -69,7 +69,8 @@ class HostFiles {
   virtual void trashedItems(Reply<std::shared_ptr<HostTrash>, NSErrorPtr> reply) = 0;
 
   virtual void setTags(HostTarget target, std::vector<std::string> names, ItemReply reply) = 0;
-  virtual void tagsInUse(Reply<std::vector<TagUse>, NSErrorPtr> reply) = 0;
+  // A page, as LocalFiles::tagsInUse.
+  virtual void tagsInUse(std::string after, Reply<std::vector<TagUse>, NSErrorPtr> reply) = 0;
   virtual void setFavoriteRank(HostTarget target, std::optional<std::int64_t> rank,
                                ItemReply reply) = 0;
   virtual void setLastUsedDate(HostTarget target, std::optional<NSDate> date, ItemReply reply) = 0;

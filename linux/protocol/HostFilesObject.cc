@@ -216,7 +216,10 @@ kj::Promise<void> HostFilesObject::setTags(SetTagsContext context) {
 
 kj::Promise<void> HostFilesObject::tagsInUse(TagsInUseContext context) {
   return serve(
-      context, [](HostFiles& files, auto reply) { files.tagsInUse(std::move(reply)); },
+      context,
+      [after = codec::text(context.getParams().getAfter())](HostFiles& files, auto reply) {
+        files.tagsInUse(after, std::move(reply));
+      },
       [](auto results, const std::vector<TagUse>& tags, const NSErrorPtr& error) {
         encodeAll(results.initTags(static_cast<unsigned>(tags.size())), tags);
         codec::setError(results, error);

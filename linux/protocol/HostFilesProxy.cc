@@ -221,10 +221,14 @@ class HostFilesProxy final : public HostFiles, private HostCalls<wire::HostFiles
         reply);
   }
 
-  void tagsInUse(Reply<std::vector<TagUse>, NSErrorPtr> reply) override {
-    call<std::vector<TagUse>>([](Wire& host) { return host.tagsInUseRequest().send(); },
-                              [](auto& results) { return decodeAll<TagUse>(results.getTags()); },
-                              reply);
+  void tagsInUse(std::string after, Reply<std::vector<TagUse>, NSErrorPtr> reply) override {
+    call<std::vector<TagUse>>(
+        [after = std::move(after)](Wire& host) {
+          auto request = host.tagsInUseRequest();
+          request.setAfter(codec::bytes(after));
+          return request.send();
+        },
+        [](auto& results) { return decodeAll<TagUse>(results.getTags()); }, reply);
   }
 
   void setFavoriteRank(HostTarget target, std::optional<std::int64_t> rank,

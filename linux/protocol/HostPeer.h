@@ -19,12 +19,16 @@ namespace skein {
 struct HostPeer {
   // A terminal's listing has three pages under way.
   static constexpr std::size_t kMostUnanswered = 256;
+  // Listings, watches, batches and transfers that are not let go of.
+  static constexpr std::size_t kMostStreams = 256;
 
   std::shared_ptr<RpcLoop> loop;
   std::shared_ptr<Executor> executor;
   std::shared_ptr<HostService> service;
   std::shared_ptr<HostServices> services;
-  std::size_t unanswered = 0;  // on the loop's thread
+  // On the loop's thread.
+  std::size_t unanswered = 0;
+  std::size_t streams = 0;
 };
 using HostPeerPtr = std::shared_ptr<HostPeer>;
 
@@ -56,11 +60,16 @@ template <class Stream>
 class StreamOwner {
  public:
   StreamOwner(HostPeerPtr peer, std::shared_ptr<Stream> stream)
-      : _peer(std::move(peer)),
-        _stream(std::move(stream)),
-        _queue("host-stream", _peer->executor) {}
+      : _peer(std::move(peer)), _stream(std::move(stream)), _queue("host-stream", _peer->executor) {
+    if (_peer->streams >= HostPeer::kMostStreams) {
+      release();
+      KJ_FAIL_REQUIRE("this client has too many streams");
+    }
+    ++_peer->streams;
+  }
   ~StreamOwner() {
-    _peer->executor->post([stream = std::move(_stream)]() mutable { stream = nullptr; });
+    --_peer->streams;
+    release();
   }
   StreamOwner(const StreamOwner&) = delete;
   StreamOwner& operator=(const StreamOwner&) = delete;
@@ -81,6 +90,10 @@ class StreamOwner {
   }
 
  private:
+  void release() {
+    _peer->executor->post([stream = std::move(_stream)]() mutable { stream = nullptr; });
+  }
+
   const HostPeerPtr _peer;
   std::shared_ptr<Stream> _stream;
   SerialQueue _queue;

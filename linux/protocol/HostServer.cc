@@ -266,7 +266,7 @@ std::unique_ptr<HostServer> HostServer::listen(const std::shared_ptr<RpcLoop>& l
       loop, socketPath,
       [loop, executor, service, services]() -> capnp::Capability::Client {
         return kj::heap<HostObject>(
-            std::make_shared<HostPeer>(HostPeer{loop, executor, service, services, 0}));
+            std::make_shared<HostPeer>(HostPeer{loop, executor, service, services}));
       },
       log, {}, error);
   if (!implementation->server) return nullptr;

@@ -102,8 +102,9 @@ class LocalFiles {
                                Reply<NSErrorPtr> reply) = 0;
   virtual void setFavoriteRank(NSURLPtr url, std::optional<std::int64_t> rank,
                                Reply<NSErrorPtr> reply) = 0;
-  // Every tag that an item of the drive has, by name.
-  virtual void tagsInUse(Reply<std::vector<TagUse>, NSErrorPtr> reply) = 0;
+  // A page of the tags that items of the drive have, by name: those after `after`, empty for
+  // the start. There are no more when none come.
+  virtual void tagsInUse(std::string after, Reply<std::vector<TagUse>, NSErrorPtr> reply) = 0;
 
   // Makes a document's contents present; at once when they are. `currentVersion`: fetches the
   // cloud's newest revision when it is newer than what is present. The progress counts bytes

@@ -16,7 +16,7 @@ struct ProgramToStart {
   std::string logPath;                 // takes its standard output and error
   // Where the program is; empty: where the running program is.
   std::string folder;
-  std::chrono::milliseconds deadline{4000};
+  std::chrono::milliseconds deadline{deadlines::kProgramStart};
 };
 
 // The folder of the running program's file; empty when the system does not tell.

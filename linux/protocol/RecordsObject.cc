@@ -28,8 +28,8 @@ kj::Promise<void> RecordsObject::contentRecordIDs(ContentRecordIDsContext contex
         if (documents.size() > LocalRecords::kMostRecords) {
           reply(std::optional<VLContentRecordIDs>(), tooMany(documents.size()));
         } else {
-          _service->daemon->records().resolveFileObjectIDsToContentRecordIDs(documents,
-                                                                             std::move(reply));
+          _service->server->daemon->records().resolveFileObjectIDsToContentRecordIDs(
+              documents, std::move(reply));
         }
       },
       [](auto results, const std::optional<VLContentRecordIDs>& recordIDs,
@@ -71,7 +71,8 @@ kj::Promise<void> RecordFetchObject::records(RecordsContext context) {
   return answer(
       _service, context,
       [&](auto reply) {
-        _progress = _service->daemon->records().fetchRecords(std::move(_query), std::move(reply));
+        _progress =
+            _service->server->daemon->records().fetchRecords(std::move(_query), std::move(reply));
         if (_isCancelled) cancelSoon();
       },
       [](auto results, const std::vector<FetchedRecord>& records, const NSErrorPtr& error) {

@@ -15,6 +15,8 @@ capnp::ReaderOptions optionsForSending(const RpcLimits& limits) {
   return options;
 }
 
+constexpr auto kBetweenLooks = 2 * kj::MILLISECONDS;
+
 kj::Own<kj::AsyncIoStream> wrap(RpcIo& io, FileDescriptor socket) {
   return io.provider.wrapSocketFd(socket.release(),
                                   kj::LowLevelAsyncIoProvider::TAKE_OWNERSHIP |
@@ -128,6 +130,14 @@ RpcConnection::RpcConnection(RpcIo& io, FileDescriptor socket, const RpcLimits& 
 // the RPC system is the one that ends.
 kj::Promise<void> RpcConnection::onEnd() {
   return _stream.onEnd().exclusiveJoin(_network.onDisconnect());
+}
+
+kj::Promise<void> RpcConnection::finish(kj::Timer& timer) {
+  // Last, so that what was just answered is among what is sent.
+  return kj::evalLast([this, &timer]() -> kj::Promise<void> {
+    if (_network.getCurrentQueueSize() == 0) return _stream.end();
+    return timer.afterDelay(kBetweenLooks).then([this, &timer] { return finish(timer); });
+  });
 }
 
 capnp::Capability::Client RpcConnection::bootstrap() {

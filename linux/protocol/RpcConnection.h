@@ -103,6 +103,8 @@ class RpcConnection {
 
   // Resolves when the connection is of no more use.
   kj::Promise<void> onEnd();
+  // Says that nothing more comes, once everything was written that was to be sent.
+  kj::Promise<void> finish(kj::Timer& timer);
   // How many messages the peer has sent.
   std::uint64_t messagesRead() const { return _stream.messagesRead(); }
 

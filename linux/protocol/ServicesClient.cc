@@ -481,10 +481,14 @@ class HostServicesProxy final : public HostServices {
 
 }  // namespace
 
+std::shared_ptr<HostServices> makeHostServicesClient(std::shared_ptr<SocketClient> socket) {
+  return std::make_shared<HostServicesProxy>(std::move(socket));
+}
+
 std::shared_ptr<HostServices> makeHostServicesClient(std::shared_ptr<RpcLoop> loop,
                                                      std::shared_ptr<Executor> executor,
                                                      SocketClient::Options options) {
-  return std::make_shared<HostServicesProxy>(
+  return makeHostServicesClient(
       std::make_shared<SocketClient>(std::move(loop), std::move(executor), std::move(options)));
 }
 

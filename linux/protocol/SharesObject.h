@@ -30,7 +30,7 @@ class SharesObject : public virtual wire::Shares::Server {
   kj::Promise<void> shareOptions(ShareOptionsContext context) override;
 
  private:
-  LocalShares& shares() const { return _service->daemon->shares(); }
+  LocalShares& shares() const { return _service->server->daemon->shares(); }
   // start(shares, params, reply) answers the progress that cancels what it started.
   template <class Context, class Start, class Encode>
   kj::Promise<void> answerUnlessGivenUp(Context context, Start start, Encode encode);

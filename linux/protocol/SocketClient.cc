@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "base/Fault.h"
+#include "base/Mutex.h"
 #include "linux/protocol/RpcConnection.h"
 #include "linux/protocol/UnixSocket.h"
 #include "vellum/VLErrors.h"
@@ -18,7 +19,7 @@ namespace skein {
 namespace {
 
 // How long a peer that let a deadline pass has to answer a probe.
-constexpr auto kProbeTime = 500 * kj::MILLISECONDS;
+constexpr auto kProbeTime = deadlines::kProbe.count() * kj::MILLISECONDS;
 constexpr auto kBetweenConnects = 10 * kj::MILLISECONDS;
 // How often a peer is probed while it takes its time.
 constexpr auto kBetweenProbes = 500 * kj::MILLISECONDS;
@@ -79,6 +80,15 @@ struct SocketClient::Core final : std::enable_shared_from_this<Core>,
   kj::Promise<void> ending = nullptr;
   bool connecting = false;
   kj::ForkedPromise<void> connectingNow = nullptr;
+
+  // Told when nothing is under way.
+  struct Settled {
+    Mutex mutex;
+    CondVar came;
+    bool isSo SKEIN_GUARDED_BY(mutex) = false;
+  };
+  void tellIfSettled();
+  std::vector<std::shared_ptr<Settled>> settling;
 
   std::list<MessagePtr> messages;
   struct Watcher {
@@ -239,12 +249,22 @@ void SocketClient::Core::finish(const MessagePtr& message, const NSErrorPtr& err
   if (!message->fail) return;
   Fail fail = std::exchange(message->fail, nullptr);
   messages.erase(message->place);
+  tellIfSettled();
   if (!error) return;
   if (message->failsOnLoop) {
     fail(error);
     return;
   }
   executor->post([fail = std::move(fail), error]() mutable { fail(error); });
+}
+
+void SocketClient::Core::tellIfSettled() {
+  if (!messages.empty()) return;
+  for (const auto& one : std::exchange(settling, {})) {
+    MutexLock lock(one->mutex);
+    one->isSo = true;
+    one->came.notifyAll();
+  }
 }
 
 void SocketClient::Core::run(const MessagePtr& message, kj::Promise<Task> sending,
@@ -316,6 +336,18 @@ SocketClient::~SocketClient() { close(); }
 
 void SocketClient::close() {
   _loop->post([core = _core] { core->close(); });
+}
+
+void SocketClient::settle(std::chrono::milliseconds patience) {
+  const auto deadline = std::chrono::steady_clock::now() + patience;
+  const auto settled = std::make_shared<Core::Settled>();
+  _loop->post([core = _core, settled] {
+    core->settling.push_back(settled);
+    core->tellIfSettled();
+  });
+  MutexLock lock(settled->mutex);
+  while (!settled->isSo && settled->came.waitUntil(settled->mutex, deadline)) {
+  }
 }
 
 void SocketClient::setConnectedHandler(std::function<void()> handler) {

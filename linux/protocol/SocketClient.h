@@ -10,6 +10,7 @@
 #include <string>
 
 #include "base/Executor.h"
+#include "linux/protocol/Deadlines.h"
 #include "linux/protocol/ProcessLauncher.h"
 #include "linux/protocol/RpcLoop.h"
 #include "platform/foundation/NSError.h"
@@ -33,7 +34,7 @@ class SocketClient {
     std::string socketPath;
     // Started when nobody listens; none: that is an error.
     std::optional<ProgramToStart> program;
-    std::chrono::milliseconds deadline{4000};
+    std::chrono::milliseconds deadline{deadlines::kMessage};
   };
 
   enum class Patience : std::uint8_t {
@@ -60,6 +61,10 @@ class SocketClient {
 
   // Sends one message. Any thread; nothing runs inside the call.
   void send(Send send, Fail fail, Patience patience = Patience::Deadline);
+
+  // Waits until everything that was sent before has its answer, or for `patience`. Any thread
+  // but the loop's and the executor's.
+  void settle(std::chrono::milliseconds patience);
 
   // Closes the connection for good: what is under way fails, and what is sent later. Any
   // thread; soon.

@@ -8,6 +8,7 @@
 #include <map>
 #include <utility>
 
+#include "base/Mutex.h"
 #include "linux/protocol/RpcConnection.h"
 #include "linux/protocol/UnixSocket.h"
 
@@ -31,6 +32,7 @@ struct SocketServer::Core final : private kj::TaskSet::ErrorHandler {
     std::uint64_t messages = 0;
     std::uint64_t heardAt = 0;
     kj::Promise<void> ending = nullptr;
+    kj::Promise<void> finishing = nullptr;
   };
 
   Core(FileDescriptor socket, Bootstrap make, Log& logHandle, Options settings)
@@ -42,12 +44,14 @@ struct SocketServer::Core final : private kj::TaskSet::ErrorHandler {
 
   void start(RpcIo& io);
   void close();
+  void finish();
   kj::Promise<void> acceptSome();
   kj::Promise<void> acceptWhenReadable();
   void admit(FileDescriptor socket);
   void makeRoom();
   void remove(std::uint64_t number);
   void removeSoon(std::uint64_t number);
+  void tellIfFinished();
   void taskFailed(kj::Exception&& exception) override;
 
   FileDescriptor listener;
@@ -59,6 +63,14 @@ struct SocketServer::Core final : private kj::TaskSet::ErrorHandler {
   std::map<std::uint64_t, kj::Own<Peer>> peers;
   std::uint64_t lastNumber = 0;
   kj::Own<kj::TaskSet> tasks;  // goes first: its promises name the peers
+
+  // Whether every peer is gone, for who waits in finish().
+  struct Finished {
+    Mutex mutex;
+    CondVar came;
+    bool isSo SKEIN_GUARDED_BY(mutex) = false;
+  };
+  std::shared_ptr<Finished> finished;
 };
 
 void SocketServer::Core::start(RpcIo& loopIo) {
@@ -143,7 +155,24 @@ void SocketServer::Core::makeRoom() {
   remove(leaving->first);
 }
 
-void SocketServer::Core::remove(std::uint64_t number) { peers.erase(number); }
+void SocketServer::Core::remove(std::uint64_t number) {
+  peers.erase(number);
+  tellIfFinished();
+}
+
+void SocketServer::Core::finish() {
+  for (auto& [number, peer] : peers) {
+    peer->finishing = peer->connection.finish(io->timer).eagerlyEvaluate([](kj::Exception&&) {});
+  }
+  tellIfFinished();
+}
+
+void SocketServer::Core::tellIfFinished() {
+  if (!finished || !peers.empty()) return;
+  MutexLock lock(finished->mutex);
+  finished->isSo = true;
+  finished->came.notifyAll();
+}
 
 // A promise of the peer's own ends here, so the peer has to outlive the moment.
 void SocketServer::Core::removeSoon(std::uint64_t number) {
@@ -172,6 +201,18 @@ SocketServer::SocketServer(std::shared_ptr<RpcLoop> loop, std::string path,
 SocketServer::~SocketServer() {
   unlink(_path.c_str());
   _loop->postAndWait([core = _core] { core->close(); });
+}
+
+void SocketServer::finish(std::chrono::milliseconds patience) {
+  const auto deadline = std::chrono::steady_clock::now() + patience;
+  const auto finished = std::make_shared<Core::Finished>();
+  _loop->post([core = _core, finished] {
+    core->finished = finished;
+    core->finish();
+  });
+  MutexLock lock(finished->mutex);
+  while (!finished->isSo && finished->came.waitUntil(finished->mutex, deadline)) {
+  }
 }
 
 void SocketServer::dropConnections() {

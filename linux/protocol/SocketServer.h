@@ -8,6 +8,7 @@
 #include <memory>
 #include <string>
 
+#include "linux/protocol/Deadlines.h"
 #include "linux/protocol/RpcLoop.h"
 #include "platform/foundation/NSError.h"
 #include "platform/log/Log.h"
@@ -27,9 +28,9 @@ class SocketServer {
   using Bootstrap = std::function<capnp::Capability::Client()>;
 
   struct Options {
-    std::size_t mostConnections = 64;
+    std::size_t mostConnections = 256;
     // A connection that says nothing for so long from its start is closed.
-    std::chrono::milliseconds firstMessage{5000};
+    std::chrono::milliseconds firstMessage{deadlines::kFirstMessage};
   };
 
   // Listens from now on. Null with an error that names the path. Any thread but the
@@ -43,6 +44,11 @@ class SocketServer {
   ~SocketServer();
   SocketServer(const SocketServer&) = delete;
   SocketServer& operator=(const SocketServer&) = delete;
+
+  // Sends what is still to be sent, then waits until every peer has read it and closed its
+  // end, or for `patience`. Otherwise a peer that is just writing would lose what it has not
+  // read. Any thread but the loop's.
+  void finish(std::chrono::milliseconds patience);
 
   // Closes every connection there is; new ones are accepted. Any thread.
   void dropConnections();

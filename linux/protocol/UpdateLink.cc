@@ -37,7 +37,8 @@ class SendingProxy final : public VLItemNotificationSender {
           return sender.boostPriorityRequest().send().then(
               [reply = std::move(reply)](auto&&) mutable -> Task { return std::move(reply); });
         },
-        _handler, SocketClient::Patience::Deadline);
+        // A vald that is busy answers it late, and the link is no worse for that.
+        _handler, SocketClient::Patience::WhilePeerLives);
   }
 
   void watchItemAtURL(const NSURLPtr& url, std::uint64_t options,

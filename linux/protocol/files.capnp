@@ -38,7 +38,7 @@ interface Files {
       -> (error :Types.Error);
   setFavoriteRank @13 (url :Data, hasRank :Bool, rank :Int64, item :Types.ObjectID)
       -> (error :Types.Error);
-  tagsInUse @14 () -> (tags :List(TagUse), error :Types.Error);
+  tagsInUse @14 (after :Data) -> (tags :List(TagUse), error :Types.Error);
 
   download @15 (url :Data, currentVersion :Bool, observer :TransferObserver,
                 item :Types.ObjectID)

@@ -35,7 +35,7 @@ interface HostFiles {
   trashedItems @11 () -> (trash :HostTrash, error :Types.Error);
 
   setTags @12 (target :Target, names :List(Data)) -> (item :HostItem, error :Types.Error);
-  tagsInUse @13 () -> (tags :List(Files.TagUse), error :Types.Error);
+  tagsInUse @13 (after :Data) -> (tags :List(Files.TagUse), error :Types.Error);
   setFavoriteRank @14 (target :Target, hasRank :Bool, rank :Int64)
       -> (item :HostItem, error :Types.Error);
   # The date in nanoseconds since 1970.

@@ -9,6 +9,7 @@
 #include <cstdlib>
 #include <string_view>
 
+#include "linux/protocol/StandardDescriptors.h"
 #include "linux/vald/CommandLine.h"
 
 namespace skein::vald {
@@ -63,10 +64,7 @@ Background Background::enter(const std::string& log) {
 
   setsid();
   if (chdir("/") != 0) cannotEnter();
-  const FileDescriptor nothing(open("/dev/null", O_RDWR | O_CLOEXEC));
-  for (const int standard : {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO}) {
-    if (nothing) dup2(nothing.get(), standard);
-  }
+  releaseStandardDescriptors();
   return Background(std::move(writing));
 }
 

@@ -73,7 +73,7 @@ class Files final : public LocalFiles {
   void setLastOpenDate(NSURLPtr url, std::optional<NSDate> date, Reply<NSErrorPtr> reply) override;
   void setFavoriteRank(NSURLPtr url, std::optional<std::int64_t> rank,
                        Reply<NSErrorPtr> reply) override;
-  void tagsInUse(Reply<std::vector<TagUse>, NSErrorPtr> reply) override;
+  void tagsInUse(std::string after, Reply<std::vector<TagUse>, NSErrorPtr> reply) override;
 
   std::shared_ptr<NSProgress> download(NSURLPtr url, bool currentVersion,
                                        Reply<NSErrorPtr> reply) override;

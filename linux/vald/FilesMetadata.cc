@@ -91,10 +91,11 @@ void Files::setFavoriteRank(NSURLPtr url, std::optional<std::int64_t> rank,
       url, [rank](ItemDetails& details) { details.favorite = rank; }, std::move(reply));
 }
 
-void Files::tagsInUse(Reply<std::vector<TagUse>, NSErrorPtr> reply) {
-  postAnswer(*_parts.executor, std::move(reply), [this](auto& answered) {
+void Files::tagsInUse(std::string after, Reply<std::vector<TagUse>, NSErrorPtr> reply) {
+  postAnswer(*_parts.executor, std::move(reply), [this, after = std::move(after)](auto& answered) {
     std::vector<TagUse> tags;
-    for (auto& [name, items] : _parts.store.tagsInUse()) tags.push_back({std::move(name), items});
+    for (auto& [name, items] : _parts.store.tagsInUse(after))
+      tags.push_back({std::move(name), items});
     answered(std::move(tags), nullptr);
   });
 }

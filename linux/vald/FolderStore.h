@@ -65,8 +65,8 @@ class FolderStore final : public Store {
   // Changes what the index alone keeps of an item; durable when it returns.
   NSErrorPtr changeDetails(VLFileObjectID id, std::function<void(ItemDetails&)> change);
   ItemDetails details(VLFileObjectID id);
-  // Every tag with the number of its items, by name.
-  std::vector<std::pair<std::string, std::uint64_t>> tagsInUse();
+  // The tags after `after` with the number of their items, by name, as many as a page holds.
+  std::vector<std::pair<std::string, std::uint64_t>> tagsInUse(const std::string& after);
   // What lies in the roots' trashes, unordered.
   struct Trashed {
     VLFileObjectID id = VLFileObjectID::documentWithRawID(0);

@@ -79,9 +79,10 @@ ItemDetails FolderStore::details(VLFileObjectID id) {
   return found ? found->details : ItemDetails();
 }
 
-std::vector<std::pair<std::string, std::uint64_t>> FolderStore::tagsInUse() {
+std::vector<std::pair<std::string, std::uint64_t>> FolderStore::tagsInUse(
+    const std::string& after) {
   auto reader = _readers.lease();
-  return reader ? reader->tags() : std::vector<std::pair<std::string, std::uint64_t>>();
+  return reader ? reader->tags(after) : std::vector<std::pair<std::string, std::uint64_t>>();
 }
 
 std::vector<FolderStore::Trashed> FolderStore::trashedItems(NSErrorOut error) {

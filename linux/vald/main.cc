@@ -10,7 +10,6 @@
 #include <memory>
 #include <string>
 #include <string_view>
-#include <thread>
 #include <utility>
 #include <vector>
 
@@ -19,6 +18,7 @@
 #include "linux/protocol/DrivePaths.h"
 #include "linux/protocol/LogFile.h"
 #include "linux/protocol/RpcLoop.h"
+#include "linux/protocol/StandardDescriptors.h"
 #include "linux/vald/Accounts.h"
 #include "linux/vald/ApplicationsWatcher.h"
 #include "linux/vald/Background.h"
@@ -43,8 +43,7 @@ namespace {
 constexpr std::size_t kWorkers = 4;
 constexpr std::chrono::milliseconds kQuietApplications{300};
 constexpr std::chrono::milliseconds kPatienceWithPredecessor{3000};
-// Who told vald to stop reads the reply meanwhile: were the connection closed at once, its
-// next write would fail and take the unread reply along.
+// What clients have to read what was answered last.
 constexpr std::chrono::milliseconds kLastReply{200};
 
 // As many descriptors as the system lets it have: clients and folders each cost
@@ -163,7 +162,6 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
     sigwait(&signals, &signal);
     if (wasToldToStop.load()) {
       VL_NOTICE(log, "[NOTICE] vald ends as it was told to");
-      std::this_thread::sleep_for(kLastReply);
     } else {
       VL_NOTICE(log, "[NOTICE] vald ends after signal %d", signal);
     }
@@ -171,6 +169,7 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
 
   // From the outside in: no more calls come, those that came are answered, and with the
   // last work done nothing asks the store any more, which then closes its index.
+  server->finish(kLastReply);
   server.reset();
   executor->close();
   slowExecutor->close();
@@ -222,5 +221,6 @@ int run(const std::vector<std::string>& arguments) {
 }  // namespace skein::vald
 
 int main(int argc, char** argv) {
+  skein::openStandardDescriptors();
   return skein::vald::run(std::vector<std::string>(argv + 1, argv + argc));
 }

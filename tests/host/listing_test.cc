@@ -1,8 +1,10 @@
 // Listings page by page, their deadlines, and how the extension is instantiated.
 #include <fstream>
 
+#include "linux/host/Deadline.h"
 #include "linux/host/ItemPaths.h"
 #include "linux/host/NSExtensionMain.h"
+#include "linux/host/RequestTurns.h"
 #include "tests/host/HostFixture.h"
 
 namespace skein {
@@ -55,7 +57,7 @@ TEST_F(ListingTest, FailsWhenAnAnswerIsLostOrGivenUp) {
   const auto listing = open();
   listing->next(pages.reply());
   run();
-  timers->advance(std::chrono::milliseconds(4500));
+  timers->advance(deadlines::kPage);
   run();
   EXPECT_EQ(pages.heard, (Words{"error " + std::to_string(VLVellumErrorDaemonUnreachable)}));
   EXPECT_EQ(calls().back(), "invalidate");
@@ -68,6 +70,55 @@ TEST_F(ListingTest, FailsWhenAnAnswerIsLostOrGivenUp) {
   given->cancel();
   run();
   EXPECT_EQ(pages.heard.back(), "error " + std::to_string(NSUserCancelledError));
+}
+
+// The enumerator holds a sender of vald's, which nobody else would give back.
+TEST_F(ListingTest, OneThatNobodyTakesInvalidatesItsEnumerator) {
+  open();
+  EXPECT_EQ(calls(), (Words{"open i1", "list start"}));
+  enumerator().givePage({item(1, "a")}, "p2");
+  run();
+  EXPECT_EQ(calls(), (Words{"list p2"})) << "a page that is on its way keeps it";
+  enumerator().listings.clear();
+  EXPECT_EQ(calls(), (Words{"invalidate"}));
+}
+
+TEST_F(ListingTest, RequestsAboveTheMostWaitTheirTurnAndExpireThere) {
+  const auto turns = std::make_shared<RequestTurns>(executor, 2);
+  const HostTools tools{executor, timers};
+  std::vector<RequestTurns::Turn> held;
+  Words heard;
+  const auto begin = [&](const std::string& name) {
+    auto timed = TimedReply<>::begin(tools, [&heard, name](const NSErrorPtr& error) {
+      heard.push_back(name + (error ? " late" : " answered"));
+    });
+    turns->take([&, name, timed](RequestTurns::Turn turn) {
+      if (!timed->keep(turn)) return;
+      heard.push_back(name);
+      held.push_back(std::move(turn));
+    });
+    return timed;
+  };
+  const auto first = begin("1");
+  const auto second = begin("2");
+  const auto third = begin("3");
+  run();
+  EXPECT_EQ(std::exchange(heard, {}), (Words{"1", "2"}));
+  (*first)(nullptr);
+  run();
+  EXPECT_EQ(std::exchange(heard, {}), (Words{"1 answered"})) << "its work still holds a thread";
+  held.erase(held.begin());
+  run();
+  EXPECT_EQ(std::exchange(heard, {}), (Words{"3"}));
+  const auto fourth = begin("4");
+  timers->advance(deadlines::kRequest);
+  run();
+  EXPECT_EQ(std::exchange(heard, {}), (Words{"2 late", "3 late", "4 late"}));
+  held.clear();
+  run();
+  EXPECT_EQ(heard, Words{}) << "nobody wants the work any more";
+  const auto fifth = begin("5");
+  EXPECT_EQ(heard, (Words{"5"}));
 }
 
 TEST_F(ListingTest, OpeningIsTimedAndItsErrorToldAsItIs) {

@@ -111,8 +111,8 @@ class FakeFiles final : public LocalFiles {
     note("setFavoriteRank", {path(what), rank ? std::to_string(*rank) : "nil"});
     reply(error);
   }
-  void tagsInUse(Reply<std::vector<TagUse>, NSErrorPtr> reply) override {
-    note("tagsInUse", {});
+  void tagsInUse(std::string after, Reply<std::vector<TagUse>, NSErrorPtr> reply) override {
+    note("tagsInUse", {after});
     reply(tags, error);
   }
   std::shared_ptr<NSProgress> download(NSURLPtr what, bool currentVersion,

@@ -153,7 +153,8 @@ TEST_F(Files, ListsCrossWithEverythingInThemAndPagesAreBounded) {
 
   files().tags = {{"red", 3}, {"", 0}};
   const auto [tags, noError] = askFiles<std::vector<TagUse>, NSErrorPtr>(
-      [](LocalFiles& to, auto reply) { to.tagsInUse(std::move(reply)); });
+      [](LocalFiles& to, auto reply) { to.tagsInUse("blue\n", std::move(reply)); });
+  EXPECT_EQ(asked(), "tagsInUse blue\n");
   ASSERT_EQ(tags.size(), 2U);
   EXPECT_EQ(tags[0].name, "red");
   EXPECT_EQ(tags[0].items, 3U);

@@ -134,6 +134,27 @@ TEST_F(Links, MessagesOfTheSenderReachVald) {
   EXPECT_TRUE(receiversGone->waitForCount(1));
 }
 
+// A vald that is busy for longer than a message's deadline: boosting is no question whose
+// answer anybody waits for, and the link is as good as before.
+TEST_F(Links, ABoostThatIsAnsweredLateBreaksNothing) {
+  client = newClient(std::chrono::milliseconds(700));
+  link();
+  Outcome<> boosted;
+  const auto proxy = sender->remoteObjectProxyWithErrorHandler(boosted.errorHandler());
+  proxy->boostPriority(boosted.reply());
+  auto boost = served->boosts.take();
+  ASSERT_TRUE(boost);
+  daemon->holds = true;
+  Outcome<NSFileProviderItems, std::uint64_t, NSErrorPtr> late;
+  client->remoteObjectProxyWithErrorHandler(late.errorHandler())
+      ->enumerateItemsInFolder(std::nullopt, 0, 0, 1, late.reply());
+  EXPECT_TRUE(late.errors->waitForCount(1)) << "sent later, so the boost is late as well";
+  (*boost)();
+  boosted.value();
+  push(1);
+  EXPECT_TRUE(receiver->pushes.waitForCount(1));
+}
+
 TEST_F(Links, ValdsRefusalComesAsAnError) {
   daemon->error = NSError::errorWithDomain(VLVellumErrorDomain, 2);
   const auto [got, dictionary, error] =

@@ -86,9 +86,14 @@ TEST_F(DriveTest, TagsFollowTheFileWhoeverSetsThem) {
   EXPECT_EQ(tags("folder/doc.txt"), (std::vector<std::string>{"Blue", "Two"}));
   EXPECT_EQ(tagged("folder", {"Two"}), "");
   EXPECT_EQ(tags("folder"), std::vector<std::string>{"Two"});
-  const auto use = std::get<0>(ask<std::vector<TagUse>, NSErrorPtr>(
-      [](LocalFiles& files, auto reply) { files.tagsInUse(std::move(reply)); }));
+  const auto usedAfter = [&](const std::string& after) {
+    return std::get<0>(ask<std::vector<TagUse>, NSErrorPtr>(
+        [&](LocalFiles& files, auto reply) { files.tagsInUse(after, std::move(reply)); }));
+  };
+  const auto use = usedAfter("");
   ASSERT_EQ(use.size(), 2U);
+  EXPECT_EQ(usedAfter("Blue").front().name, "Two");
+  EXPECT_TRUE(usedAfter("Two").empty());
   EXPECT_EQ(use[1].name, "Two");
   EXPECT_EQ(use[1].items, 2U);
   // Taken away by another program, and while vald is down.

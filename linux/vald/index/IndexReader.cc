@@ -180,14 +180,18 @@ std::vector<ItemRow> IndexReader::unsettledAfter(std::uint64_t rank, std::uint64
   return rows;
 }
 
-std::vector<std::pair<std::string, std::uint64_t>> IndexReader::tags() {
+std::vector<std::pair<std::string, std::uint64_t>> IndexReader::tags(std::string_view after) {
   std::vector<std::pair<std::string, std::uint64_t>> tags;
-  SqliteStatement statement(*_database,
-                            "SELECT tag.name, count(*) FROM tag WHERE EXISTS (SELECT 1 FROM item "
-                            "WHERE item.id=tag.id AND (item.kind=0)=tag.is_document) "
-                            "GROUP BY tag.name ORDER BY tag.name");
-  statement.start();
-  while (statement.step()) tags.emplace_back(statement.bytes(0), statement.number(1));
+  SqliteStatement statement(
+      *_database,
+      "SELECT tag.name, count(*) FROM tag WHERE tag.name>? AND EXISTS (SELECT "
+      "1 FROM item WHERE item.id=tag.id AND (item.kind=0)=tag.is_document) "
+      "GROUP BY tag.name ORDER BY tag.name");
+  statement.start(after);
+  AnswerRoom room;
+  while (statement.step() && room.take(statement.bytes(0).size())) {
+    tags.emplace_back(statement.bytes(0), statement.number(1));
+  }
   return tags;
 }
 

@@ -74,7 +74,8 @@ class IndexReader {
   std::vector<Tombstone> tombstonesAt(FolderKey folder, std::string_view name, std::uint64_t limit);
   // Documents after `rank`, in that order, whose upload is to be looked at.
   std::vector<ItemRow> unsettledAfter(std::uint64_t rank, std::uint64_t limit);
-  std::vector<std::pair<std::string, std::uint64_t>> tags();
+  // A page of them, with the number of their items, by name.
+  std::vector<std::pair<std::string, std::uint64_t>> tags(std::string_view after);
   std::uint64_t number(const char* sql);
   std::optional<std::string> setting(const std::string& name);
 
