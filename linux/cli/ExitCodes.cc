@@ -83,7 +83,7 @@ constexpr Meaning kMeanings[] = {
      "the drive's processes cannot be reached", kTryAgain},
     {NSPOSIXErrorDomain, EACCES, kRefused, "permission denied", kPermissions},
     {NSPOSIXErrorDomain, EBUSY, kRefused, "it is in use just now", "try again when that is over"},
-    {NSPOSIXErrorDomain, ETXTBSY, kRefused, "another program is writing to it",
+    {NSPOSIXErrorDomain, ETXTBSY, kRefused, "another program has it open for writing",
      "try again when that is over"},
     {"SkeinEvictionErrorDomain", kAnyCode, kRefused, "it was not evicted",
      "see its state with: skein stat"},

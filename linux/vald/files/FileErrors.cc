@@ -32,8 +32,9 @@ Reading readingOf(int number) {
     case EXDEV: return {NSFileWriteUnknownError, "it would leave its volume; copy it instead"};
     case EBUSY: return {NSFileWriteUnknownError, "it is in use, or a volume is mounted there"};
     case ETXTBSY:
-      return {NSFileWriteUnknownError,
-              "another program is writing to it; try again when that is over, or leave it out"};
+      return {
+          NSFileWriteUnknownError,
+          "another program has it open for writing; try again when that is over, or leave it out"};
     case ELOOP: return {NSFileWriteUnknownError, "a symbolic link is in the way"};
     case ENOTDIR: return {NSFileNoSuchFileError, "what should be a folder is none"};
     case ESTALE:
