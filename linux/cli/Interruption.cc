@@ -68,10 +68,14 @@ void take(int signal) {
 void installInterruption() {
   sigset_t signals;
   sigemptyset(&signals);
-  for (const int signal : {SIGINT, SIGTERM, SIGHUP}) {
-    struct sigaction current {};
-    if (sigaction(signal, nullptr, &current) == 0 && current.sa_handler == SIG_IGN) continue;
+  for (const int signal : {SIGINT, SIGTERM}) {
     sigaddset(&signals, signal);
+    // A script's shell has those that it starts beside itself ignore Ctrl-C.
+    std::signal(signal, SIG_DFL);
+  }
+  struct sigaction hangup {};
+  if (sigaction(SIGHUP, nullptr, &hangup) != 0 || hangup.sa_handler != SIG_IGN) {
+    sigaddset(&signals, SIGHUP);
   }
   state();
   pthread_sigmask(SIG_BLOCK, &signals, nullptr);

@@ -5,8 +5,8 @@
 
 #include "platform/foundation/NSError.h"
 
-// Signals that end a command: Ctrl-C, a closed terminal, a polite kill. Those that whoever
-// started the command ignores (nohup) stay ignored.
+// Signals that end a command: Ctrl-C, a polite kill, and a closed terminal unless whoever started
+// the command has it ignore that (nohup).
 //
 // A command that asks ends at once, with exit code 128 + signal. One that changes items notes
 // the first signal, has skein-host cancel what is under way, and says what was done and what

@@ -92,11 +92,10 @@ void Report::interrupted(const std::vector<std::string>& items, std::size_t notB
     return;
   }
   _code = 128 + interruption();
-  std::string text = "interrupted: " + std::to_string(done) + " of " +
-                     std::to_string(items.size()) + (items.size() == 1 ? " item" : " items") +
-                     (done == 1 ? " is done" : " are done");
+  std::string text =
+      "interrupted: " + std::to_string(done) + " of " + std::to_string(items.size()) + " done";
   if (_failures > 0) text += ", " + std::to_string(_failures) + " failed or cancelled";
-  if (left > 0) text += "; " + std::to_string(left) + " not begun, from " + items[notBegun] + " on";
+  if (left > 0) text += ", " + std::to_string(left) + " not begun, from " + items[notBegun] + " on";
   for (std::size_t at = notBegun; at < items.size(); ++at) {
     tell(failureLine(items[at], "the command was interrupted before this was begun", _code), {});
   }

@@ -14,13 +14,16 @@ namespace {
 constexpr unsigned kMostNames = 1000;
 
 FileResult cancelledRemoval(const StorePlace& place, const std::string& name) {
-  if (name == place.name) return {{}, fileError(ECANCELED, "can't remove", place.path())};
+  const bool isTaken = name != place.name;
   const std::string now = joinPath(place.folderPath(), name);
-  return {now, fileErrorWithWords(NSUserCancelledError, ECANCELED,
-                                  "the removal was cancelled; another item has the name now, so "
-                                  "this one is \"" +
-                                      printable(now) + "\"",
-                                  now)};
+  return {isTaken ? now : "",
+          fileErrorWithWords(NSUserCancelledError, ECANCELED,
+                             "the removal was cancelled; " +
+                                 std::string(isTaken ? "another item has the name now, so this one "
+                                                       "is "
+                                                     : "nothing is gone from ") +
+                                 "\"" + printable(now) + "\"",
+                             now)};
 }
 
 }  // namespace
