@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <sqlite3.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -28,8 +29,9 @@ constexpr char kTables[] = R"(
 )";
 constexpr char kColumns[] = "id, kind, state, time, origin, document, path, destination, aside";
 constexpr std::int64_t kPruneEvery = 256;
-// Some entries with long paths, and the index's own note of what went.
 constexpr off_t kReserve = off_t{2} << 20;
+// For some entries with long paths, and what the index notes of what went.
+constexpr off_t kReservedPart = off_t{256} << 10;
 
 void bindText(sqlite3_stmt* statement, int at, const std::string& text) {
   sqlite3_bind_text(statement, at, text.data(), static_cast<int>(text.size()), SQLITE_TRANSIENT);
@@ -100,9 +102,16 @@ std::unique_ptr<OperationJournal> OperationJournal::open(const std::string& data
   sqlite3_busy_timeout(database, 5000);
 
   MutexLock lock(journal->_mutex);
+  const int flagsOfReserve = O_WRONLY | O_CREAT | O_NOFOLLOW | O_CLOEXEC;
+  journal->_reserve =
+      FileDescriptor(::open((databasePath + "-reserve").c_str(), flagsOfReserve, 0600));
+  struct stat reserve {};
+  if (journal->_reserve && ::fstat(journal->_reserve.get(), &reserve) == 0) {
+    journal->_reserved = reserve.st_size;
+  }
   int version = 0;
   // Nobody else reads it, so one lock, taken with the first access, stands for all.
-  int code = journal->run("PRAGMA locking_mode = EXCLUSIVE; PRAGMA journal_mode = WAL");
+  int code = journal->runWithRoom("PRAGMA locking_mode = EXCLUSIVE; PRAGMA journal_mode = WAL");
   if (code == SQLITE_OK) {
     sqlite3_stmt* statement = nullptr;
     code = sqlite3_prepare_v2(database, "PRAGMA user_version", -1, &statement, nullptr);
@@ -114,8 +123,10 @@ std::unique_ptr<OperationJournal> OperationJournal::open(const std::string& data
   if (code == SQLITE_OK && version > kVersion) {
     return refuse("it was written by a newer version; update this one");
   }
-  if (code == SQLITE_OK) code = journal->run(kTables);
-  if (code == SQLITE_OK) code = journal->run("PRAGMA user_version = " + std::to_string(kVersion));
+  if (code == SQLITE_OK) code = journal->runWithRoom(kTables);
+  if (code == SQLITE_OK && version != kVersion) {
+    code = journal->run("PRAGMA user_version = " + std::to_string(kVersion));
+  }
   const std::string insert =
       std::string("INSERT INTO operation(") + (kColumns + 4) + ") VALUES(?, 0, ?, ?, ?, ?, ?, ?)";
   if (code == SQLITE_OK) code = journal->prepare("BEGIN IMMEDIATE", journal->_beginTransaction);
@@ -125,8 +136,6 @@ std::unique_ptr<OperationJournal> OperationJournal::open(const std::string& data
     code = journal->prepare("UPDATE operation SET state = ?1 WHERE id = ?2", journal->_setState);
   }
   if (code != SQLITE_OK) return refuse(sqlite3_errmsg(database));
-  journal->_reserve = FileDescriptor(::open((databasePath + "-reserve").c_str(),
-                                            O_WRONLY | O_CREAT | O_NOFOLLOW | O_CLOEXEC, 0600));
   journal->takeReserve();
   return journal;
 }
@@ -203,10 +212,11 @@ NSErrorPtr OperationJournal::begin(OperationEntry& entry) {
   }
   entry.when = std::chrono::time_point_cast<NSDate::duration>(std::chrono::system_clock::now());
   MutexLock lock(_mutex);
-  const bool isRemoval = entry.kind == OperationKind::Remove;
-  if (!isRemoval && !_hasReserve) takeReserve();
+  takeReserve();
   int code = writeBegin(entry);
-  if ((code & 0xff) == SQLITE_FULL && isRemoval && giveReserveUp()) code = writeBegin(entry);
+  while ((code & 0xff) == SQLITE_FULL && entry.kind == OperationKind::Remove && giveReserveUp()) {
+    code = writeBegin(entry);
+  }
   if (code != SQLITE_OK) return failure("can't write", code);
   _unwritten.clear();
   return nullptr;
@@ -230,14 +240,25 @@ int OperationJournal::writeBegin(OperationEntry& entry) {
 }
 
 void OperationJournal::takeReserve() {
-  _hasReserve = _reserve && ::posix_fallocate(_reserve.get(), 0, kReserve) == 0;
-  // What was allocated of it is for others.
-  if (!_hasReserve && _reserve) [[maybe_unused]]
-    const int failure = ::ftruncate(_reserve.get(), 0);
+  if (!_reserve || _reserved == kReserve) return;
+  if (::posix_fallocate(_reserve.get(), 0, kReserve) == 0) {
+    _reserved = kReserve;
+  } else {
+    // What was allocated of the rest is for others.
+    [[maybe_unused]] const int failure = ::ftruncate(_reserve.get(), _reserved);
+  }
 }
 
 bool OperationJournal::giveReserveUp() {
-  return std::exchange(_hasReserve, false) && ::ftruncate(_reserve.get(), 0) == 0;
+  if (_reserved == 0) return false;
+  _reserved = std::max<off_t>(_reserved - kReservedPart, 0);
+  return ::ftruncate(_reserve.get(), _reserved) == 0;
+}
+
+int OperationJournal::runWithRoom(const std::string& sql) {
+  int code = run(sql);
+  while ((code & 0xff) == SQLITE_FULL && giveReserveUp()) code = run(sql);
+  return code;
 }
 
 void OperationJournal::finish(End end) {

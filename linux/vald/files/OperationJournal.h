@@ -56,8 +56,8 @@ struct OperationEntry {
 // what went and moved, the newest `retention` of them.
 //
 // So that something can be removed from a full disk, room is kept for that beside the database
-// (`DATABASE-reserve`), given up when a removal cannot be written, and taken again when there
-// is room. Any thread.
+// (`DATABASE-reserve`). A part of it is given up each time that the journal cannot be opened,
+// or a removal not be written, and taken again when there is room. Any thread.
 class OperationJournal {
  public:
   // Null with an error that names the cause. `files` outlives the journal.
@@ -103,7 +103,10 @@ class OperationJournal {
   // The entry as one transaction, with the ends that are not written yet. 0 or SQLite's code.
   int writeBegin(OperationEntry& entry) SKEIN_REQUIRES(_mutex);
   void takeReserve() SKEIN_REQUIRES(_mutex);
+  // False when nothing is left of it.
   bool giveReserveUp() SKEIN_REQUIRES(_mutex);
+  // run(), with more room where that is what it lacks.
+  int runWithRoom(const std::string& sql) SKEIN_REQUIRES(_mutex);
   NSErrorPtr failure(const char* doing, int code) SKEIN_REQUIRES(_mutex);
   // What was not written yet, so that it is read as well.
   void writeEnds() SKEIN_REQUIRES(_mutex);
@@ -123,7 +126,7 @@ class OperationJournal {
   bool _isDurable SKEIN_GUARDED_BY(_mutex) = true;  // SQLite's own beginning
   std::set<End> _unwritten SKEIN_GUARDED_BY(_mutex);
   FileDescriptor _reserve SKEIN_GUARDED_BY(_mutex);
-  bool _hasReserve SKEIN_GUARDED_BY(_mutex) = false;
+  off_t _reserved SKEIN_GUARDED_BY(_mutex) = 0;  // bytes that the file has
 };
 
 }  // namespace skein::vald
