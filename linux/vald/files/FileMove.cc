@@ -17,6 +17,13 @@ NSErrorPtr refused(const std::string& words, const std::string& path) {
                             "can't move \"" + printable(path) + "\": " + words, path);
 }
 
+bool isOneFile(const StorePlace& one, const StorePlace& other) {
+  struct stat first {};
+  struct stat second {};
+  return one.folder.status(one.name, first) == 0 && other.folder.status(other.name, second) == 0 &&
+         first.st_dev == second.st_dev && first.st_ino == second.st_ino;
+}
+
 }  // namespace
 
 NSErrorPtr FileOperations::refusalOfMove(const StorePlace& from, const std::string& folder,
@@ -136,13 +143,7 @@ int FileOperations::renameItem(const StorePlace& from, const StorePlace& to) {
     return failure;
   }
   // Where case is folded, a new spelling of the same name finds the item itself.
-  struct stat one {};
-  struct stat two {};
-  if (from.folder.status(from.name, one) != 0 || to.folder.status(to.name, two) != 0) {
-    return failure;
-  }
-  const bool same = one.st_dev == two.st_dev && one.st_ino == two.st_ino;
-  if (!same || to.folder.lists(to.name)) return failure;
+  if (!isOneFile(from, to) || to.folder.lists(to.name)) return failure;
   return _files.renameOver(from.folder.get(), from.name, to.folder.get(), to.name);
 }
 
@@ -157,7 +158,11 @@ NSErrorPtr FileOperations::moveOnce(const StorePlace& from, const StorePlace& to
     scope.discard();
     return fileError(EEXIST, doing, to.path());
   }
-  if (failure != 0) return fileError(failure, doing, from.path());
+  if (failure != 0) {
+    // A rename of two steps may have come half of the way, and not back.
+    if (isOneFile(from, to)) scope.leaveOpen();
+    return fileError(failure, doing, from.path());
+  }
   if (isAsked(request, to.folder, to.name)) {
     if (request.moved) request.moved(to.path());
     failure = syncFolders(to.folder, &from.folder);
