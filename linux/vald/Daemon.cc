@@ -67,6 +67,8 @@ void Daemon::enumerateItemsInFolder(std::optional<VLFileObjectID> folder, std::u
     NSErrorPtr error = checkPage(sortOrder, offset, limit);
     Page page;
     if (!error) {
+      // Where it begins it waits for the store to catch up.
+      const ScopedWait wait(*self._parts.executor);
       page = self._parts.store.listFolder(folder, static_cast<SortOrder>(sortOrder), offset,
                                           std::min(limit, kMostItems), &error);
     }

@@ -22,6 +22,10 @@ namespace {
 
 constexpr char kJournalID[] = "journal";
 constexpr std::size_t kMostListings = 1024;
+// How long a listing waits for what changed: its caller waits little longer. A folder of which
+// nothing is known yet is waited for.
+constexpr auto kLongestCatchUp = std::chrono::seconds(3);
+constexpr auto kLongestRead = std::chrono::seconds(60);
 
 NSErrorPtr noSuchFile(const std::string& what) {
   return NSError::errorWithDomain(NSCocoaErrorDomain, NSFileNoSuchFileError,
@@ -135,15 +139,20 @@ bool FolderStore::rootIsThere(NSErrorOut error) {
 // ---- listing
 
 bool FolderStore::ensureRead(const FolderRow& folder, bool isFirstPage, NSErrorOut error) {
-  if (folder.scanned && !(isFirstPage && _writer->isUnwatched(folder.number))) return true;
+  if (folder.scanned && !isFirstPage) return true;
   Look look = Look::Unreadable;
   int code = EIO;
   auto answer = std::make_shared<std::pair<Look, int>>(look, code);
-  const bool isDone = _writer->perform([this, answer, key = folder.number] {
-    answer->first = _writer->lookAtFolder(key, answer->second);
-  });
+  const bool isDone = _writer->perform(
+      [this, answer, key = folder.number, isScanned = folder.scanned] {
+        answer->first = isScanned ? _writer->catchUp(key, answer->second)
+                                  : _writer->lookAtFolder(key, answer->second);
+      },
+      folder.scanned ? kLongestCatchUp : kLongestRead);
   if (!isDone) {
-    error.store(vl_errorWithPOSIXCode(ETIMEDOUT, "The folder could not be read in time."));
+    error.store(vl_errorWithPOSIXCode(
+        ETIMEDOUT, "vald is still reading what changed in the drive; list the folder " +
+                       folder.name + " again in a moment."));
     return false;
   }
   if (answer->first == Look::Seen) return true;

@@ -99,8 +99,8 @@ class FolderStore final : public Store {
  private:
   FolderStore(StoreOptions options, RootFolder drive, std::string journalID);
 
-  // Looks at a folder that was not read yet, or is not watched. False with an error when
-  // it cannot be read.
+  // Looks at a folder that was not read yet; for a first page, also at what happened in it up to
+  // now. False with an error when it cannot be read, or not in time.
   bool ensureRead(const FolderRow& folder, bool isFirstPage, NSErrorOut error);
   // Of the folder that an alias of this identifier leads to; nil when there is none.
   std::optional<VLFileObjectID> targetOfAlias(VLFileObjectID id);

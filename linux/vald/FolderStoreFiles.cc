@@ -38,8 +38,10 @@ std::function<void()> FolderStore::beginLookAtPaths(const std::vector<std::strin
 void FolderStore::catchUp(const std::string& path) {
   std::optional<StoreWriter::Place> place;
   if (auto reader = _readers.lease()) place = placeOf(*reader.get(), path);
-  _writer->perform(
-      [this, folder = place ? place->folder : kNoFolder] { _writer->catchUp(folder); });
+  _writer->perform([this, folder = place ? place->folder : kNoFolder] {
+    int error = 0;
+    _writer->catchUp(folder, error);
+  });
 }
 
 std::optional<FolderStore::KnownItem> FolderStore::knownItem(VLFileObjectID id) {

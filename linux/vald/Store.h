@@ -82,7 +82,8 @@ class Store {
 
   // A folder's children. A nil folder is the drive's root, which also lists the app
   // containers' folders. An alias lists the folder that it leads to, when that is in the
-  // store. A folder that the scan has not reached yet is read first.
+  // store. A folder that the scan has not reached yet is read first. A listing that begins (at
+  // offset 0) has what was done in the folder before, by whomever on this machine.
   virtual Page listFolder(std::optional<VLFileObjectID> folder, SortOrder order,
                           std::uint64_t offset, std::uint64_t limit, NSErrorOut error) = 0;
   virtual Page listAllFolders(SortOrder order, std::uint64_t offset, std::uint64_t limit,

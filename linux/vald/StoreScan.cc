@@ -327,6 +327,7 @@ void StoreWriter::accept(FolderKey key, const FolderSnapshot& snapshot, bool inR
     case Look::RootLost: checkRoots(); return;
   }
   _unreadable.erase(key);
+  folder->read = _round;
   const bool isFirst = !folder->row.scanned;
   if (isFirst) {
     folder->row.scanned = true;
@@ -441,12 +442,20 @@ Look StoreWriter::lookAtFolder(FolderKey key, int& error) {
   return snapshot.look;
 }
 
-void StoreWriter::catchUp(FolderKey folder) {
-  if (_isBulk) endBulkLoad();
+Look StoreWriter::catchUp(FolderKey key, int& error) {
+  if (_isBroken || _reload) return Look::Seen;
   _watcher.drain();
-  reconcileDirt();
-  int error = 0;
-  if (isUnwatched(folder)) lookAtFolder(folder, error);
+  // A bulk load goes on while nothing changed where somebody looks.
+  if (_isBulk && !_watcher.isDirty(key)) return Look::Seen;
+  if (_isBulk) endBulkLoad();
+  reconcileDirt(_watcher.take());
+  const Folder* folder = _folders.find(key);
+  if (folder == nullptr) {
+    error = ENOENT;
+    return Look::Gone;
+  }
+  const bool isAhead = _inRound && (_roundAgain || folder->read != _round);
+  return isAhead || isUnwatched(key) ? lookAtFolder(key, error) : Look::Seen;
 }
 
 Look StoreWriter::lookAtName(FolderKey folder, const std::string& name) {

@@ -213,16 +213,17 @@ void StoreWriter::takeDirt() {
     endBulkLoad();
   }
   const bool isDue = since && (isSettling || now - *since >= kGatherWindow);
-  if (isDue || !_later.empty()) reconcileDirt();
-}
-
-void StoreWriter::reconcileDirt() {
+  if (!isDue && _later.empty()) return;
   DirtySet dirty = _watcher.take();
   for (auto& [folder, names] : std::exchange(_later, {}).folders) {
     DirtyFolder& entry = dirty.folders[folder];
     entry.whole = entry.whole || names.whole;
     entry.names.merge(names.names);
   }
+  reconcileDirt(std::move(dirty));
+}
+
+void StoreWriter::reconcileDirt(DirtySet dirty) {
   if (dirty.rootMoved) checkRoots();
   if (dirty.overflow) {
     VL_NOTICE(_log,

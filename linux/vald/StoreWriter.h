@@ -64,8 +64,10 @@ class StoreWriter {
     std::string name;
   };
   Look lookAtNames(const std::vector<Place>& places);
-  // Decides what the kernel has told up to now, and looks at the folder when it is not watched.
-  void catchUp(FolderKey folder);
+  // Brings the index to what the disk did in the folder up to now: decides what the kernel has
+  // told, and looks at the folder itself when it is not watched, or the round under way has yet
+  // to come to it. As lookAtFolder.
+  Look catchUp(FolderKey folder, int& error);
   // False when there is no such item, or it could not be written. Durable.
   bool changeDetails(VLFileObjectID id, const std::function<void(ItemDetails&)>& change);
   // What the cloud has now; said of a file that looks otherwise by now, it is ignored.
@@ -120,8 +122,8 @@ class StoreWriter {
   void accept(FolderKey folder, const FolderSnapshot& snapshot, bool inRound, bool isOld);
   void loadFolder(FolderKey folder, const FolderSnapshot& snapshot);
   void endBulkLoad();
-  // What the watcher has, and what was left for later.
-  void reconcileDirt();
+  // All that the watcher told of.
+  void reconcileDirt(DirtySet dirty);
   void reconcile(DirtySet& dirty);
   // What changed in one folder that is open.
   void gather(FolderKey folder, int descriptor, const DirtyFolder& changes);

@@ -475,6 +475,49 @@ TEST_F(StoreListing, WhatCameAMomentAgoIsThereAtItsPath) {
   EXPECT_TRUE(store->check(1).empty());
 }
 
+// Whatever the store is busy with.
+TEST_F(StoreListing, HasWhatWasDoneBeforeItWasAskedFor) {
+  for (int i = 0; i < 200; ++i) makeFolder("folder " + std::to_string(i) + "/below");
+  const auto inLast = [&] {
+    return names(item("folder 99/below")->fileObjectID(), SortOrder::Name, 10);
+  };
+  const auto check = [&](const std::string& what) {
+    const std::string path = "folder 99/below/" + what;
+    write(path);
+    EXPECT_EQ(inLast(), std::vector<std::string>{what});
+    rename(path, path + "2");
+    EXPECT_EQ(inLast(), std::vector<std::string>{what + "2"});
+    remove(path + "2");
+    EXPECT_TRUE(inLast().empty()) << what;
+  };
+  const auto openAtOnce = [&] {
+    store = FolderStore::openFolder(options, listener, log, nullptr);
+    ASSERT_NE(store, nullptr);
+  };
+  openAtOnce();
+  check("in the first scan");
+  settle();
+  for (int i = 0; i < 5; ++i) check("at rest");
+  for (const char* lost : {"lost", "lost in a rescan"}) {
+    store->loseEvents(true);
+    write(std::string("folder 99/below/") + lost);
+    store->loseEvents(false);
+    EXPECT_EQ(inLast(), std::vector<std::string>{lost});
+    remove(std::string("folder 99/below/") + lost);
+  }
+  check("in a rescan");
+  write("folder 99/below/while closed");
+  close();
+  openAtOnce();
+  EXPECT_EQ(inLast(), std::vector<std::string>{"while closed"});
+  remove("folder 99/below/while closed");
+  check("while it is verified");
+  close();
+  options.watchBudget = 3;
+  openAtOnce();
+  check("without a watch");
+}
+
 TEST_F(StoreListing, SettingsSurviveARestart) {
   open();
   store->setSetting("account", "anna");

@@ -24,6 +24,7 @@ struct TreeRoot {
 struct Folder {
   FolderRow row;
   std::uint32_t round = 0;  // the last round of scanning that asked for it
+  std::uint32_t read = 0;   // the last round in which it was read
   std::uint32_t retained = 0;
   bool isTouched = false;      // its row is to be written at the next commit
   bool isCountUntold = false;  // its own item is to be journalled with the new count

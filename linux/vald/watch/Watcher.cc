@@ -135,6 +135,11 @@ void Watcher::drain() {
   drainLocked();
 }
 
+bool Watcher::isDirty(FolderKey folder) const {
+  MutexLock lock(_mutex);
+  return _dirty.overflow || _dirty.folders.contains(folder);
+}
+
 void Watcher::loseEvents(bool on) {
   {
     MutexLock lock(_mutex);

@@ -56,6 +56,8 @@ class Watcher {
   void drain() SKEIN_EXCLUDES(_mutex);
   // What is dirty, and forgets it.
   DirtySet take() SKEIN_EXCLUDES(_mutex);
+  // Whether something that is not taken yet may have changed the folder.
+  bool isDirty(FolderKey folder) const SKEIN_EXCLUDES(_mutex);
   // When the oldest untaken event was read; nil when there is none.
   std::optional<std::chrono::steady_clock::time_point> dirtySince() const SKEIN_EXCLUDES(_mutex);
 
