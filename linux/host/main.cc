@@ -1,7 +1,6 @@
 // skein-host: carries the extension of one drive. Reads the arguments and wires the parts;
 // everything else is theirs.
 #include <fcntl.h>
-#include <sys/file.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -13,7 +12,6 @@
 #include <memory>
 #include <string>
 #include <string_view>
-#include <thread>
 
 #include "base/ThreadPool.h"
 #include "extension/VLFileProviderExtension.h"
@@ -27,8 +25,8 @@
 #include "linux/protocol/HostServer.h"
 #include "linux/protocol/LogFile.h"
 #include "linux/protocol/ProcessLauncher.h"
+#include "linux/protocol/RunLock.h"
 #include "linux/protocol/StandardDescriptors.h"
-#include "linux/protocol/UnixSocket.h"
 #include "support/Environment.h"
 
 namespace skein {
@@ -52,6 +50,7 @@ Exit codes: 0 ended as asked, or another skein-host serves the drive already; 1 
 2 usage; 3 the extension cannot be instantiated.
 )";
 
+constexpr std::chrono::milliseconds kPatienceWithPredecessor{3000};
 constexpr int kExitFailure = 1;
 constexpr int kExitUsage = 2;
 constexpr int kExitExtension = 3;
@@ -150,26 +149,6 @@ void report(const FileDescriptor& parent, int code) {
   [[maybe_unused]] const ssize_t written = write(parent.get(), &byte, 1);
 }
 
-enum class Lock : std::uint8_t { Taken, Held, Failed };
-
-// One host per drive. Another one that holds the lock but does not accept is just coming or
-// going, so it is waited for.
-Lock takeLock(const DrivePaths& paths, FileDescriptor& file) {
-  using namespace std::chrono_literals;
-  const std::string path = paths.runtimeDirectory + "/skein-host.lock";
-  file = FileDescriptor(open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600));
-  if (!file) return Lock::Failed;
-  const auto deadline = std::chrono::steady_clock::now() + 3s;
-  while (flock(file.get(), LOCK_EX | LOCK_NB) != 0) {
-    if (errno != EWOULDBLOCK && errno != EINTR) return Lock::Failed;
-    int code = 0;
-    if (connectToUnixSocket(paths.hostSocket, code)) return Lock::Held;
-    if (std::chrono::steady_clock::now() >= deadline) return Lock::Held;
-    std::this_thread::sleep_for(10ms);
-  }
-  return Lock::Taken;
-}
-
 int serve(const Arguments& arguments, const DrivePaths& paths, const FileDescriptor& parent,
           const sigset_t& endSignals) {
   NSErrorPtr error;
@@ -237,8 +216,8 @@ int serve(const Arguments& arguments, const DrivePaths& paths, const FileDescrip
       host, [drive](HostTarget target, Reply<std::string, NSErrorPtr> reply) {
         drive->findIdentifier(std::move(target), std::move(reply));
       });
-  auto server =
-      HostServer::listen(loop, executor, requests, services, paths.hostSocket, *log, &error);
+  auto server = HostServer::listen(loop, executor, requests, services, paths.hostSocket, *log,
+                                   &error, [] { kill(getpid(), SIGTERM); });
   // At once, as at the end below: what was made above refers to each other.
   if (!server) std::_Exit(fail(kExitFailure, error->localizedDescription()));
   VL_NOTICE(*log, "[NOTICE] serving %s", paths.store);
@@ -285,13 +264,11 @@ int main(int argc, char** argv) {
     return fail(kExitFailure, std::string("it cannot go to the background, try --foreground: ") +
                                   std::strerror(errno));
   }
-  FileDescriptor lockFile;
-  switch (takeLock(paths, lockFile)) {
-    case Lock::Held: report(parent, 0); return 0;
-    case Lock::Failed:
-      return fail(kExitFailure, paths.runtimeDirectory +
-                                    "/skein-host.lock cannot be locked: " + std::strerror(errno));
-    case Lock::Taken: break;
+  RunLock lock;
+  switch (lock.take(paths.hostLock, paths.hostSocket, kPatienceWithPredecessor, &error)) {
+    case RunLock::Outcome::AlreadyRunning: report(parent, 0); return 0;
+    case RunLock::Outcome::Failed: return fail(kExitFailure, error->localizedDescription());
+    case RunLock::Outcome::Taken: break;
   }
   const int code = serve(arguments, paths, parent, endSignals);
   report(parent, code);

@@ -318,7 +318,8 @@ std::unique_ptr<DaemonServer> DaemonServer::listen(const std::shared_ptr<RpcLoop
                                                    const std::shared_ptr<LocalDaemon>& daemon,
                                                    const std::string& socketPath, Log& log,
                                                    NSErrorOut error,
-                                                   const std::shared_ptr<CallFaults>& faults) {
+                                                   const std::shared_ptr<CallFaults>& faults,
+                                                   std::function<void()> addressLost) {
   const std::shared_ptr<ServedDaemon> served =
       loop->own(std::make_unique<ServedDaemon>(daemon, faults));
   auto implementation = std::make_unique<Implementation>(loop, served);
@@ -328,7 +329,7 @@ std::unique_ptr<DaemonServer> DaemonServer::listen(const std::shared_ptr<RpcLoop
         return kj::heap<WithFaults<DaemonObject>>(
             std::make_shared<DaemonService>(DaemonService{loop, executor, served}));
       },
-      log, {}, error);
+      log, {}, error, std::move(addressLost));
   if (!implementation->sockets) return nullptr;
   loop->post([served, weak = std::weak_ptr(implementation->sockets)] {
     served->dropConnections = [weak] {

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <chrono>
+#include <functional>
 #include <memory>
 #include <string>
 
@@ -25,13 +26,15 @@ namespace skein {
 class DaemonServer {
  public:
   // Listens from now on. Null with an error that names the socket. `log` has to outlive
-  // the server. `faults` is asked before every call; null: no call has any.
+  // the server. `faults` is asked before every call; null: no call has any. `addressLost`: see
+  // SocketServer.
   static std::unique_ptr<DaemonServer> listen(const std::shared_ptr<RpcLoop>& loop,
                                               const std::shared_ptr<Executor>& executor,
                                               const std::shared_ptr<LocalDaemon>& daemon,
                                               const std::string& socketPath, Log& log,
                                               NSErrorOut error,
-                                              const std::shared_ptr<CallFaults>& faults = nullptr);
+                                              const std::shared_ptr<CallFaults>& faults = nullptr,
+                                              std::function<void()> addressLost = {});
   // Closes the socket and every connection. When it returns, the server has let go of the
   // daemon and the log; update senders may still be on their way to the executor.
   ~DaemonServer();

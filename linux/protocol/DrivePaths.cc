@@ -3,22 +3,18 @@
 #include <fcntl.h>
 #include <pwd.h>
 #include <sys/stat.h>
-#include <sys/un.h>
 #include <unistd.h>
 
 #include <cerrno>
-#include <cstdint>
-#include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <memory>
 
+#include "linux/protocol/DriveIdentity.h"
 #include "vellum/VLErrors.h"
 
 namespace skein {
 namespace {
-
-constexpr std::size_t kLongestSocketPath = sizeof(sockaddr_un::sun_path) - 1;
 
 NSErrorPtr failure(int code, const std::string& what) {
   return vl_errorWithPOSIXCode(code, what + ": " + std::strerror(code) + ".");
@@ -48,16 +44,6 @@ bool isFolder(const std::string& path) {
   return stat(path.c_str(), &status) == 0 && S_ISDIR(status.st_mode);
 }
 
-// The session's runtime folder. Without one, a folder below /tmp stands in for it; it is
-// checked like every runtime folder before anything is put there.
-std::string runtimeBase() {
-  std::string base = folderFromEnvironment("XDG_RUNTIME_DIR");
-  if (!base.empty()) return base;
-  base = "/run/user/" + std::to_string(geteuid());
-  if (isFolder(base)) return base;
-  return "/tmp/skein-runtime-" + std::to_string(geteuid());
-}
-
 NSErrorPtr makeFolder(const std::string& path, mode_t mode) {
   if (mkdir(path.c_str(), mode) == 0 || errno == EEXIST) return nullptr;
   return failure(errno, "The folder " + path + " cannot be made");
@@ -83,25 +69,13 @@ NSErrorPtr makePrivateFolder(const std::string& path) {
   if (!S_ISDIR(status.st_mode)) return failure(ENOTDIR, path + " has to be a folder");
   if (status.st_uid != geteuid()) {
     return failure(EACCES, path + " belongs to another user (number " +
-                               std::to_string(status.st_uid) + "); set XDG_RUNTIME_DIR to a " +
-                               "folder of your own");
+                               std::to_string(status.st_uid) + "); set XDG_STATE_HOME and " +
+                               "XDG_DATA_HOME to folders of your own");
   }
   if ((status.st_mode & 077) != 0 && chmod(path.c_str(), 0700) != 0) {
     return failure(errno, path + " cannot be closed to other users");
   }
   return nullptr;
-}
-
-// FNV-1a: the identifier has to be the same on every run, not hard to guess.
-std::string identifierOf(const std::string& store) {
-  std::uint64_t hash = 0xcbf29ce484222325U;
-  for (const char c : store) {
-    hash ^= static_cast<unsigned char>(c);
-    hash *= 0x100000001b3U;
-  }
-  char text[17];
-  std::snprintf(text, sizeof text, "%016llx", static_cast<unsigned long long>(hash));
-  return text;
 }
 
 NSErrorPtr resolveStore(const std::string& store, std::string& resolved) {
@@ -135,29 +109,29 @@ NSErrorPtr fill(DrivePaths& paths, const std::string& store) {
                                  "There is no home folder to keep the drive's state in: set HOME.");
   }
 
-  paths.driveID = identifierOf(resolved);
-  const std::string runtimeTop = runtimeBase() + "/skein";
-  paths.runtimeDirectory = runtimeTop + '/' + paths.driveID;
-  paths.stateDirectory = stateBase + "/skein/" + paths.driveID;
-  paths.containersDirectory = dataBase + "/skein/" + paths.driveID + "/containers";
-  paths.cloudDirectory = dataBase + "/skein/" + paths.driveID + "/cloud";
-  paths.daemonSocket = paths.runtimeDirectory + "/vald.socket";
-  paths.hostSocket = paths.runtimeDirectory + "/skein-host.socket";
+  const std::string stateTop = stateBase + "/skein";
+  const std::string dataTop = dataBase + "/skein";
+  if (NSErrorPtr error = makePrivateFolder(stateTop)) return error;
+  NSErrorPtr problem;
+  DriveIdentity identity = identityOfDrive(resolved, stateTop, dataTop, &problem);
+  if (problem) return problem;
+
+  paths.driveID = std::move(identity.name);
+  paths.stateDirectory = stateTop + '/' + paths.driveID;
+  paths.containersDirectory = dataTop + '/' + paths.driveID + "/containers";
+  paths.cloudDirectory = dataTop + '/' + paths.driveID + "/cloud";
+  paths.daemonSocket = paths.stateDirectory + kDaemonSocketName;
+  paths.hostSocket = paths.stateDirectory + kHostSocketName;
+  paths.daemonLock = paths.stateDirectory + kDaemonLockName;
+  paths.hostLock = paths.stateDirectory + kHostLockName;
   paths.database = paths.stateDirectory + "/index.sqlite";
   paths.daemonLog = paths.stateDirectory + "/vald.log";
   paths.hostLog = paths.stateDirectory + "/skein-host.log";
-  if (paths.hostSocket.size() > kLongestSocketPath) {
-    return failure(ENAMETOOLONG, "The socket path " + paths.hostSocket + " is longer than " +
-                                     std::to_string(kLongestSocketPath) +
-                                     " bytes; set XDG_RUNTIME_DIR to a folder with a shorter path");
-  }
-
   for (const std::string& folder :
-       {runtimeTop, paths.runtimeDirectory, stateBase + "/skein", paths.stateDirectory,
-        paths.containersDirectory, paths.cloudDirectory}) {
+       {paths.stateDirectory, paths.containersDirectory, paths.cloudDirectory}) {
     if (NSErrorPtr error = makePrivateFolder(folder)) return error;
   }
-  paths.store = std::move(resolved);
+  paths.store = std::move(identity.path);
   return nullptr;
 }
 

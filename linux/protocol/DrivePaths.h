@@ -6,24 +6,33 @@
 
 namespace skein {
 
+// Names in a drive's state folder. Locks and sockets stand beside the data that they protect,
+// so that whoever finds the data finds the processes, from every session of the user.
+inline constexpr char kDaemonSocketName[] = "/vald.socket";
+inline constexpr char kHostSocketName[] = "/skein-host.socket";
+inline constexpr char kDaemonLockName[] = "/vald.lock";
+inline constexpr char kHostLockName[] = "/skein-host.lock";
+
 // Where one drive's processes keep what is theirs. Several drives run beside each other:
-// each has folders of its own, named after the drive.
+// each has folders of its own, named after the drive's identity (DriveIdentity.h).
 struct DrivePaths {
   std::string store;                // the drive's folder, absolute, symbolic links resolved
-  std::string driveID;              // 16 hexadecimal digits made from `store`
-  std::string runtimeDirectory;     // $XDG_RUNTIME_DIR/skein/<driveID>, mode 0700
+  std::string driveID;              // 32 hexadecimal digits, or 16 made from `store`
   std::string stateDirectory;       // $XDG_STATE_HOME/skein/<driveID>, mode 0700
   std::string containersDirectory;  // $XDG_DATA_HOME/skein/<driveID>/containers
   std::string cloudDirectory;       // $XDG_DATA_HOME/skein/<driveID>/cloud
-  std::string daemonSocket;
+  std::string daemonSocket;         // may be longer than an address holds, see UnixSocket.h
   std::string hostSocket;
+  std::string daemonLock;
+  std::string hostLock;
   std::string database;
   std::string daemonLog;
   std::string hostLog;
 
-  // `store`: an existing folder, as the user typed it. Makes the folders. Stores an error
-  // that names the cause (no such folder, not a folder, a runtime folder of somebody
-  // else's, a socket path too long for the system) and answers with an empty store.
+  // `store`: an existing folder, as the user typed it. Makes the folders, and gives the
+  // drive an identity when it has none. Stores an error that names the cause (no such
+  // folder, not a folder, a state folder of somebody else's, or one of identityOfDrive) and
+  // answers with an empty store.
   static DrivePaths forStore(const std::string& store, NSErrorOut error);
 };
 

@@ -255,12 +255,10 @@ class HostServer::Implementation {
   std::shared_ptr<SocketServer> server;
 };
 
-std::unique_ptr<HostServer> HostServer::listen(const std::shared_ptr<RpcLoop>& loop,
-                                               const std::shared_ptr<Executor>& executor,
-                                               const std::shared_ptr<HostService>& service,
-                                               const std::shared_ptr<HostServices>& services,
-                                               const std::string& socketPath, Log& log,
-                                               NSErrorOut error) {
+std::unique_ptr<HostServer> HostServer::listen(
+    const std::shared_ptr<RpcLoop>& loop, const std::shared_ptr<Executor>& executor,
+    const std::shared_ptr<HostService>& service, const std::shared_ptr<HostServices>& services,
+    const std::string& socketPath, Log& log, NSErrorOut error, std::function<void()> addressLost) {
   auto implementation = std::make_unique<Implementation>();
   implementation->server = SocketServer::listen(
       loop, socketPath,
@@ -268,7 +266,7 @@ std::unique_ptr<HostServer> HostServer::listen(const std::shared_ptr<RpcLoop>& l
         return kj::heap<HostObject>(
             std::make_shared<HostPeer>(HostPeer{loop, executor, service, services}));
       },
-      log, {}, error);
+      log, {}, error, std::move(addressLost));
   if (!implementation->server) return nullptr;
   return std::unique_ptr<HostServer>(new HostServer(std::move(implementation)));
 }

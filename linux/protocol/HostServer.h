@@ -1,5 +1,6 @@
 #pragma once
 
+#include <functional>
 #include <memory>
 #include <string>
 
@@ -19,13 +20,14 @@ namespace skein {
 class HostServer {
  public:
   // Listens from now on. Null with an error that names the socket. `log` has to outlive
-  // the server.
+  // the server. `addressLost`: see SocketServer.
   static std::unique_ptr<HostServer> listen(const std::shared_ptr<RpcLoop>& loop,
                                             const std::shared_ptr<Executor>& executor,
                                             const std::shared_ptr<HostService>& service,
                                             const std::shared_ptr<HostServices>& services,
                                             const std::string& socketPath, Log& log,
-                                            NSErrorOut error);
+                                            NSErrorOut error,
+                                            std::function<void()> addressLost = {});
   // Closes the socket and every connection.
   ~HostServer();
 

@@ -1,8 +1,11 @@
 #include "linux/protocol/SocketServer.h"
 
+#include <sys/inotify.h>
 #include <sys/socket.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
+#include <array>
 #include <cerrno>
 #include <cstring>
 #include <map>
@@ -18,6 +21,41 @@ namespace {
 // How many are accepted before the peers that are there get their turn.
 constexpr int kMostPerTurn = 16;
 constexpr auto kRestWhenExhausted = 100 * kj::MILLISECONDS;
+
+// The file of a socket that this process listens on.
+class Address {
+ public:
+  // As it is now: the socket was just bound.
+  explicit Address(std::string path) : _path(std::move(path)) {
+    if (lstat(_path.c_str(), &_own) != 0) _own = {};
+  }
+
+  const std::string& path() const { return _path; }
+  bool isOwn() const {
+    struct stat found {};
+    return lstat(_path.c_str(), &found) == 0 && found.st_dev == _own.st_dev &&
+           found.st_ino == _own.st_ino;
+  }
+  void remove() const {
+    if (isOwn()) unlink(_path.c_str());
+  }
+
+  // Becomes readable when something in the socket's folder comes or goes.
+  FileDescriptor watch() const {
+    FileDescriptor watch(inotify_init1(IN_CLOEXEC | IN_NONBLOCK));
+    const std::string folder = _path.substr(0, _path.rfind('/') + 1);
+    if (watch && inotify_add_watch(watch.get(), folder.c_str(),
+                                   IN_CREATE | IN_DELETE | IN_MOVE | IN_DELETE_SELF | IN_MOVE_SELF |
+                                       IN_ONLYDIR) < 0) {
+      watch.reset();
+    }
+    return watch;
+  }
+
+ private:
+  const std::string _path;
+  struct stat _own {};
+};
 
 }  // namespace
 
@@ -35,8 +73,12 @@ struct SocketServer::Core final : private kj::TaskSet::ErrorHandler {
     kj::Promise<void> finishing = nullptr;
   };
 
-  Core(FileDescriptor socket, Bootstrap make, Log& logHandle, Options settings)
+  Core(FileDescriptor socket, const std::string& path, Bootstrap make, Log& logHandle,
+       Options settings, std::function<void()> lost)
       : listener(std::move(socket)),
+        address(path),
+        watch(address.watch()),
+        addressLost(std::move(lost)),
         bootstrap(std::move(make)),
         log(logHandle),
         options(settings),
@@ -45,6 +87,7 @@ struct SocketServer::Core final : private kj::TaskSet::ErrorHandler {
   void start(RpcIo& io);
   void close();
   void finish();
+  kj::Promise<void> watchAddress();
   kj::Promise<void> acceptSome();
   kj::Promise<void> acceptWhenReadable();
   void admit(FileDescriptor socket);
@@ -55,11 +98,15 @@ struct SocketServer::Core final : private kj::TaskSet::ErrorHandler {
   void taskFailed(kj::Exception&& exception) override;
 
   FileDescriptor listener;
+  const Address address;
+  FileDescriptor watch;
+  std::function<void()> addressLost;
   Bootstrap bootstrap;
   Log& log;
   const Options options;
   RpcIo* io = nullptr;
   kj::Own<kj::UnixEventPort::FdObserver> observer;
+  kj::Own<kj::UnixEventPort::FdObserver> watchObserver;
   std::map<std::uint64_t, kj::Own<Peer>> peers;
   std::uint64_t lastNumber = 0;
   kj::Own<kj::TaskSet> tasks;  // goes first: its promises name the peers
@@ -78,14 +125,37 @@ void SocketServer::Core::start(RpcIo& loopIo) {
   observer = kj::heap<kj::UnixEventPort::FdObserver>(io->port, listener.get(),
                                                      kj::UnixEventPort::FdObserver::OBSERVE_READ);
   tasks->add(acceptSome());
+  if (!watch) {
+    VL_ERROR(log, "[ERROR] %@ cannot be watched: %s", address.path(), std::strerror(errno));
+    return;
+  }
+  watchObserver = kj::heap<kj::UnixEventPort::FdObserver>(
+      io->port, watch.get(), kj::UnixEventPort::FdObserver::OBSERVE_READ);
+  tasks->add(watchAddress());
 }
 
 void SocketServer::Core::close() {
+  address.remove();
   tasks = nullptr;
+  watchObserver = nullptr;
+  watch.reset();
   peers.clear();
   observer = nullptr;
   listener.reset();
   bootstrap = nullptr;
+}
+
+// What happened is not read, only that something did: the file is looked at.
+kj::Promise<void> SocketServer::Core::watchAddress() {
+  std::array<char, 4096> events{};
+  while (read(watch.get(), events.data(), events.size()) > 0) {
+  }
+  if (address.isOwn()) {
+    return watchObserver->whenBecomesReadable().then([this] { return watchAddress(); });
+  }
+  VL_ERROR(log, "[ERROR] %@ is gone or another process's", address.path());
+  if (addressLost) addressLost();
+  return kj::READY_NOW;
 }
 
 kj::Promise<void> SocketServer::Core::acceptWhenReadable() {
@@ -185,21 +255,20 @@ void SocketServer::Core::taskFailed(kj::Exception&& exception) {
 
 std::shared_ptr<SocketServer> SocketServer::listen(const std::shared_ptr<RpcLoop>& loop,
                                                    const std::string& path, Bootstrap bootstrap,
-                                                   Log& log, Options options, NSErrorOut error) {
+                                                   Log& log, Options options, NSErrorOut error,
+                                                   std::function<void()> addressLost) {
   FileDescriptor socket = listenOnUnixSocket(path, error);
   if (!socket) return nullptr;
-  auto core =
-      loop->own(std::make_unique<Core>(std::move(socket), std::move(bootstrap), log, options));
+  auto core = loop->own(std::make_unique<Core>(std::move(socket), path, std::move(bootstrap), log,
+                                               options, std::move(addressLost)));
   loop->post([core, loop = loop.get()] { core->start(loop->io()); });
-  return std::shared_ptr<SocketServer>(new SocketServer(loop, path, std::move(core)));
+  return std::shared_ptr<SocketServer>(new SocketServer(loop, std::move(core)));
 }
 
-SocketServer::SocketServer(std::shared_ptr<RpcLoop> loop, std::string path,
-                           std::shared_ptr<Core> core)
-    : _loop(std::move(loop)), _path(std::move(path)), _core(std::move(core)) {}
+SocketServer::SocketServer(std::shared_ptr<RpcLoop> loop, std::shared_ptr<Core> core)
+    : _loop(std::move(loop)), _core(std::move(core)) {}
 
 SocketServer::~SocketServer() {
-  unlink(_path.c_str());
   _loop->postAndWait([core = _core] { core->close(); });
 }
 

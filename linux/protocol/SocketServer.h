@@ -35,11 +35,17 @@ class SocketServer {
 
   // Listens from now on. Null with an error that names the path. Any thread but the
   // loop's. `log` has to outlive the server.
+  //
+  // `addressLost` is called once, on the loop's thread, when the socket's file is gone or
+  // another has its place: nobody finds this server any more. Whoever wants it to end may
+  // remove the file.
   static std::shared_ptr<SocketServer> listen(const std::shared_ptr<RpcLoop>& loop,
                                               const std::string& path, Bootstrap bootstrap,
-                                              Log& log, Options options, NSErrorOut error);
+                                              Log& log, Options options, NSErrorOut error,
+                                              std::function<void()> addressLost = {});
 
-  // Closes the socket and every connection, and removes the socket's file. When it
+  // Closes the socket and every connection, and removes the socket's file, unless another
+  // has its place. When it
   // returns, neither the log nor the bootstrap function is used any more.
   ~SocketServer();
   SocketServer(const SocketServer&) = delete;
@@ -55,10 +61,9 @@ class SocketServer {
 
  private:
   struct Core;
-  SocketServer(std::shared_ptr<RpcLoop> loop, std::string path, std::shared_ptr<Core> core);
+  SocketServer(std::shared_ptr<RpcLoop> loop, std::shared_ptr<Core> core);
 
   std::shared_ptr<RpcLoop> _loop;
-  const std::string _path;
   std::shared_ptr<Core> _core;
 };
 

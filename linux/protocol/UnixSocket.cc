@@ -1,5 +1,6 @@
 #include "linux/protocol/UnixSocket.h"
 
+#include <fcntl.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/un.h>
@@ -15,12 +16,22 @@ namespace {
 
 constexpr int kBacklog = 128;
 
-// False when the path is too long for a socket.
-bool addressFor(const std::string& path, sockaddr_un& address) {
-  if (path.size() >= sizeof address.sun_path) return false;
+// An address holds 107 bytes. A longer path is reached by way of its folder, which stays
+// open in `folder` for as long as the address is used. An errno, or zero.
+int addressFor(const std::string& path, sockaddr_un& address, FileDescriptor& folder) {
+  std::string shorter = path;
+  if (path.size() >= sizeof address.sun_path) {
+    const std::size_t slash = path.rfind('/');
+    if (slash == std::string::npos) return ENAMETOOLONG;
+    folder =
+        FileDescriptor(open(path.substr(0, slash + 1).c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+    if (!folder) return errno;
+    shorter = "/proc/self/fd/" + std::to_string(folder.get()) + path.substr(slash);
+    if (shorter.size() >= sizeof address.sun_path) return ENAMETOOLONG;
+  }
   address.sun_family = AF_UNIX;
-  std::memcpy(address.sun_path, path.c_str(), path.size() + 1);
-  return true;
+  std::memcpy(address.sun_path, shorter.c_str(), shorter.size() + 1);
+  return 0;
 }
 
 FileDescriptor newSocket() {
@@ -36,7 +47,8 @@ FileDescriptor listenOnUnixSocket(const std::string& path, NSErrorOut error) {
     return FileDescriptor();
   };
   sockaddr_un address{};
-  if (!addressFor(path, address)) return fail(ENAMETOOLONG);
+  FileDescriptor folder;
+  if (const int code = addressFor(path, address, folder)) return fail(code);
   FileDescriptor listener = newSocket();
   if (!listener) return fail(errno);
   if (unlink(path.c_str()) != 0 && errno != ENOENT) return fail(errno);
@@ -50,12 +62,10 @@ FileDescriptor listenOnUnixSocket(const std::string& path, NSErrorOut error) {
 }
 
 FileDescriptor connectToUnixSocket(const std::string& path, int& code) {
-  code = 0;
   sockaddr_un address{};
-  if (!addressFor(path, address)) {
-    code = ENAMETOOLONG;
-    return {};
-  }
+  FileDescriptor folder;
+  code = addressFor(path, address, folder);
+  if (code != 0) return {};
   FileDescriptor connection = newSocket();
   if (!connection ||
       connect(connection.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {

@@ -1,4 +1,5 @@
-// Unix sockets as plain descriptors: what needs no event loop.
+// Unix sockets as plain descriptors: what needs no event loop. A path may be longer than the
+// 107 bytes that a socket's address holds.
 #pragma once
 
 #include <sys/types.h>

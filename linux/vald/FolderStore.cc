@@ -131,8 +131,8 @@ bool FolderStore::rootIsThere(NSErrorOut error) {
   if (::stat(_drive.path.c_str(), &status) == 0 && status.st_ino == _drive.key.inode) return true;
   error.store(vl_errorWithPOSIXCode(
       ENOENT, "The drive's folder " + _drive.path +
-                  " is missing: it was deleted, renamed or unmounted. Put it back, or open the "
-                  "drive over another folder."));
+                  " is missing: it was deleted, moved or unmounted. Put it back, or open the "
+                  "drive where it is now."));
   return false;
 }
 

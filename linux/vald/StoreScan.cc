@@ -68,9 +68,13 @@ void StoreWriter::load() {
     _index.putRoot({kDriveFolder, std::nullopt, _drive.path, _drive.key});
   }
   _folders.setRoot(kDriveFolder, {_drive, std::nullopt, false});
-  for (const RootRow& root : _index.roots()) {
-    if (!root.containerID) continue;
+  for (RootRow& root : _index.roots()) {
     int error = 0;
+    if (const auto moved = pathNow(root)) {
+      root.path = *moved;
+      _index.putRoot(root);
+    }
+    if (!root.containerID) continue;
     const auto found = findRoot(root.path, error);
     const bool isThere = found && isSameRoot(found->key, root.key);
     _folders.setRoot(root.folder, {isThere ? *found : RootFolder{root.path, 0, root.key},
@@ -93,6 +97,21 @@ void StoreWriter::load() {
   _isReadingAttributes = _attributesAt < _attributesUntil;
   startRound(_isBulk || !_index.setting(kComplete) ? LocalDaemonStatus::Scan::First
                                                    : LocalDaemonStatus::Scan::Verifying);
+}
+
+// Where the root's folder is, when that is elsewhere than the index says: the drive, or the
+// folders that hold its containers, were renamed or moved.
+std::optional<std::string> StoreWriter::pathNow(const RootRow& root) const {
+  if (!root.containerID) {
+    return root.path != _drive.path ? std::optional(_drive.path) : std::nullopt;
+  }
+  for (const StoreRoot& container : _options.containers) {
+    if (container.containerID != root.containerID || container.path == root.path) continue;
+    int error = 0;
+    const auto found = findRoot(container.path, error);
+    if (found && isSameRoot(found->key, root.key)) return container.path;
+  }
+  return std::nullopt;
 }
 
 void StoreWriter::setContainers(const std::vector<StoreRoot>& containers) {

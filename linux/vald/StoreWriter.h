@@ -103,6 +103,7 @@ class StoreWriter {
 
   // The store's folders and rounds over them.
   void load();
+  std::optional<std::string> pathNow(const RootRow& root) const;
   void adoptRoot(FolderKey folder, RootFolder found, std::optional<std::string> containerID);
   void checkRoots();
   // Finds the roots' trash folders, and those that went. Those that came, unless `now`, are

@@ -18,6 +18,7 @@
 #include "linux/protocol/DrivePaths.h"
 #include "linux/protocol/LogFile.h"
 #include "linux/protocol/RpcLoop.h"
+#include "linux/protocol/RunLock.h"
 #include "linux/protocol/StandardDescriptors.h"
 #include "linux/vald/Accounts.h"
 #include "linux/vald/ApplicationsWatcher.h"
@@ -31,7 +32,7 @@
 #include "linux/vald/EventSubscribers.h"
 #include "linux/vald/FaultInjector.h"
 #include "linux/vald/ItemUpdateSenders.h"
-#include "linux/vald/RunLock.h"
+#include "linux/vald/MovedDrive.h"
 #include "linux/vald/Store.h"
 #include "linux/vald/cloud/RecordFetches.h"
 #include "linux/vald/shares/Shares.h"
@@ -90,7 +91,9 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
   EventSubscribers subscribers(executor);
   Containers containers(containerFolders, log);
 
-  NSErrorPtr error;
+  NSErrorPtr error = followMovedDrive(paths.stateDirectory, paths.cloudDirectory, paths.store);
+  if (error) VL_ERROR(log, "[ERROR] %@", error->localizedDescription());
+  error = nullptr;
   StoreOptions options;
   options.databasePath = paths.database;
   options.drive.path = paths.store;
@@ -143,8 +146,8 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
   });
 
   const auto loop = RpcLoop::start("vald-io");
-  auto server =
-      DaemonServer::listen(loop, executor, daemon, paths.daemonSocket, log, &error, faults);
+  auto server = DaemonServer::listen(loop, executor, daemon, paths.daemonSocket, log, &error,
+                                     faults, [] { kill(getpid(), SIGTERM); });
   if (!server) {
     executor->close();
     slowExecutor->close();
@@ -193,8 +196,8 @@ int run(const std::vector<std::string>& arguments) {
   const DrivePaths paths = DrivePaths::forStore(line->store, &error);
   RunLock lock;
   if (!paths.store.empty()) {
-    const auto outcome = lock.take(paths.runtimeDirectory + "/vald.lock", paths.daemonSocket,
-                                   kPatienceWithPredecessor, &error);
+    const auto outcome =
+        lock.take(paths.daemonLock, paths.daemonSocket, kPatienceWithPredecessor, &error);
     if (outcome == RunLock::Outcome::AlreadyRunning) {
       std::fprintf(stderr, "vald: another vald serves the drive %s already\n", paths.store.c_str());
       return EXIT_SUCCESS;

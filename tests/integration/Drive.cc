@@ -138,7 +138,7 @@ Drive::Drive() {
   for (const char* part : {"store", "run", "state", "data", "home"}) {
     std::filesystem::create_directory(_folder + '/' + part);
   }
-  chmod((_folder + "/run").c_str(), 0700);
+  chmod((_folder + "/state").c_str(), 0700);
   _environment = {"HOME=" + _home,
                   "XDG_RUNTIME_DIR=" + _folder + "/run",
                   "XDG_STATE_HOME=" + _folder + "/state",
@@ -154,9 +154,11 @@ Drive::Drive() {
 Drive::~Drive() {
   // Not asked to end: what hangs must go too.
   for (const char* program : {"skein-host", "vald"}) {
-    const pid_t pid = processOf(program);
-    if (pid > 0) kill(pid, SIGKILL);
-    if (pid > 0) waitUntilGone(pid, std::chrono::seconds(5));
+    for (const std::string& socket : socketsOf(program)) {
+      const pid_t pid = processAt(socket);
+      if (pid > 0) kill(pid, SIGKILL);
+      if (pid > 0) waitUntilGone(pid, std::chrono::seconds(5));
+    }
   }
   std::filesystem::remove_all(_folder);
 }
@@ -186,16 +188,22 @@ Result Drive::shell(const std::string& line) const {
   return finish(process);
 }
 
-std::string Drive::socketOf(const std::string& program) const {
-  for (const auto& entry : std::filesystem::recursive_directory_iterator(_folder + "/run")) {
-    if (entry.is_socket() && entry.path().filename() == program + ".socket") return entry.path();
+std::vector<std::string> Drive::socketsOf(const std::string& program) const {
+  std::vector<std::string> sockets;
+  std::error_code none;
+  for (const auto& drive : std::filesystem::directory_iterator(state() + "/skein", none)) {
+    const auto path = drive.path() / (program + ".socket");
+    if (std::filesystem::is_socket(path, none)) sockets.push_back(path);
   }
-  return {};
+  return sockets;
 }
 
-// The process that listens on the socket of that name; 0 when there is none.
-pid_t Drive::processOf(const std::string& program) const {
-  const std::string path = socketOf(program);
+std::string Drive::socketOf(const std::string& program) const {
+  const auto sockets = socketsOf(program);
+  return sockets.empty() ? std::string() : sockets.front();
+}
+
+pid_t Drive::processAt(const std::string& path) {
   if (path.empty()) return 0;
   int code = 0;
   const FileDescriptor socket = connectToUnixSocket(path, code);

@@ -72,14 +72,17 @@ class Drive {
   // Where the drive's processes keep what is theirs.
   std::string state() const { return _folder + "/state"; }
   // The drive's processes; 0 when they do not run.
-  pid_t daemon() const { return processOf("vald"); }
-  pid_t host() const { return processOf("skein-host"); }
+  pid_t daemon() const { return processAt(socketOf("vald")); }
+  pid_t host() const { return processAt(socketOf("skein-host")); }
   // Where vald or skein-host listens; empty when it never did.
   std::string socketOf(const std::string& program) const;
 
  private:
   static Result finish(Process& process);
-  pid_t processOf(const std::string& program) const;
+  // Of every drive whose state is here: a test may open a second one.
+  std::vector<std::string> socketsOf(const std::string& program) const;
+  // The process that listens there; 0 when there is none.
+  static pid_t processAt(const std::string& path);
 
   std::string _folder;
   std::string _store;

@@ -220,6 +220,40 @@ TEST_F(Files, EvictGivesUpWhatTheCloudHasAndGetBringsItBack) {
   EXPECT_EQ(partly.lines(), (Lines{drive.store() + "/letter.txt"}));
 }
 
+TEST_F(Files, AMovedDriveIsTheSameAndItsProcessesAreFoundFromEverySession) {
+  drive.write("/draft.txt", "dear");
+  const std::string identifier = id("/draft.txt");
+  ASSERT_TRUE(isUploaded("/draft.txt"));
+  skein({"mv", "/draft.txt", "/letter.txt"});
+  skein({"evict", "/letter.txt"});
+  const pid_t vald = drive.daemon();
+  const pid_t host = drive.host();
+  const Result session = drive.shell("XDG_RUNTIME_DIR=$HOME/another skein id /letter.txt");
+  EXPECT_EQ(session.lines(), Lines{identifier}) << session.errors;
+  EXPECT_EQ(drive.daemon(), vald);
+  EXPECT_EQ(drive.host(), host);
+
+  // Without being told anything: what served the old place ends.
+  const std::string moved = fs::path(drive.store()).parent_path() / "moved";
+  fs::rename(drive.store(), moved);
+  const Result cat = drive.run({"--store", moved, "cat", "/letter.txt"});
+  EXPECT_EQ(cat.lines(), Lines{"dear"}) << cat.errors;
+  EXPECT_TRUE(waitUntilGone(host, 5s));
+  EXPECT_TRUE(waitUntilGone(vald, 5s));
+  EXPECT_EQ(drive.run({"--store", moved, "id", "/letter.txt"}).lines(), Lines{identifier});
+  EXPECT_NE(drive.run({"--store", moved, "why", "/draft.txt"}).output.find("letter.txt"),
+            std::string::npos);
+  EXPECT_EQ(drive.run({"--store", moved, "doctor"}).code, 0);
+
+  // A process that nobody finds any more ends, and leaves another's socket alone.
+  const pid_t lost = drive.host();
+  const std::string socket = drive.socketOf("skein-host");
+  fs::rename(socket, socket + ".away");
+  std::ofstream(socket) << "another's";
+  EXPECT_TRUE(waitUntilGone(lost, 5s));
+  EXPECT_EQ(contents(socket), "another's");
+}
+
 TEST_F(Files, WhatIsEvictedHasAThumbnailThatFileManagersFind) {
   const auto files = [](const fs::path& folder, const std::string& part) {
     std::error_code none;

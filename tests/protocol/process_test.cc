@@ -1,16 +1,21 @@
 // What a drive's processes share on disk, and how one starts another.
 #include <sys/stat.h>
-#include <sys/un.h>
+#include <sys/xattr.h>
 
+#include <array>
 #include <cstdlib>
 #include <fstream>
+#include <iomanip>
 #include <regex>
+#include <set>
+#include <sstream>
 #include <thread>
 
 #include "base/Fault.h"
 #include "linux/protocol/DrivePaths.h"
 #include "linux/protocol/LogFile.h"
 #include "linux/protocol/ProcessLauncher.h"
+#include "linux/protocol/RunLock.h"
 #include "linux/protocol/UnixSocket.h"
 #include "tests/protocol/ProtocolTest.h"
 
@@ -50,6 +55,18 @@ class Processes : public testing::Test {
     EXPECT_EQ(paths.store.empty(), error != nullptr);
     return error ? error->localizedDescription() : "";
   }
+  DrivePaths pathsOf(const std::string& below) const {
+    NSErrorPtr error;
+    DrivePaths paths = DrivePaths::forStore(folder + below, &error);
+    EXPECT_EQ(error, nullptr) << error->localizedDescription();
+    return paths;
+  }
+  // As copying a folder with its attributes does.
+  void identify(const std::string& below, const std::string& identity) const {
+    EXPECT_EQ(
+        setxattr((folder + below).c_str(), "user.skein.drive", identity.data(), identity.size(), 0),
+        0);
+  }
   void script(const std::string& text) const {
     std::ofstream(folder + "/vald") << "#!/bin/sh\n" << text << "\n";
     chmod((folder + "/vald").c_str(), 0755);
@@ -69,23 +86,113 @@ class Processes : public testing::Test {
 };
 
 TEST_F(Processes, OneDriveHasOnePlaceHoweverItIsSpelled) {
-  NSErrorPtr error;
-  const DrivePaths paths = DrivePaths::forStore(folder + "/store", &error);
-  ASSERT_EQ(error, nullptr);
+  const DrivePaths paths = pathsOf("/store");
   symlink("store", (folder + "/link").c_str());
-  EXPECT_EQ(DrivePaths::forStore(folder + "/link/../link/", nullptr).daemonSocket,
-            paths.daemonSocket);
-  EXPECT_EQ(paths.runtimeDirectory, folder + "/run/skein/" + paths.driveID);
-  EXPECT_EQ(paths.driveID.size(), 16U);
+  EXPECT_EQ(pathsOf("/link/../link/").daemonSocket, paths.daemonSocket);
+  EXPECT_EQ(paths.stateDirectory, folder + "/state/skein/" + paths.driveID);
   mkdir((folder + "/other").c_str(), 0755);
-  EXPECT_NE(DrivePaths::forStore(folder + "/other", nullptr).driveID, paths.driveID);
-  for (const auto& path :
-       {paths.runtimeDirectory, paths.stateDirectory, paths.containersDirectory}) {
-    EXPECT_EQ(modeOf(path), 0700U) << path;
+  EXPECT_NE(pathsOf("/other").driveID, paths.driveID);
+  setenv("XDG_RUNTIME_DIR", (folder + "/another").c_str(), 1);
+  EXPECT_EQ(pathsOf("/store").daemonLock, paths.daemonLock) << "another session";
+  const auto folders = {paths.stateDirectory, paths.containersDirectory, paths.cloudDirectory};
+  for (const std::string& path : folders) EXPECT_EQ(modeOf(path), 0700U) << path;
+  chmod(paths.stateDirectory.c_str(), 0755);
+  pathsOf("/store");
+  EXPECT_EQ(modeOf(paths.stateDirectory), 0700U) << "closed again";
+}
+
+TEST_F(Processes, ADriveThatMovedIsTheSameAndACopyIsAnother) {
+  const DrivePaths paths = pathsOf("/store");
+  if (paths.driveID.size() != 32) GTEST_SKIP() << "no attributes in " << folder;
+  // Renamed: what served it is told to end, once.
+  const FileDescriptor daemon = listenOnUnixSocket(paths.daemonSocket, nullptr);
+  const FileDescriptor host = listenOnUnixSocket(paths.hostSocket, nullptr);
+  rename((folder + "/store").c_str(), (folder + "/a\nb").c_str());
+  const DrivePaths moved = pathsOf("/a\nb");
+  EXPECT_EQ(moved.driveID, paths.driveID);
+  EXPECT_EQ(moved.store, folder + "/a\nb");
+  EXPECT_FALSE(std::filesystem::exists(paths.daemonSocket));
+  EXPECT_FALSE(std::filesystem::exists(paths.hostSocket));
+  listenOnUnixSocket(paths.daemonSocket, nullptr).reset();
+  EXPECT_EQ(pathsOf("/a\nb").driveID, paths.driveID);
+  EXPECT_TRUE(std::filesystem::exists(paths.daemonSocket));
+
+  // A new folder at the old place is a new drive, a copy too; the drive stays what it was.
+  mkdir((folder + "/store").c_str(), 0755);
+  EXPECT_NE(pathsOf("/store").driveID, paths.driveID);
+  mkdir((folder + "/copy").c_str(), 0755);
+  identify("/copy", paths.driveID);
+  const DrivePaths copy = pathsOf("/copy");
+  EXPECT_NE(copy.driveID, paths.driveID);
+  EXPECT_EQ(copy.driveID.size(), 32U);
+  EXPECT_EQ(pathsOf("/copy").driveID, copy.driveID);
+  EXPECT_EQ(pathsOf("/a\nb").driveID, paths.driveID);
+
+  // Moved to another volume: copied, then removed.
+  mkdir((folder + "/far").c_str(), 0755);
+  identify("/far", paths.driveID);
+  rmdir((folder + "/a\nb").c_str());
+  EXPECT_EQ(pathsOf("/far").driveID, paths.driveID);
+
+  // No name of a folder, so no identity.
+  identify("/far", "../../../../../../../../etc/skein");
+  EXPECT_EQ(pathsOf("/far").driveID.find('/'), std::string::npos);
+}
+
+TEST_F(Processes, ManyAtOnceAgreeOnTheIdentityOfANewDrive) {
+  std::array<std::string, 8> identities;
+  std::vector<std::thread> threads;
+  for (std::string& identity : identities) {
+    threads.emplace_back(
+        [&] { identity = DrivePaths::forStore(folder + "/store", nullptr).driveID; });
   }
-  chmod(paths.runtimeDirectory.c_str(), 0755);
-  DrivePaths::forStore(folder + "/store", nullptr);
-  EXPECT_EQ(modeOf(paths.runtimeDirectory), 0700U) << "closed again";
+  for (std::thread& thread : threads) thread.join();
+  EXPECT_EQ(std::set<std::string>(identities.begin(), identities.end()).size(), 1U);
+}
+
+TEST_F(Processes, ADriveKnownByItsPathIsTakenOver) {
+  // The state of a drive as it was found by its path alone.
+  std::uint64_t hash = 0xcbf29ce484222325U;
+  for (const char c : folder + "/store") {
+    hash = (hash ^ static_cast<unsigned char>(c)) * 0x100000001b3U;
+  }
+  std::ostringstream name;
+  name << std::hex << std::setw(16) << std::setfill('0') << hash;
+  const std::string state = folder + "/state/skein/" + name.str();
+  const std::string data = folder + "/data/skein/" + name.str();
+  const auto make = [&] {
+    std::filesystem::create_directories(state);
+    std::filesystem::create_directories(data + "/cloud");
+    std::ofstream(state + "/operations.db") << "journal";
+    std::ofstream(data + "/cloud/records.db") << "records";
+  };
+  make();
+  // As long as processes of before hold its locks, which they keep elsewhere, nobody starts.
+  const std::string run = folder + "/run/skein/" + name.str();
+  std::filesystem::create_directories(run);
+  {
+    RunLock older;
+    ASSERT_EQ(older.take(run + "/vald.lock", run + "/none", std::chrono::milliseconds(0), nullptr),
+              RunLock::Outcome::Taken);
+    const std::string told = problemWith(folder + "/store");
+    EXPECT_NE(told.find("kill " + std::to_string(getpid())), std::string::npos) << told;
+  }
+  const auto isTakenOver = [&] {
+    const DrivePaths paths = pathsOf("/store");
+    EXPECT_EQ(std::filesystem::exists(state), paths.stateDirectory == state);
+    return linesOf(paths.stateDirectory + "/operations.db") ==
+               std::vector<std::string>{"journal"} &&
+           linesOf(paths.cloudDirectory + "/records.db") == std::vector<std::string>{"records"};
+  };
+  EXPECT_TRUE(isTakenOver());
+  // Cut off between the two folders, and before both.
+  const std::string identity = pathsOf("/store").driveID;
+  for (const bool withData : {false, true}) {
+    std::filesystem::rename(folder + "/state/skein/" + identity, state);
+    if (withData) std::filesystem::rename(folder + "/data/skein/" + identity, data);
+    EXPECT_TRUE(isTakenOver());
+    EXPECT_EQ(pathsOf("/store").driveID, identity);
+  }
 }
 
 TEST_F(Processes, PathProblemsNameTheirCause) {
@@ -93,19 +200,32 @@ TEST_F(Processes, PathProblemsNameTheirCause) {
   EXPECT_NE(problemWith(folder + "/none").find("No such file"), std::string::npos);
   std::ofstream(folder + "/file") << "x";
   EXPECT_NE(problemWith(folder + "/file").find("has to be a folder"), std::string::npos);
-  setenv("XDG_RUNTIME_DIR", (folder + '/' + std::string(80, 'r')).c_str(), 1);
-  EXPECT_NE(problemWith(folder + "/store").find("XDG_RUNTIME_DIR"), std::string::npos);
-  // A link in the place of the runtime folder could lead to somebody else's.
-  setenv("XDG_RUNTIME_DIR", (folder + "/run").c_str(), 1);
-  mkdir((folder + "/run").c_str(), 0700);
-  symlink(folder.c_str(), (folder + "/run/skein").c_str());
+  // A link in the place of the state folder could lead to somebody else's.
+  mkdir((folder + "/state").c_str(), 0700);
+  symlink(folder.c_str(), (folder + "/state/skein").c_str());
   EXPECT_NE(problemWith(folder + "/store").find("has to be a folder"), std::string::npos);
   if (geteuid() == 0) {
-    unlink((folder + "/run/skein").c_str());
-    mkdir((folder + "/run/skein").c_str(), 0777);
-    ASSERT_EQ(chown((folder + "/run/skein").c_str(), 65534, 65534), 0);
+    unlink((folder + "/state/skein").c_str());
+    mkdir((folder + "/state/skein").c_str(), 0777);
+    ASSERT_EQ(chown((folder + "/state/skein").c_str(), 65534, 65534), 0);
     EXPECT_NE(problemWith(folder + "/store").find("another user"), std::string::npos);
   }
+}
+
+TEST_F(Processes, SocketsMayHaveLongPaths) {
+  std::string deep = folder;
+  while (deep.size() < 300) {
+    deep += '/' + std::string(60, 'd');
+    mkdir(deep.c_str(), 0700);
+  }
+  const std::string path = deep + "/vald.socket";
+  const FileDescriptor listener = listenOnUnixSocket(path, nullptr);
+  ASSERT_TRUE(listener);
+  EXPECT_EQ(modeOf(path), 0600U);
+  int code = 0;
+  EXPECT_TRUE(connectToUnixSocket(path, code)) << code;
+  EXPECT_FALSE(connectToUnixSocket(deep + "/none/vald.socket", code));
+  EXPECT_EQ(code, ENOENT);
 }
 
 TEST_F(Processes, LogLinesAreWholeAndHarmless) {

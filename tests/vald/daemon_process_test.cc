@@ -3,10 +3,10 @@
 #include <cstdlib>
 #include <optional>
 
+#include "linux/protocol/RunLock.h"
 #include "linux/protocol/UnixSocket.h"
 #include "linux/vald/ClosableExecutor.h"
 #include "linux/vald/CommandLine.h"
-#include "linux/vald/RunLock.h"
 #include "tests/vald/TestDaemon.h"
 
 namespace skein::vald {

@@ -1,4 +1,4 @@
-#include "linux/vald/RunLock.h"
+#include "linux/protocol/RunLock.h"
 
 #include <fcntl.h>
 #include <sys/file.h>
@@ -11,7 +11,7 @@
 #include "linux/protocol/UnixSocket.h"
 #include "vellum/VLErrors.h"
 
-namespace skein::vald {
+namespace skein {
 namespace {
 
 constexpr std::chrono::milliseconds kBetweenTries{50};
@@ -54,4 +54,4 @@ void RunLock::writeProcessID() const {
   [[maybe_unused]] const auto written = pwrite(_file.get(), text.data(), text.size(), 0);
 }
 
-}  // namespace skein::vald
+}  // namespace skein

@@ -7,10 +7,11 @@
 #include "linux/protocol/FileDescriptor.h"
 #include "platform/foundation/NSError.h"
 
-namespace skein::vald {
+namespace skein {
 
-// Held by the one vald of a drive from before it listens until it has ended; the kernel
-// lets go of it with the process, however that ends. A child that is forked holds it too.
+// Held by the one vald, or the one skein-host, of a drive from before it listens until it has
+// ended; the kernel lets go of it with the process, however that ends. A child that is forked holds
+// it too.
 class RunLock {
  public:
   enum class Outcome : std::uint8_t { Taken, AlreadyRunning, Failed };
@@ -28,4 +29,4 @@ class RunLock {
   FileDescriptor _file;
 };
 
-}  // namespace skein::vald
+}  // namespace skein

@@ -1,0 +1,41 @@
+#pragma once
+
+#include <string>
+
+#include "platform/foundation/NSError.h"
+
+namespace skein {
+
+// Which drive a folder is. A drive has an identity of its own, 128 random bits, that travels
+// with its folder as an attribute of it, so that a folder that was renamed or moved is the
+// same drive. The drive's state notes which folder it last belonged to (its path, and the
+// folder's inode and birth), and that tells a copy from the drive: who copies a folder copies
+// the attribute too.
+//
+// - The noted path, or the noted folder at another mount of the same volume: the same drive.
+// - Another folder with this identity stands at the noted path: this one is a copy. It is
+//   given an identity of its own and begins as a new drive.
+// - Nothing with this identity stands there any more: the folder was moved here.
+//
+// Where attributes are refused (the file system has none, the folder may not be written) the
+// identity is made from the folder's path.
+struct DriveIdentity {
+  std::string name;  // 32 hexadecimal digits, or 16 when it was made from the path
+  std::string path;  // where the drive's processes have its folder: another mount keeps this
+};
+
+// Finds the identity of the folder `path` (absolute, links resolved, there), and gives it one
+// when it has none. `stateTop` and `dataTop` are the folders that hold each drive's folders of
+// that name; `stateTop` is there. When it returns, the drive's state folder is there and notes
+// the folder.
+//
+// A drive that was known by its path only is taken over, with all that is its own. Processes
+// that serve a moved drive at its old path are told to end: their sockets are removed.
+//
+// Errors: the state folder cannot be written, another process holds the list of drives for
+// seconds, an older version's processes still serve the drive, the folder at the noted path
+// cannot be looked at. Any process and thread; waits for the disk.
+DriveIdentity identityOfDrive(const std::string& path, const std::string& stateTop,
+                              const std::string& dataTop, NSErrorOut error);
+
+}  // namespace skein
