@@ -5,6 +5,7 @@
 #include "linux/cli/Commands.h"
 #include "linux/cli/ExitCodes.h"
 #include "linux/cli/Progress.h"
+#include "linux/protocol/UploadConsent.h"
 
 namespace skein::cli {
 namespace {
@@ -53,6 +54,16 @@ int runTry(HostService& host, const TryOptions& options) {
   return error ? complainAbout(error) : kSuccess;
 }
 
+// Kept in the drive's state folder, where vald looks; what is uploaded already stays.
+int runUploads(const Invocation& invocation, const std::string& word) {
+  NSErrorPtr error;
+  const DrivePaths paths = invocation.drive.paths(&error);
+  if (paths.store.empty()) return complainAbout(error);
+  error = setUploadConsent(paths.stateDirectory,
+                           word == "on" ? UploadConsent::Given : UploadConsent::Refused);
+  return error ? complainAbout(error) : kSuccess;
+}
+
 }  // namespace
 
 void addCloudCommand(CLI::App& app, Invocation& invocation) {
@@ -89,6 +100,17 @@ void addCloudCommand(CLI::App& app, Invocation& invocation) {
        "Example: skein cloud try --delay 200 --bandwidth 1M\n"
        "         skein cloud try --reset",
        options, runTry);
+
+  auto word = std::make_shared<std::string>();
+  auto* uploads = cloud->add_subcommand("uploads", "Agree that documents are copied into it");
+  uploads->fallthrough();
+  uploads->add_option("STATE", *word, "on, or off: nothing more is uploaded")
+      ->required()
+      ->check(CLI::IsMember({"on", "off"}));
+  uploads->footer("Example: skein cloud uploads on");
+  uploads->callback([&invocation, word] {
+    invocation.run = [&invocation, word] { return runUploads(invocation, *word); };
+  });
 
   // Runs after that of its subcommand.
   cloud->callback([&invocation, cloud, status] {

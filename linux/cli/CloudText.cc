@@ -15,6 +15,7 @@ std::string_view wordOf(Uploads uploads) {
     case Uploads::Off: return "off";
     case Uploads::Bounded: return "bounded";
     case Uploads::Unlimited: return "unlimited";
+    case Uploads::Unasked: return "unasked";
   }
   return "off";
 }
@@ -25,6 +26,7 @@ std::string uploadsText(const LocalCloudStatus& cloud) {
   switch (cloud.uploads) {
     case Uploads::Off: return "off";
     case Uploads::Bounded: return "up to " + sizeText(cloud.uploadLimit);
+    case Uploads::Unasked: return "none until you agree (skein cloud uploads on)";
     case Uploads::Unlimited: break;
   }
   return cloud.sharesBlocks ? "without limit, sharing the documents' blocks" : "without limit";

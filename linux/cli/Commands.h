@@ -34,6 +34,7 @@ void addAccountCommand(CLI::App& app, Invocation& invocation);   // account
 void addCloudCommand(CLI::App& app, Invocation& invocation);     // cloud
 void addStatusCommands(CLI::App& app, Invocation& invocation);   // status, doctor
 void addProcessCommands(CLI::App& app, Invocation& invocation);  // stop
+void addDriveCommands(CLI::App& app, Invocation& invocation);    // drives, forget
 void addLogCommand(CLI::App& app, Invocation& invocation);       // log
 void addShareCommand(CLI::App& app, Invocation& invocation);     // share
 void addCollabCommand(CLI::App& app, Invocation& invocation);    // collab
@@ -46,6 +47,10 @@ int withSession(const Invocation& invocation, Command command) {
   if (!session) return complainAbout(error);
   return command(session->host());
 }
+
+// Ends the drive's processes and waits until they are gone; tells of each, and in `any`
+// whether there was one. The exit code.
+int stopProcesses(const DrivePaths& paths, Output& output, bool& any);
 
 // Has the command run `run(host, options)`. The footer is shown below its options.
 template <class Options>

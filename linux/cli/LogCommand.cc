@@ -132,7 +132,8 @@ int showLog(const LogOptions& options, const std::string& path) {
 
 int runLog(const Invocation& invocation, const LogOptions& options) {
   NSErrorPtr error;
-  const DrivePaths paths = invocation.drive.paths(&error);
+  const DrivePaths paths =
+      options.level.empty() ? invocation.drive.known(&error) : invocation.drive.paths(&error);
   if (paths.store.empty()) return complainAbout(error);
   if (!options.level.empty()) {
     const int code = withSession(invocation, [&](HostService& host) {

@@ -153,6 +153,14 @@ int runAlias(HostService& host, const AliasOptions& options) {
 }
 
 int runDefaultLocation(HostService& host, const AppOptions& options) {
+  // To ask for the drive's own is to have it made, which printing is not.
+  constexpr char kDocuments[] = "/Documents";
+  if (options.app.empty() &&
+      exitCodeFor(std::get<NSErrorPtr>(folderAt(host, kDocuments))) == kNoSuchItem) {
+    Report report(options.json);
+    report.done(kDocuments, std::string(kDocuments) + '\n');
+    return report.code();
+  }
   std::optional<std::string> app;
   if (!options.app.empty()) app = options.app;
   const auto [folder, error] =

@@ -1,6 +1,5 @@
 // skein stop
 #include <poll.h>
-#include <sys/socket.h>
 #include <sys/syscall.h>
 #include <unistd.h>
 
@@ -14,7 +13,6 @@
 
 #include "linux/cli/Commands.h"
 #include "linux/cli/ExitCodes.h"
-#include "linux/protocol/FileDescriptor.h"
 #include "linux/protocol/UnixSocket.h"
 
 namespace skein::cli {
@@ -25,27 +23,12 @@ using Clock = std::chrono::steady_clock;
 
 constexpr auto kDeadline = 4500ms;
 
-// The process that listens on the socket, held so that its number cannot become another's.
-struct Listener {
-  pid_t pid = 0;
-  FileDescriptor handle;
+struct Program {
+  const char* name;
+  std::string socket;
 };
 
-// The kernel tells who listens, whether or not that process is able to answer.
-std::optional<Listener> listenerOn(const std::string& socketPath) {
-  int code = 0;
-  const FileDescriptor socket = connectToUnixSocket(socketPath, code);
-  if (!socket) return std::nullopt;
-  ucred peer{};
-  socklen_t length = sizeof peer;
-  if (getsockopt(socket.get(), SOL_SOCKET, SO_PEERCRED, &peer, &length) != 0) return std::nullopt;
-  Listener listener{peer.pid,
-                    FileDescriptor(static_cast<int>(syscall(SYS_pidfd_open, peer.pid, 0)))};
-  if (!listener.handle) return std::nullopt;
-  return listener;
-}
-
-bool hasEnded(const Listener& listener, Clock::time_point deadline) {
+bool hasEnded(const SocketListener& listener, Clock::time_point deadline) {
   for (;;) {
     const auto left =
         std::chrono::duration_cast<std::chrono::milliseconds>(deadline - Clock::now());
@@ -56,22 +39,16 @@ bool hasEnded(const Listener& listener, Clock::time_point deadline) {
   }
 }
 
+}  // namespace
+
 // skein-host first: it would start vald again.
-int runStop(const Invocation& invocation) {
-  NSErrorPtr error;
-  const DrivePaths paths = invocation.drive.paths(&error);
-  if (paths.store.empty()) return complainAbout(error);
-  struct Program {
-    const char* name;
-    const std::string& socket;
-  };
+int stopProcesses(const DrivePaths& paths, Output& output, bool& any) {
+  any = false;
   const std::array<Program, 2> programs{
       {{"skein-host", paths.hostSocket}, {"vald", paths.daemonSocket}}};
   const Clock::time_point deadline = Clock::now() + kDeadline;
-  Output output;
-  bool any = false;
   for (const Program& program : programs) {
-    const auto listener = listenerOn(program.socket);
+    const auto listener = listenerOnUnixSocket(program.socket);
     if (!listener) continue;
     any = true;
     const std::string what =
@@ -92,8 +69,20 @@ int runStop(const Invocation& invocation) {
     }
     output.write("stopped " + what + "\n");
   }
-  if (!any) output.write("nothing was running\n");
   return kSuccess;
+}
+
+namespace {
+
+int runStop(const Invocation& invocation) {
+  NSErrorPtr error;
+  const DrivePaths paths = invocation.drive.known(&error);
+  if (paths.store.empty()) return complainAbout(error);
+  Output output;
+  bool any = false;
+  const int code = stopProcesses(paths, output, any);
+  if (code == kSuccess && !any) output.write("nothing was running\n");
+  return code;
 }
 
 }  // namespace

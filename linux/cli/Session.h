@@ -19,8 +19,15 @@ namespace skein::cli {
 struct DriveChoice {
   std::string store;  // as --store gave it; may be empty
 
-  // Stores an error that says what to do when there is no such drive.
+  // Opens the folder as a drive. The first time it says so, with what will be copied where;
+  // on a terminal it asks before anything is made. Stores an error that says what to do when
+  // there is no such folder, or the answer was no.
   DrivePaths paths(NSErrorOut error) const;
+  // Of a drive that was opened before; nothing is made. Stores an error when it was not.
+  DrivePaths known(NSErrorOut error) const;
+
+ private:
+  std::string folder(NSErrorOut error) const;
 };
 
 // An answer that a command waits for.

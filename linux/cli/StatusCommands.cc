@@ -70,6 +70,7 @@ void writeStatus(Output& output, const HostStatus& status, const LocalCloudStatu
   field("changes", "up to " + std::to_string(daemon.rank) + ", kept from " +
                        std::to_string(daemon.oldestTokenRank));
   field("cloud", summaryOf(cloud));
+  for (const std::string& note : daemon.notes) field("note", note);
   field("account", !daemon.account ? "nobody is logged in"
                    : daemon.account->perAppAccountIdentifier
                        ? daemon.account->name
@@ -104,6 +105,11 @@ void writeJson(Output& output, const HostStatus& status, const LocalCloudStatus&
   number("oldestTokenRank", daemon.oldestTokenRank);
   number("senders", daemon.senders);
   json += ",\"account\":" + (daemon.account ? jsonString(daemon.account->name) : "null");
+  json += ",\"notes\":[";
+  for (std::size_t i = 0; i < daemon.notes.size(); ++i) {
+    json += (i == 0 ? "" : ",") + jsonString(daemon.notes[i]);
+  }
+  json += ']';
   number("processID", daemon.processID);
   number("hostProcessID", status.processID);
   number("watchedContainers", status.watchedContainers);

@@ -54,6 +54,7 @@ int main(int argc, char** argv) {
   addCollabCommand(app, invocation);
   addLogCommand(app, invocation);
   addProcessCommands(app, invocation);
+  addDriveCommands(app, invocation);
   try {
     app.parse(argc, argv);
   } catch (const CLI::ParseError& error) {

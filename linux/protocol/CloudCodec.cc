@@ -37,7 +37,7 @@ void encode(wire::CloudStatus::Builder builder, const LocalCloudStatus& status) 
 
 LocalCloudStatus decode(wire::CloudStatus::Reader reader) {
   LocalCloudStatus status;
-  status.uploads = enumerator(reader.getUploads(), LocalCloudStatus::Uploads::Unlimited);
+  status.uploads = enumerator(reader.getUploads(), LocalCloudStatus::Uploads::Unasked);
   status.uploadLimit = reader.getUploadLimit();
   status.sharesBlocks = reader.getSharesBlocks();
   status.usedBytes = reader.getUsedBytes();

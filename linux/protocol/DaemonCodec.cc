@@ -57,6 +57,8 @@ void encode(wire::Status::Builder builder, const LocalDaemonStatus& status) {
   builder.setOldestTokenRank(status.oldestTokenRank);
   builder.setSenders(status.senders);
   if (status.account) encode(builder.initAccount(), *status.account);
+  auto notes = builder.initNotes(static_cast<unsigned>(status.notes.size()));
+  for (unsigned i = 0; i < notes.size(); ++i) notes.set(i, bytes(status.notes[i]));
 }
 
 LocalDaemonStatus decode(wire::Status::Reader reader) {
@@ -79,6 +81,7 @@ LocalDaemonStatus decode(wire::Status::Reader reader) {
   status.oldestTokenRank = reader.getOldestTokenRank();
   status.senders = reader.getSenders();
   if (reader.hasAccount()) status.account = decode(reader.getAccount());
+  for (const auto note : reader.getNotes()) status.notes.push_back(text(note));
   return status;
 }
 

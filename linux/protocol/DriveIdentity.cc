@@ -17,12 +17,15 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <filesystem>
 #include <optional>
 #include <thread>
+#include <tuple>
 #include <utility>
 
 #include "linux/protocol/DrivePaths.h"
 #include "linux/protocol/FileDescriptor.h"
+#include "linux/protocol/UploadConsent.h"
 #include "vellum/VLErrors.h"
 
 namespace skein {
@@ -232,18 +235,32 @@ class Finder {
     return record && record->path == _path && record->key.isSame(_key);
   }
 
+  bool isKnown() const {
+    int code = 0;
+    DriveIdentity identity{attributeOf(_path, code), _path};
+    if (!identity.name.empty() && isThere(stateOf(identity.name)) &&
+        compareWithRecord(identity, false) == nullptr && !identity.name.empty()) {
+      return true;
+    }
+    return isThere(stateOf(nameFromPath(_path)));
+  }
+
   // The lock is held.
   NSErrorPtr decide(DriveIdentity& identity) {
     int code = 0;
     identity = {attributeOf(_path, code), _path};
     if (!identity.name.empty()) {
-      if (NSErrorPtr error = compareWithRecord(identity)) return error;
+      if (NSErrorPtr error = compareWithRecord(identity, true)) return error;
       if (identity.path != _path) return nullptr;
     }
     if (NSErrorPtr error = takeOverByPath(identity.name)) return error;
     const std::string state = stateOf(identity.name);
+    identity.isNew = !isThere(state + kRecordName) && !isThere(state + "/index.sqlite");
     if (mkdir(state.c_str(), 0700) != 0 && errno != EEXIST) {
       return failure(errno, "The folder " + state + " cannot be made");
+    }
+    if (identity.isNew) {
+      if (NSErrorPtr error = setUploadConsent(state, UploadConsent::Unasked)) return error;
     }
     return writeRecord(state, {_key, _path});
   }
@@ -252,7 +269,7 @@ class Finder {
   std::string stateOf(const std::string& name) const { return _stateTop + '/' + name; }
 
   // Empties the name where the folder is a copy, and answers the path of its other mount.
-  NSErrorPtr compareWithRecord(DriveIdentity& identity) const {
+  NSErrorPtr compareWithRecord(DriveIdentity& identity, bool endsFormer) const {
     const std::string state = stateOf(identity.name);
     const auto record = readRecord(state);
     if (!record || record->path == _path) return nullptr;
@@ -272,6 +289,7 @@ class Finder {
       return nullptr;
     }
     // It was moved. Whoever serves its old path ends, as its socket is gone.
+    if (!endsFormer) return nullptr;
     unlink((state + kHostSocketName).c_str());
     unlink((state + kDaemonSocketName).c_str());
     return nullptr;
@@ -299,10 +317,10 @@ class Finder {
     return nullptr;
   }
 
-  const std::string& _path;
+  const std::string _path;
   const FolderKey _key;
-  const std::string& _stateTop;
-  const std::string& _dataTop;
+  const std::string _stateTop;
+  const std::string _dataTop;
 };
 
 }  // namespace
@@ -322,6 +340,38 @@ DriveIdentity identityOfDrive(const std::string& path, const std::string& stateT
   if (NSErrorPtr problem = lockDrives(stateTop, lock)) return failed(std::move(problem));
   if (NSErrorPtr problem = finder.decide(identity)) return failed(std::move(problem));
   return identity;
+}
+
+bool isKnownDrive(const std::string& path, const std::string& stateTop) {
+  const auto key = keyOf(path);
+  return key && Finder(path, *key, stateTop, {}).isKnown();
+}
+
+std::vector<NotedDrive> notedDrives(const std::string& stateTop) {
+  std::vector<NotedDrive> drives;
+  std::error_code none;
+  for (const auto& folder : std::filesystem::directory_iterator(stateTop, none)) {
+    std::error_code ignored;
+    if (!folder.is_directory(ignored) || folder.is_symlink(ignored)) continue;
+    NotedDrive drive{folder.path().filename(), {}};
+    if (const auto record = readRecord(folder.path())) {
+      drive.path = record->path;
+      int code = 0;
+      const auto key = keyOf(record->path);
+      drive.isThere =
+          attributeOf(record->path, code) == drive.name || (key && key->isSame(record->key));
+    }
+    drives.push_back(std::move(drive));
+  }
+  std::sort(drives.begin(), drives.end(), [](const NotedDrive& a, const NotedDrive& b) {
+    return std::tie(a.path, a.name) < std::tie(b.path, b.name);
+  });
+  return drives;
+}
+
+void removeIdentity(const std::string& path, const std::string& name) {
+  int code = 0;
+  if (attributeOf(path, code) == name) removexattr(path.c_str(), kAttribute);
 }
 
 }  // namespace skein

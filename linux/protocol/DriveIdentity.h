@@ -1,6 +1,7 @@
 #pragma once
 
 #include <string>
+#include <vector>
 
 #include "platform/foundation/NSError.h"
 
@@ -20,8 +21,9 @@ namespace skein {
 // Where attributes are refused (the file system has none, the folder may not be written) the
 // identity is made from the folder's path.
 struct DriveIdentity {
-  std::string name;  // 32 hexadecimal digits, or 16 when it was made from the path
-  std::string path;  // where the drive's processes have its folder: another mount keeps this
+  std::string name;    // 32 hexadecimal digits, or 16 when it was made from the path
+  std::string path;    // where the drive's processes have its folder: another mount keeps this
+  bool isNew = false;  // nothing was known of the drive, and now it is
 };
 
 // Finds the identity of the folder `path` (absolute, links resolved, there), and gives it one
@@ -32,10 +34,27 @@ struct DriveIdentity {
 // A drive that was known by its path only is taken over, with all that is its own. Processes
 // that serve a moved drive at its old path are told to end: their sockets are removed.
 //
+// Nobody has agreed to uploads of a drive that is new (UploadConsent.h).
+//
 // Errors: the state folder cannot be written, another process holds the list of drives for
 // seconds, an older version's processes still serve the drive, the folder at the noted path
 // cannot be looked at. Any process and thread; waits for the disk.
 DriveIdentity identityOfDrive(const std::string& path, const std::string& stateTop,
                               const std::string& dataTop, NSErrorOut error);
+
+// Whether the folder is a drive whose state is here; nothing is made or changed. A copy of a
+// drive is none yet. As above.
+bool isKnownDrive(const std::string& path, const std::string& stateTop);
+
+// What the drives' states note: where each drive is, or was last.
+struct NotedDrive {
+  std::string name;
+  std::string path;      // empty: nothing is noted, as before folders had identities
+  bool isThere = false;  // the drive's folder stands there
+};
+std::vector<NotedDrive> notedDrives(const std::string& stateTop);
+
+// Takes the identity off the folder, if it is this one.
+void removeIdentity(const std::string& path, const std::string& name);
 
 }  // namespace skein

@@ -95,23 +95,46 @@ NSErrorPtr resolveStore(const std::string& store, std::string& resolved) {
   return nullptr;
 }
 
-NSErrorPtr fill(DrivePaths& paths, const std::string& store) {
-  std::string resolved;
-  if (NSErrorPtr error = resolveStore(store, resolved)) return error;
-
+NSErrorPtr findTops(DriveTops& tops) {
   const std::string home = homeFolder();
-  std::string stateBase = folderFromEnvironment("XDG_STATE_HOME");
-  if (stateBase.empty() && !home.empty()) stateBase = home + "/.local/state";
-  std::string dataBase = folderFromEnvironment("XDG_DATA_HOME");
-  if (dataBase.empty() && !home.empty()) dataBase = home + "/.local/share";
-  if (stateBase.empty() || dataBase.empty()) {
+  std::string state = folderFromEnvironment("XDG_STATE_HOME");
+  if (state.empty() && !home.empty()) state = home + "/.local/state";
+  std::string data = folderFromEnvironment("XDG_DATA_HOME");
+  if (data.empty() && !home.empty()) data = home + "/.local/share";
+  if (state.empty() || data.empty()) {
     return vl_errorWithPOSIXCode(ENOENT,
                                  "There is no home folder to keep the drive's state in: set HOME.");
   }
+  tops = {state + "/skein", data + "/skein"};
+  return nullptr;
+}
 
-  const std::string stateTop = stateBase + "/skein";
-  const std::string dataTop = dataBase + "/skein";
+// A drive within the folder of the states would be its own contents.
+NSErrorPtr refuseOwnFolder(const std::string& store, const std::string& stateTop) {
+  struct stat own {};
+  if (stat(stateTop.c_str(), &own) != 0) return nullptr;
+  for (std::string above = store; !above.empty(); above.resize(above.rfind('/'))) {
+    struct stat status {};
+    if (stat(above.c_str(), &status) != 0 || status.st_dev != own.st_dev ||
+        status.st_ino != own.st_ino) {
+      continue;
+    }
+    return vl_errorWithPOSIXCode(
+        EINVAL, store + " cannot be a drive: the drives' own state is kept in " + stateTop +
+                    "; choose a folder of documents.");
+  }
+  return nullptr;
+}
+
+NSErrorPtr fill(DrivePaths& paths, const std::string& store) {
+  std::string resolved;
+  if (NSErrorPtr error = resolveStore(store, resolved)) return error;
+  DriveTops tops;
+  if (NSErrorPtr error = findTops(tops)) return error;
+  const std::string& stateTop = tops.state;
+  const std::string& dataTop = tops.data;
   if (NSErrorPtr error = makePrivateFolder(stateTop)) return error;
+  if (NSErrorPtr error = refuseOwnFolder(resolved, stateTop)) return error;
   NSErrorPtr problem;
   DriveIdentity identity = identityOfDrive(resolved, stateTop, dataTop, &problem);
   if (problem) return problem;
@@ -132,6 +155,7 @@ NSErrorPtr fill(DrivePaths& paths, const std::string& store) {
     if (NSErrorPtr error = makePrivateFolder(folder)) return error;
   }
   paths.store = std::move(identity.path);
+  paths.isNew = identity.isNew;
   return nullptr;
 }
 
@@ -144,6 +168,19 @@ DrivePaths DrivePaths::forStore(const std::string& store, NSErrorOut error) {
     paths.store.clear();
   }
   return paths;
+}
+
+bool DrivePaths::isKnown(const std::string& store) {
+  std::string resolved;
+  DriveTops tops;
+  return resolveStore(store, resolved) == nullptr && findTops(tops) == nullptr &&
+         isKnownDrive(resolved, tops.state);
+}
+
+DriveTops DrivePaths::tops(NSErrorOut error) {
+  DriveTops tops;
+  if (NSErrorPtr problem = findTops(tops)) error.store(std::move(problem));
+  return tops;
 }
 
 }  // namespace skein

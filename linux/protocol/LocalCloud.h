@@ -29,6 +29,7 @@ struct LocalCloudStatus {
     Off,        // nothing is uploaded
     Bounded,    // until `uploadLimit` is reached, since copies take room on this disk
     Unlimited,  // wanted so, or uploads share the documents' blocks
+    Unasked,    // nothing yet: nobody has agreed to it
   };
   Uploads uploads = Uploads::Bounded;
   std::uint64_t uploadLimit = 0;    // bytes in the cloud; with Bounded alone

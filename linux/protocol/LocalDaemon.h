@@ -50,6 +50,9 @@ struct LocalDaemonStatus {
   std::uint64_t oldestTokenRank = 0;  // older tokens are expired
   std::uint64_t senders = 0;          // update senders that are alive
   std::optional<LocalAccount> account;
+  // What is not as it should be, or not as one may expect: a sentence each, with the name of
+  // the file or folder.
+  std::vector<std::string> notes;
 };
 
 // One difference between the store on disk and the index.

@@ -3,6 +3,7 @@
 #include <fcntl.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
 #include <sys/un.h>
 #include <unistd.h>
 
@@ -77,6 +78,20 @@ FileDescriptor connectToUnixSocket(const std::string& path, int& code) {
     return {};
   }
   return connection;
+}
+
+std::optional<SocketListener> listenerOnUnixSocket(const std::string& path) {
+  int code = 0;
+  const FileDescriptor connection = connectToUnixSocket(path, code);
+  ucred peer{};
+  socklen_t length = sizeof peer;
+  if (!connection || getsockopt(connection.get(), SOL_SOCKET, SO_PEERCRED, &peer, &length) != 0) {
+    return std::nullopt;
+  }
+  SocketListener listener{peer.pid,
+                          FileDescriptor(static_cast<int>(syscall(SYS_pidfd_open, peer.pid, 0)))};
+  if (!listener.handle) return std::nullopt;
+  return listener;
 }
 
 std::optional<uid_t> peerUserOfSocket(int descriptor) {

@@ -22,6 +22,15 @@ FileDescriptor listenOnUnixSocket(const std::string& path, NSErrorOut error);
 // a process of another user.
 FileDescriptor connectToUnixSocket(const std::string& path, int& code);
 
+// The process that listens on the socket at `path`, held so that its number cannot become
+// another's: the kernel tells, whether or not that process is able to answer. Nothing when
+// nobody listens.
+struct SocketListener {
+  pid_t pid = 0;
+  FileDescriptor handle;
+};
+std::optional<SocketListener> listenerOnUnixSocket(const std::string& path);
+
 // Who is at the other end; nothing when that cannot be told.
 std::optional<uid_t> peerUserOfSocket(int descriptor);
 

@@ -43,6 +43,7 @@ struct Status {
   oldestTokenRank @15 :UInt64;
   senders @16 :UInt64;
   account @17 :Account;
+  notes @18 :List(Data);
 }
 
 struct Difference {

@@ -106,11 +106,11 @@ void Cloud::startThumbnails(FolderStore& store) {
 
 void Cloud::start(FolderStore& store) {
   startThumbnails(store);
-  auto feed = std::make_shared<UploadFeed>(
-      UploadFeed::Parts{store, *_records, _options.policy, _log, [this](VLFileObjectID document) {
-                          if (const auto told = thumbnails()) told->documentWasUploaded(document);
-                          if (const auto told = rounds()) told->contentsDidChange();
-                        }});
+  auto feed = std::make_shared<UploadFeed>(UploadFeed::Parts{
+      store, *_records, _options.policy, _options.mayUpload, _log, [this](VLFileObjectID document) {
+        if (const auto told = thumbnails()) told->documentWasUploaded(document);
+        if (const auto told = rounds()) told->contentsDidChange();
+      }});
   _uploader = std::make_unique<Uploader>(UploadServices{_operations.roots(), _operations.layer(),
                                                         *_contents, *_records, _conditions, _clock},
                                          *feed, _uploadThreads, _options.uploads);
@@ -242,6 +242,9 @@ void Cloud::cloudStatus(Reply<LocalCloudStatus, NSErrorPtr> reply) {
   _answers->post([this, reply = std::move(reply)]() mutable {
     LocalCloudStatus status;
     status.uploads = _options.policy.uploads;
+    if (_options.mayUpload && !_options.mayUpload()) {
+      status.uploads = LocalCloudStatus::Uploads::Unasked;
+    }
     status.uploadLimit = _options.policy.limit;
     status.sharesBlocks = _sharesBlocks;
     status.usedBytes = _records->usedBytes();

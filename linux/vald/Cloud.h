@@ -23,6 +23,9 @@ class Cloud final : public LocalCloud {
     std::string folder;  // the cloud's own; made when missing
     std::string drive;   // the drive's folder
     UploadPolicy policy;
+    // Whether somebody agreed to uploads: asked again and again, since that may come while
+    // it runs. Empty: yes.
+    std::function<bool()> mayUpload = {};
     bool allowsConditions = false;
     std::string desktopThumbnails;  // the desktop's cache of them; empty: none are made
     std::size_t downloads = 4;      // at a time

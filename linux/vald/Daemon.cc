@@ -268,6 +268,7 @@ void Daemon::status(Reply<LocalDaemonStatus, NSErrorPtr> reply) {
     status.processID = getpid();
     status.senders = self._parts.senders.count();
     status.account = self._parts.accounts.current();
+    if (self._parts.notes) status.notes = self._parts.notes();
     answered(std::move(status), nullptr);
   });
 }

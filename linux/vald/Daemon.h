@@ -36,6 +36,8 @@ struct DaemonParts {
   std::function<void()> stop;  // asks the process to end; returns at once
   // Before the store hears that the containers are these.
   std::function<void(const std::vector<StoreRoot>&)> containersWillChange = nullptr;
+  // What a person should know of the drive: LocalDaemonStatus::notes.
+  std::function<std::vector<std::string>()> notes = nullptr;
 };
 
 // vald's core: every call is posted to the executor and answered from there, exactly

@@ -17,6 +17,8 @@ constexpr std::size_t kMostPending = 128;
 constexpr std::size_t kMostRemembered = 10'000;
 constexpr auto kPause = 500ms;
 constexpr auto kGatherWindow = 20ms;
+// How soon uploads begin that somebody agreed to: a file is looked at until then.
+constexpr auto kUntilAskedAgain = 1s;
 // What died may come back under its number: in a save, or in the trash.
 constexpr auto kMourning = 10s;
 
@@ -89,6 +91,9 @@ std::string UploadFeed::whyNot(VLFileObjectID document) {
   if (_parts.policy.uploads == Uploads::Off) {
     return "uploads are switched off (set SKEIN_UPLOADS for vald)";
   }
+  if (!isAllowed()) {
+    return "nobody has agreed to uploads of this drive yet (skein cloud uploads on)";
+  }
   MutexLock lock(_mutex);
   if (!_leftOut.contains(document)) return {};
   return "the cloud on this machine has reached its bound of " +
@@ -112,10 +117,15 @@ void UploadFeed::run() {
   const auto self = static_cast<id_t>(syscall(SYS_gettid));
   setpriority(PRIO_PROCESS, self, 19);
   for (;;) {
+    const bool allowed = _parts.policy.uploads == Uploads::Off || isAllowed();
     {
       MutexLock lock(_mutex);
       while (!_stop && !_poked) {
-        if (_dead.empty()) {
+        if (!allowed) {
+          if (!_changed.waitUntil(_mutex, std::chrono::steady_clock::now() + kUntilAskedAgain)) {
+            break;
+          }
+        } else if (_dead.empty()) {
           _changed.wait(_mutex);
         } else if (!_changed.waitUntil(_mutex, _dead.front().first)) {
           break;
@@ -191,7 +201,7 @@ bool UploadFeed::mayUpload(const FolderStore::Unsettled& document) {
 }
 
 void UploadFeed::tellUploader() {
-  if (_parts.policy.uploads == Uploads::Off) return;
+  if (_parts.policy.uploads == Uploads::Off || !isAllowed()) return;
   LocalDaemonStatus status;
   _parts.store.status(status);
   if (status.scan != LocalDaemonStatus::Scan::Idle) {

@@ -25,6 +25,7 @@ class UploadFeed final : public UploadListener {
     FolderStore& store;
     CloudRecords& records;
     UploadPolicy policy;
+    std::function<bool()> mayUpload;  // Cloud::Options
     Log& log;
     std::function<void(VLFileObjectID)> didUpload;  // on a thread of the uploader's; returns soon
   };
@@ -59,6 +60,7 @@ class UploadFeed final : public UploadListener {
   void forgetDead() SKEIN_EXCLUDES(_mutex);
   // Whether there is more to tell when some of it is done.
   void tellUploader() SKEIN_EXCLUDES(_mutex);
+  bool isAllowed() const { return !_parts.mayUpload || _parts.mayUpload(); }
   bool mayUpload(const FolderStore::Unsettled& document) SKEIN_EXCLUDES(_mutex);
 
   const Parts _parts;

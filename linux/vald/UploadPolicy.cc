@@ -23,4 +23,9 @@ UploadPolicy UploadPolicy::fromEnvironment() {
   return parse(text != nullptr ? text : "");
 }
 
+bool UploadPolicy::isSet() {
+  const char* text = std::getenv("SKEIN_UPLOADS");
+  return text != nullptr && *text != '\0';
+}
+
 }  // namespace skein::vald

@@ -19,6 +19,8 @@ struct UploadPolicy {
   // SKEIN_UPLOADS: "off", "unlimited", or a number of MiB. Anything else is the default.
   static UploadPolicy parse(const std::string& text);
   static UploadPolicy fromEnvironment();
+  // Whether SKEIN_UPLOADS says anything.
+  static bool isSet();
 };
 
 }  // namespace skein::vald

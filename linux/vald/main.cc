@@ -7,9 +7,11 @@
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
+#include <filesystem>
 #include <memory>
 #include <string>
 #include <string_view>
+#include <system_error>
 #include <utility>
 #include <vector>
 
@@ -20,6 +22,7 @@
 #include "linux/protocol/RpcLoop.h"
 #include "linux/protocol/RunLock.h"
 #include "linux/protocol/StandardDescriptors.h"
+#include "linux/protocol/UploadConsent.h"
 #include "linux/vald/Accounts.h"
 #include "linux/vald/ApplicationsWatcher.h"
 #include "linux/vald/Background.h"
@@ -35,6 +38,8 @@
 #include "linux/vald/MovedDrive.h"
 #include "linux/vald/Store.h"
 #include "linux/vald/cloud/RecordFetches.h"
+#include "linux/vald/files/FileNames.h"
+#include "linux/vald/files/OwnFolders.h"
 #include "linux/vald/shares/Shares.h"
 #include "linux/vald/shares/SharingStore.h"
 
@@ -72,6 +77,20 @@ bool faultsAreAllowed() {
   return value != nullptr && std::string_view(value) == "1";
 }
 
+// What this system writes by itself: every drive's state and cloud, and the desktop's
+// thumbnails, since those of documents are put there.
+std::vector<std::string> ownFoldersOf(const DrivePaths& paths) {
+  std::vector<std::string> folders{parentOfPath(paths.stateDirectory),
+                                   parentOfPath(parentOfPath(paths.cloudDirectory))};
+  if (std::string thumbnails = DesktopThumbnails::userFolder(); !thumbnails.empty()) {
+    // They are told by their inode, so it has to be there before it is written to.
+    std::error_code ignored;
+    std::filesystem::create_directories(thumbnails, ignored);
+    folders.push_back(std::move(thumbnails));
+  }
+  return folders;
+}
+
 // Serves until a signal comes. The exit status.
 int serve(const DrivePaths& paths, Background& background, Log& log) {
   const sigset_t signals = takeEndingSignals();
@@ -82,6 +101,12 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
     return kExitFailure;
   };
 
+  const auto ownFolders = ownFoldersOf(paths);
+  setOwnFolders(ownFolders);
+  std::vector<std::string> notes;
+  for (const std::string& folder : foldersBelow(paths.store, ownFolders)) {
+    notes.push_back("left out, as this system keeps its own files there: " + folder);
+  }
   const auto executor = std::make_shared<ClosableExecutor>(kWorkers, "vald");
   const auto slowExecutor = std::make_shared<ClosableExecutor>(1, "vald-slow");
   const ContainerFolders containerFolders{paths.store, paths.containersDirectory,
@@ -102,6 +127,9 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
   Cloud::Options cloud;
   cloud.folder = paths.cloudDirectory;
   cloud.policy = UploadPolicy::fromEnvironment();
+  cloud.mayUpload = [state = paths.stateDirectory] {
+    return uploadConsentOf(state) == UploadConsent::Given;
+  };
   cloud.allowsConditions = mayFail;
   cloud.desktopThumbnails = DesktopThumbnails::userFolder();
   FileLayer layer;
@@ -140,7 +168,8 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
   auto daemon = std::make_shared<Daemon>(DaemonParts{
       executor, slowExecutor, store, senders, accounts, containers, subscribers, drive->files(),
       recordFetches, *shares, drive->cloud(), *faults, log, paths.store, stop,
-      [&drive](const std::vector<StoreRoot>& roots) { drive->containersWillChange(roots); }});
+      [&drive](const std::vector<StoreRoot>& roots) { drive->containersWillChange(roots); },
+      [&notes] { return notes; }});
   listener.setAfterFolderChange([weak = std::weak_ptr<Daemon>(daemon)] {
     if (const auto changed = weak.lock()) changed->refreshDriveFolders();
   });
@@ -210,6 +239,10 @@ int run(const std::vector<std::string>& arguments) {
 
   Background background = line->foreground ? Background() : Background::enter(paths.daemonLog);
   lock.writeProcessID();
+  // Who set how much is uploaded was not asked, but has said so.
+  if (UploadPolicy::isSet()) {
+    setUploadConsent(paths.stateDirectory, UploadConsent::Given);
+  }
   const auto log = LogFile::open({paths.daemonLog, line->foreground}, &error);
   if (!log) {
     background.failed(error->localizedDescription());

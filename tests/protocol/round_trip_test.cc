@@ -222,6 +222,7 @@ TEST_F(RoundTrip, StatusChecksFaultsAndStop) {
   sent.unreadableFolders = 6;
   sent.watch = LocalDaemonStatus::Watch::Degraded;
   sent.watchReason = "budget";
+  sent.notes = {"a \xff", ""};
   sent.watches = 7;
   sent.watchBudget = 8;
   sent.overflows = 9;
@@ -235,7 +236,7 @@ TEST_F(RoundTrip, StatusChecksFaultsAndStop) {
   const auto fields = [](const LocalDaemonStatus& s) {
     return std::tuple(s.store, s.processID, s.documents, s.folders, s.aliases, s.scan,
                       s.scannedFolders, s.pendingFolders, s.unreadableFolders, s.watch,
-                      s.watchReason, s.watches, s.watchBudget, s.overflows, s.rank,
+                      s.watchReason, s.notes, s.watches, s.watchBudget, s.overflows, s.rank,
                       s.oldestTokenRank, s.senders, s.account);
   };
   EXPECT_EQ(fields(status), fields(sent));

@@ -11,6 +11,7 @@
 #include "linux/vald/files/AccessList.h"
 #include "linux/vald/files/FileErrors.h"
 #include "linux/vald/files/FileNames.h"
+#include "linux/vald/files/OwnFolders.h"
 #include "linux/vald/files/TreeWalk.h"
 
 namespace skein::vald {
@@ -84,6 +85,9 @@ class TreeCopy::Measure final : public TreeWalk {
     }
     // The first one's name is what the caller makes of it.
     if (depth() > 0) _refusal = refusalOfName(name, false);
+    if (isOwnFolder(status)) {
+      _refusal = refused(path(), "it is where this system keeps its own files; leave it out");
+    }
     if (S_ISREG(status.st_mode)) {
       state.totalBytes += static_cast<std::uint64_t>(status.st_size);
     } else if (!S_ISLNK(status.st_mode) && !S_ISDIR(status.st_mode)) {

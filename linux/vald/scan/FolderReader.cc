@@ -14,6 +14,7 @@
 #include <utility>
 
 #include "linux/vald/cloud/EvictionMarker.h"
+#include "linux/vald/files/OwnFolders.h"
 #include "linux/vald/scan/StoreNames.h"
 
 namespace skein::vald {
@@ -25,6 +26,10 @@ constexpr int kFolderFlags = O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC;
 enum class Kept : std::uint8_t { Yes, No };
 
 Kept fill(const struct statx& status, FileState& state) {
+  if (S_ISDIR(status.stx_mode) &&
+      isOwnFolder(makedev(status.stx_dev_major, status.stx_dev_minor), status.stx_ino)) {
+    return Kept::No;
+  }
   if (S_ISREG(status.stx_mode)) {
     state.kind = ItemKind::Document;
   } else if (S_ISDIR(status.stx_mode)) {

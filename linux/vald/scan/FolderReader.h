@@ -36,7 +36,8 @@ struct DiskEntry {
 
 // One folder as it was read: its own state, and its entries sorted by the bytes of their
 // names. A marker is an entry of its document's name, unless a file has that name: then the
-// file is the document. Sockets, pipes, devices and hidden names are left out.
+// file is the document. Sockets, pipes, devices, hidden names and this system's own folders
+// (OwnFolders.h) are left out.
 struct FolderSnapshot {
   Look look = Look::Unreadable;
   int error = 0;  // why it is unreadable
