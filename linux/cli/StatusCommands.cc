@@ -133,6 +133,21 @@ int runStatus(HostService& host, bool json) {
   return kSuccess;
 }
 
+// What the disk and the index do not differ in, and a person should know all the same.
+void tellNotes(HostService& host, Output& output, bool json) {
+  const auto [status, error] =
+      await<HostStatus>([&](auto reply) { host.status(std::move(reply)); });
+  for (const std::string& note : status.daemon.notes) {
+    if (json) {
+      output.write("{\"note\":" + jsonString(note) + "}\n");
+    } else {
+      output.write("note  ");
+      output.writeName(note);
+      output.write("\n");
+    }
+  }
+}
+
 int runDoctor(HostService& host, bool json) {
   const auto [check, error] =
       await<std::shared_ptr<HostCheck>>([&](auto reply) { host.check(std::move(reply)); });
@@ -171,6 +186,7 @@ int runDoctor(HostService& host, bool json) {
                   " items compared ...");
     if (!step.finished) continue;
     progress.clear();
+    tellNotes(host, output, json);
     if (json) {
       output.write("{\"folders\":" + std::to_string(step.folders) +
                    ",\"items\":" + std::to_string(step.items) +

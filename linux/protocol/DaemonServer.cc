@@ -325,7 +325,7 @@ std::unique_ptr<DaemonServer> DaemonServer::listen(const std::shared_ptr<RpcLoop
   auto implementation = std::make_unique<Implementation>(loop, served);
   implementation->sockets = SocketServer::listen(
       loop, socketPath,
-      [loop, executor, served]() -> capnp::Capability::Client {
+      [loop, executor, served](pid_t) -> capnp::Capability::Client {
         return kj::heap<WithFaults<DaemonObject>>(
             std::make_shared<DaemonService>(DaemonService{loop, executor, served}));
       },

@@ -79,6 +79,15 @@ kj::Promise<void> HostFilesObject::serve(Context context, Start start, Encode en
       std::move(encode));
 }
 
+// Whose request it is, as the client says, with the process that the kernel says it is.
+template <class Params>
+std::string HostFilesObject::originOf(const Params& params) const {
+  std::string origin = codec::text(params.getOrigin());
+  const std::string process = "(process " + std::to_string(_peer->process) + ')';
+  if (!origin.ends_with(process)) origin += (origin.empty() ? "" : " ") + process;
+  return origin;
+}
+
 kj::Promise<void> HostFilesObject::contents(ContentsContext context) {
   const auto params = context.getParams();
   return serve(
@@ -111,7 +120,7 @@ kj::Promise<void> HostFilesObject::importDocument(ImportDocumentContext context)
   return serve(
       context,
       [source = codec::text(params.getSource()), parent = codec::decode(params.getParent()),
-       origin = codec::text(params.getOrigin())](HostFiles& files, auto reply) {
+       origin = originOf(params)](HostFiles& files, auto reply) {
         files.importDocument(source, parent, origin, std::move(reply));
       },
       encodeTransfer(_peer));
@@ -122,7 +131,7 @@ kj::Promise<void> HostFilesObject::createDirectory(CreateDirectoryContext contex
   return serve(
       context,
       [name = codec::text(params.getName()), parent = codec::decode(params.getParent()),
-       origin = codec::text(params.getOrigin())](HostFiles& files, auto reply) {
+       origin = originOf(params)](HostFiles& files, auto reply) {
         files.createDirectory(name, parent, origin, std::move(reply));
       },
       encodeItem);
@@ -134,7 +143,7 @@ kj::Promise<void> HostFilesObject::makeAlias(MakeAliasContext context) {
       context,
       [target = codec::decode(params.getTarget()), outside = params.getOutside(),
        name = codec::text(params.getName()), parent = codec::decode(params.getParent()),
-       origin = codec::text(params.getOrigin())](HostFiles& files, auto reply) {
+       origin = originOf(params)](HostFiles& files, auto reply) {
         files.makeAlias(target, outside, name, parent, origin, std::move(reply));
       },
       encodeItem);
@@ -145,7 +154,7 @@ kj::Promise<void> HostFilesObject::rename(RenameContext context) {
   return serve(
       context,
       [target = codec::decode(params.getTarget()), name = codec::text(params.getNewName()),
-       origin = codec::text(params.getOrigin())](HostFiles& files, auto reply) {
+       origin = originOf(params)](HostFiles& files, auto reply) {
         files.rename(target, name, origin, std::move(reply));
       },
       encodeItem);
@@ -158,8 +167,7 @@ kj::Promise<void> HostFilesObject::reparent(ReparentContext context) {
   return serve(
       context,
       [target = codec::decode(params.getTarget()), parent = codec::decode(params.getParent()),
-       name = std::move(name),
-       origin = codec::text(params.getOrigin())](HostFiles& files, auto reply) {
+       name = std::move(name), origin = originOf(params)](HostFiles& files, auto reply) {
         files.reparent(target, parent, name, origin, std::move(reply));
       },
       encodeItem);
@@ -169,7 +177,7 @@ kj::Promise<void> HostFilesObject::trash(TrashContext context) {
   const auto params = context.getParams();
   return serve(
       context,
-      [target = codec::decode(params.getTarget()), origin = codec::text(params.getOrigin())](
+      [target = codec::decode(params.getTarget()), origin = originOf(params)](
           HostFiles& files, auto reply) { files.trash(target, origin, std::move(reply)); },
       encodeItem);
 }
@@ -181,7 +189,7 @@ kj::Promise<void> HostFilesObject::untrash(UntrashContext context) {
   return serve(
       context,
       [target = codec::decode(params.getTarget()), parent = std::move(parent),
-       origin = codec::text(params.getOrigin())](HostFiles& files, auto reply) {
+       origin = originOf(params)](HostFiles& files, auto reply) {
         files.untrash(target, parent, origin, std::move(reply));
       },
       encodeItem);
@@ -191,7 +199,7 @@ kj::Promise<void> HostFilesObject::remove(RemoveContext context) {
   const auto params = context.getParams();
   return serve(
       context,
-      [target = codec::decode(params.getTarget()), origin = codec::text(params.getOrigin())](
+      [target = codec::decode(params.getTarget()), origin = originOf(params)](
           HostFiles& files, auto reply) { files.remove(target, origin, std::move(reply)); },
       encodeTransfer(_peer));
 }

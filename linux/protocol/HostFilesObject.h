@@ -1,5 +1,7 @@
 #pragma once
 
+#include <string>
+
 #include "linux/protocol/HostPeer.h"
 #include "linux/protocol/hostfiles.capnp.h"
 
@@ -34,6 +36,9 @@ class HostFilesObject : public virtual wire::HostFiles::Server {
   // Answers a call with what start(files, reply) gives.
   template <class Context, class Start, class Encode>
   kj::Promise<void> serve(Context context, Start start, Encode encode);
+
+  template <class Params>
+  std::string originOf(const Params& params) const;
 
   const HostPeerPtr _peer;
 };

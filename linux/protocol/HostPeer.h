@@ -26,6 +26,7 @@ struct HostPeer {
   std::shared_ptr<Executor> executor;
   std::shared_ptr<HostService> service;
   std::shared_ptr<HostServices> services;
+  pid_t process = 0;  // the client's, as the kernel says
   // On the loop's thread.
   std::size_t unanswered = 0;
   std::size_t streams = 0;

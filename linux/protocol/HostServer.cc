@@ -262,9 +262,9 @@ std::unique_ptr<HostServer> HostServer::listen(
   auto implementation = std::make_unique<Implementation>();
   implementation->server = SocketServer::listen(
       loop, socketPath,
-      [loop, executor, service, services]() -> capnp::Capability::Client {
+      [loop, executor, service, services](pid_t peer) -> capnp::Capability::Client {
         return kj::heap<HostObject>(
-            std::make_shared<HostPeer>(HostPeer{loop, executor, service, services}));
+            std::make_shared<HostPeer>(HostPeer{loop, executor, service, services, peer}));
       },
       log, {}, error, std::move(addressLost));
   if (!implementation->server) return nullptr;

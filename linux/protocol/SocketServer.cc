@@ -179,15 +179,15 @@ kj::Promise<void> SocketServer::Core::acceptSome() {
 }
 
 void SocketServer::Core::admit(FileDescriptor socket) {
-  const std::optional<uid_t> user = peerUserOfSocket(socket.get());
-  if (user != geteuid()) {
+  const auto who = peerOfSocket(socket.get());
+  if (!who || who->uid != geteuid()) {
     VL_ERROR(log, "[ERROR] a connection of user %lld was refused",
-             user ? static_cast<long long>(*user) : -1LL);
+             who ? static_cast<long long>(who->uid) : -1LL);
     return;
   }
   if (peers.size() >= options.mostConnections) makeRoom();
   const std::uint64_t number = ++lastNumber;
-  auto peer = kj::heap<Peer>(*io, std::move(socket), bootstrap());
+  auto peer = kj::heap<Peer>(*io, std::move(socket), bootstrap(who->pid));
   peer->heardAt = number;
   Peer& entry = *peer;
   auto stayedSilent = io->timer.afterDelay(options.firstMessage.count() * kj::MILLISECONDS)

@@ -23,9 +23,9 @@ namespace skein {
 // that never spoke.
 class SocketServer {
  public:
-  // Makes the object for one connection; called on the loop's thread. The connection
-  // holds it, and releases it (there) when it ends.
-  using Bootstrap = std::function<capnp::Capability::Client()>;
+  // Makes the object for one connection, of the process `peer`; called on the loop's thread.
+  // The connection holds it, and releases it (there) when it ends.
+  using Bootstrap = std::function<capnp::Capability::Client(pid_t peer)>;
 
   struct Options {
     std::size_t mostConnections = 256;

@@ -73,7 +73,8 @@ FileDescriptor connectToUnixSocket(const std::string& path, int& code) {
     code = errno;
     return {};
   }
-  if (peerUserOfSocket(connection.get()) != geteuid()) {
+  const auto peer = peerOfSocket(connection.get());
+  if (!peer || peer->uid != geteuid()) {
     code = EACCES;
     return {};
   }
@@ -83,22 +84,19 @@ FileDescriptor connectToUnixSocket(const std::string& path, int& code) {
 std::optional<SocketListener> listenerOnUnixSocket(const std::string& path) {
   int code = 0;
   const FileDescriptor connection = connectToUnixSocket(path, code);
-  ucred peer{};
-  socklen_t length = sizeof peer;
-  if (!connection || getsockopt(connection.get(), SOL_SOCKET, SO_PEERCRED, &peer, &length) != 0) {
-    return std::nullopt;
-  }
-  SocketListener listener{peer.pid,
-                          FileDescriptor(static_cast<int>(syscall(SYS_pidfd_open, peer.pid, 0)))};
+  const auto peer = connection ? peerOfSocket(connection.get()) : std::nullopt;
+  if (!peer) return std::nullopt;
+  SocketListener listener{peer->pid,
+                          FileDescriptor(static_cast<int>(syscall(SYS_pidfd_open, peer->pid, 0)))};
   if (!listener.handle) return std::nullopt;
   return listener;
 }
 
-std::optional<uid_t> peerUserOfSocket(int descriptor) {
+std::optional<ucred> peerOfSocket(int descriptor) {
   ucred peer{};
   socklen_t length = sizeof peer;
   if (getsockopt(descriptor, SOL_SOCKET, SO_PEERCRED, &peer, &length) != 0) return std::nullopt;
-  return peer.uid;
+  return peer;
 }
 
 }  // namespace skein

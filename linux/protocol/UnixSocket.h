@@ -2,6 +2,7 @@
 // 107 bytes that a socket's address holds.
 #pragma once
 
+#include <sys/socket.h>
 #include <sys/types.h>
 
 #include <optional>
@@ -31,7 +32,8 @@ struct SocketListener {
 };
 std::optional<SocketListener> listenerOnUnixSocket(const std::string& path);
 
-// Who is at the other end; nothing when that cannot be told.
-std::optional<uid_t> peerUserOfSocket(int descriptor);
+// Who is at the other end, as the kernel noted when it connected; nothing when that cannot be
+// told.
+std::optional<ucred> peerOfSocket(int descriptor);
 
 }  // namespace skein

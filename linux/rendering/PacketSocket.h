@@ -9,6 +9,8 @@
 
 namespace skein {
 
+inline constexpr std::size_t kMostPacketBytes = 64;
+
 // Sends one packet, with copies of the descriptors. 0, or an errno; never a signal.
 int sendPacket(int socket, std::string_view packet, const std::vector<int>& descriptors = {});
 
@@ -27,7 +29,7 @@ struct Packet {
 
  private:
   friend int receivePacket(int socket, Packet& packet);
-  char _bytes[64];
+  char _bytes[kMostPacketBytes];
   std::size_t _size = 0;
 };
 

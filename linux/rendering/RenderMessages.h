@@ -1,7 +1,8 @@
 // What crosses between vald and its rendering workers (skein-thumbnailer): packets on a
 // socket pair (SOCK_SEQPACKET), in the machine's own byte order.
 //
-//   worker   Greeting, once, when it is locked down
+//   worker   Greeting, once, when it is locked down; or, when it cannot be, the step that
+//            failed in words, and it ends
 //   vald     RenderRequest with two descriptors: the document, open for reading, and a
 //            memory file that takes the picture
 //   worker   RenderAnswer, one per request, in order

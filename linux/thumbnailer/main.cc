@@ -12,8 +12,10 @@
 #include <cstdio>
 #include <cstdlib>
 #include <string>
+#include <string_view>
 #include <vector>
 
+#include "linux/rendering/PacketSocket.h"
 #include "linux/thumbnailer/Fonts.h"
 #include "linux/thumbnailer/LockDown.h"
 #include "linux/thumbnailer/RequestLoop.h"
@@ -66,6 +68,7 @@ int run() {
   const LockDown outcome = lockDown(fontFolders);
   if (!outcome.problem.empty()) {
     std::fprintf(stderr, "skein-thumbnailer: %s\n", outcome.problem.c_str());
+    sendPacket(kSocket, std::string_view(outcome.problem).substr(0, kMostPacketBytes));
     return EXIT_FAILURE;
   }
   greeting.hasFonts = outcome.hasFonts ? 1 : 0;

@@ -23,7 +23,10 @@ constexpr std::uint32_t kEntries = IN_CREATE | IN_CLOSE_WRITE | IN_MOVED_FROM | 
 constexpr std::uint32_t kArrivals =
     IN_CREATE | IN_MOVED_TO | IN_DELETE_SELF | IN_MOVE_SELF | IN_ONLYDIR;
 constexpr int kLongestRun = 20;  // quiet times
+// Desktop entries lie in a folder or just below; what is deeper or more is no such place.
 constexpr std::size_t kMostFolders = 1000;
+constexpr int kDeepest = 8;
+constexpr std::size_t kMostEntries = 100'000;
 
 void drain(int watches) {
   std::array<char, 16384> buffer{};
@@ -41,11 +44,14 @@ void watchTree(int watches, const std::string& folder) {
   fs::recursive_directory_iterator entry(folder, fs::directory_options::skip_permission_denied,
                                          failure);
   std::size_t watched = 0;
+  std::size_t seen = 0;
   for (; !failure && entry != fs::recursive_directory_iterator(); entry.increment(failure)) {
+    if (++seen > kMostEntries || watched >= kMostFolders) return;
+    if (entry.depth() >= kDeepest) entry.disable_recursion_pending();
     std::error_code unknown;
-    if (entry->is_directory(unknown) && ++watched < kMostFolders) {
-      watch(watches, entry->path(), kEntries);
-    }
+    if (!entry->is_directory(unknown)) continue;
+    ++watched;
+    watch(watches, entry->path(), kEntries);
   }
 }
 

@@ -98,6 +98,8 @@ void Cloud::startThumbnails(FolderStore& store) {
                                ThumbnailRenderer::Options()});
   if (!started) {
     VL_ERROR(_log, "[ERROR] no thumbnails are made: %@", started.error()->localizedDescription());
+    MutexLock lock(_mutex);
+    _thumbnailProblem = started.error()->localizedDescription();
     return;
   }
   MutexLock lock(_mutex);
@@ -210,6 +212,15 @@ void Cloud::storeDidOverflow() {
   if (const auto told = feed()) told->storeDidOverflow();
 }
 
+std::string Cloud::thumbnailProblem() {
+  {
+    MutexLock lock(_mutex);
+    if (!_thumbnailProblem.empty()) return _thumbnailProblem;
+  }
+  const auto service = thumbnails();
+  return service ? service->startProblem() : std::string();
+}
+
 std::string Cloud::whyNotUploaded(VLFileObjectID document) {
   const auto asked = feed();
   return asked ? asked->whyNot(document) : std::string();
@@ -242,7 +253,8 @@ void Cloud::cloudStatus(Reply<LocalCloudStatus, NSErrorPtr> reply) {
   _answers->post([this, reply = std::move(reply)]() mutable {
     LocalCloudStatus status;
     status.uploads = _options.policy.uploads;
-    if (_options.mayUpload && !_options.mayUpload()) {
+    if (status.uploads != LocalCloudStatus::Uploads::Off && _options.mayUpload &&
+        !_options.mayUpload()) {
       status.uploads = LocalCloudStatus::Uploads::Unasked;
     }
     status.uploadLimit = _options.policy.limit;

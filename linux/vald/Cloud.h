@@ -49,6 +49,8 @@ class Cloud final : public LocalCloud {
   // What the store told; from start() to stop().
   void storeDidChange(const std::vector<StoreChange>& changes) SKEIN_EXCLUDES(_mutex);
   void storeDidOverflow() SKEIN_EXCLUDES(_mutex);
+  // Why nothing is drawn at the moment; empty: nothing hinders it, or nothing was asked for.
+  std::string thumbnailProblem() SKEIN_EXCLUDES(_mutex);
   std::string whyNotUploaded(VLFileObjectID document) SKEIN_EXCLUDES(_mutex);
   // What became of the document at this path. Cheap; any thread.
   void documentWasEvicted(const std::string& path, VLFileObjectID document) SKEIN_EXCLUDES(_mutex);
@@ -89,6 +91,7 @@ class Cloud final : public LocalCloud {
   std::shared_ptr<UploadFeed> _feed SKEIN_GUARDED_BY(_mutex);
   std::shared_ptr<ThumbnailService> _thumbnails SKEIN_GUARDED_BY(_mutex);
   std::shared_ptr<CollectionRounds> _rounds SKEIN_GUARDED_BY(_mutex);
+  std::string _thumbnailProblem SKEIN_GUARDED_BY(_mutex);
 };
 
 }  // namespace skein::vald

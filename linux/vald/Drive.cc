@@ -1,6 +1,10 @@
 #include "linux/vald/Drive.h"
 
+#include <cstring>
 #include <utility>
+
+#include "linux/vald/files/DatabaseFile.h"
+#include "linux/vald/files/FileNames.h"
 
 namespace skein::vald {
 namespace {
@@ -8,11 +12,30 @@ namespace {
 constexpr std::size_t kThreads = 4;
 constexpr std::size_t kImportThreads = 2;
 
+// One container that cannot be opened does not close the others.
 std::vector<std::string> rootPaths(const std::string& drive,
-                                   const std::vector<StoreRoot>& containers) {
+                                   const std::vector<StoreRoot>& containers, Log& log) {
   std::vector<std::string> paths{drive};
-  for (const StoreRoot& container : containers) paths.push_back(container.path);
+  for (const StoreRoot& container : containers) {
+    DirectoryHandle folder;
+    if (const int code = DirectoryHandle::openRoot(container.path, folder)) {
+      VL_ERROR(log, "[ERROR] the documents folder %@ cannot be opened: %s", container.path,
+               std::strerror(code));
+      continue;
+    }
+    paths.push_back(container.path);
+  }
   return paths;
+}
+
+// Opens what keeps a database; anew when that is damaged.
+template <class Open>
+auto openAnewWhenDamaged(const std::string& database, Log& log, NSErrorOut error, Open open) {
+  NSErrorPtr problem;
+  auto opened = open(&problem);
+  if (!opened && setAsideWhenDamaged(database, log)) opened = open(&problem);
+  if (!opened) error.store(std::move(problem));
+  return opened;
 }
 
 }  // namespace
@@ -28,13 +51,18 @@ std::unique_ptr<Drive> Drive::open(DriveOptions options, StoreListener& listener
   std::unique_ptr<Drive> drive(new Drive(listener, log));
   drive->_root = options.store.drive.path;
   FileOperationsOptions own;
-  own.roots = rootPaths(drive->_root, options.store.containers);
+  own.roots = rootPaths(drive->_root, options.store.containers, log);
   own.stateDirectory = options.stateDirectory;
   own.otherNames = otherNamesOfItem;
-  drive->_operations = FileOperations::open(std::move(own), layer, log, error);
+  drive->_operations = openAnewWhenDamaged(
+      joinPath(options.stateDirectory, "operations.db"), log, error,
+      [&](NSErrorOut problem) { return FileOperations::open(own, layer, log, problem); });
   if (!drive->_operations) return nullptr;
   options.cloud.drive = drive->_root;
-  drive->_cloud = Cloud::open(std::move(options.cloud), *drive->_operations, log, error);
+  drive->_cloud = openAnewWhenDamaged(
+      joinPath(options.cloud.folder, "records.db"), log, error, [&](NSErrorOut problem) {
+        return Cloud::open(options.cloud, *drive->_operations, log, problem);
+      });
   if (!drive->_cloud) return nullptr;
   drive->_store = FolderStore::openFolder(std::move(options.store), *drive, log, error);
   if (!drive->_store) return nullptr;
@@ -73,7 +101,7 @@ void Drive::close() {
 }
 
 void Drive::containersWillChange(const std::vector<StoreRoot>& containers) {
-  if (NSErrorPtr error = _operations->setRoots(rootPaths(_root, containers))) {
+  if (NSErrorPtr error = _operations->setRoots(rootPaths(_root, containers, _log))) {
     VL_ERROR(_log, "[ERROR] documents of new containers can't be changed: %@",
              error->localizedDescription());
   }

@@ -12,6 +12,7 @@
 #include "base/Numbers.h"
 #include "linux/protocol/AnswerRoom.h"
 #include "linux/vald/RandomToken.h"
+#include "linux/vald/files/DatabaseFile.h"
 #include "linux/vald/files/FileNames.h"
 #include "linux/vald/index/IndexFile.h"
 #include "linux/vald/scan/StoreNames.h"
@@ -41,6 +42,9 @@ std::string suffixOfRoot(std::uint64_t inode, std::uint32_t generation) {
   return ".of-" + std::to_string(inode) + "-" + std::to_string(generation);
 }
 
+// Volumes that take turns are few.
+constexpr std::size_t kMostOfOtherFolders = 4;
+
 // An index belongs to one folder. Found beside another (the volume is not mounted, a
 // backup took the folder's place), it is put away under its folder's number, and taken
 // back when that folder is there again.
@@ -66,6 +70,7 @@ std::unique_ptr<SqliteDatabase> openIndexOf(const RootFolder& drive, const std::
     return nullptr;
   }
   takeIndexFileBack(path, own);
+  pruneSetAside(path, ".of-", kMostOfOtherFolders);
   return openIndexFile(path, log, error);
 }
 

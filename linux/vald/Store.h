@@ -27,7 +27,7 @@ struct StoreOptions {
   std::string databasePath;
   StoreRoot drive;
   std::vector<StoreRoot> containers;
-  std::uint64_t watchBudget = 0;  // 0: what the system allows, less a margin for others
+  std::uint64_t watchBudget = 0;  // 0: half of what the system allows
   // How long a document that vanished keeps its identity for a safe-save that follows.
   std::chrono::milliseconds graceWindow{2000};
   // How many changes the journal keeps before older tokens expire.

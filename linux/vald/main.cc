@@ -7,6 +7,7 @@
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
+#include <cstring>
 #include <filesystem>
 #include <memory>
 #include <string>
@@ -38,8 +39,10 @@
 #include "linux/vald/MovedDrive.h"
 #include "linux/vald/Store.h"
 #include "linux/vald/cloud/RecordFetches.h"
+#include "linux/vald/files/DatabaseFile.h"
 #include "linux/vald/files/FileNames.h"
 #include "linux/vald/files/OwnFolders.h"
+#include "linux/vald/scan/FolderReader.h"
 #include "linux/vald/shares/Shares.h"
 #include "linux/vald/shares/SharingStore.h"
 
@@ -91,6 +94,36 @@ std::vector<std::string> ownFoldersOf(const DrivePaths& paths) {
   return folders;
 }
 
+// Anew when the database is damaged, which may show only when it is read.
+Outcome<std::unique_ptr<ShareRecords>> openShares(const std::string& path, Log& log) {
+  {
+    auto records = ShareRecords::open(path);
+    if (records && (*records)->shares() && (*records)->zones() && (*records)->untold()) {
+      return records;
+    }
+  }
+  setAsideWhenDamaged(path, log);
+  return ShareRecords::open(path);
+}
+
+// What is so now, beside what was so at the start.
+std::vector<std::string> notesOf(const DrivePaths& paths, std::vector<std::string> notes,
+                                 const Containers& containers, Drive& drive) {
+  for (const std::string& folder : {paths.stateDirectory, paths.cloudDirectory}) {
+    for (std::string& note : notesOfDatabasesSetAside(folder)) notes.push_back(std::move(note));
+  }
+  for (const StoreRoot& root : containers.storeRoots()) {
+    int code = 0;
+    if (findRoot(root.path, code)) continue;
+    notes.push_back("the documents folder " + root.path + " of " + root.displayName +
+                    " cannot be opened: " + std::strerror(code));
+  }
+  if (std::string problem = drive.cloud().thumbnailProblem(); !problem.empty()) {
+    notes.push_back("no thumbnails are drawn: " + problem);
+  }
+  return notes;
+}
+
 // Serves until a signal comes. The exit status.
 int serve(const DrivePaths& paths, Background& background, Log& log) {
   const sigset_t signals = takeEndingSignals();
@@ -135,7 +168,7 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
   FileLayer layer;
   SharedItems sharedItems;
   SharingListener sharingListener(sharedItems, listener);
-  auto records = ShareRecords::open(paths.stateDirectory + "/shares.sqlite");
+  auto records = openShares(paths.stateDirectory + "/shares.sqlite", log);
   if (!records) return fail(records.error());
   const std::unique_ptr<Drive> drive =
       Drive::open({std::move(options), paths.stateDirectory, std::move(cloud)}, sharingListener,
@@ -169,7 +202,7 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
       executor, slowExecutor, store, senders, accounts, containers, subscribers, drive->files(),
       recordFetches, *shares, drive->cloud(), *faults, log, paths.store, stop,
       [&drive](const std::vector<StoreRoot>& roots) { drive->containersWillChange(roots); },
-      [&notes] { return notes; }});
+      [&] { return notesOf(paths, notes, containers, *drive); }});
   listener.setAfterFolderChange([weak = std::weak_ptr<Daemon>(daemon)] {
     if (const auto changed = weak.lock()) changed->refreshDriveFolders();
   });
@@ -240,7 +273,8 @@ int run(const std::vector<std::string>& arguments) {
   Background background = line->foreground ? Background() : Background::enter(paths.daemonLog);
   lock.writeProcessID();
   // Who set how much is uploaded was not asked, but has said so.
-  if (UploadPolicy::isSet()) {
+  if (UploadPolicy::isSet() &&
+      UploadPolicy::fromEnvironment().uploads != LocalCloudStatus::Uploads::Off) {
     setUploadConsent(paths.stateDirectory, UploadConsent::Given);
   }
   const auto log = LogFile::open({paths.daemonLog, line->foreground}, &error);

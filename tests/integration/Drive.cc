@@ -139,16 +139,13 @@ Drive::Drive() {
     std::filesystem::create_directory(_folder + '/' + part);
   }
   chmod((_folder + "/state").c_str(), 0700);
-  _environment = {"HOME=" + _home,
-                  "XDG_RUNTIME_DIR=" + _folder + "/run",
-                  "XDG_STATE_HOME=" + _folder + "/state",
-                  "XDG_DATA_HOME=" + _folder + "/data",
-                  "XDG_DATA_DIRS=" + _folder + "/none",
-                  "SKEIN_STORE=" + _store,
-                  "PATH=" + std::string(SKEIN_BIN_DIR) + ":/usr/bin:/bin",
-                  "TMPDIR=" + _home,
+  _environment = {"HOME=" + _home, "XDG_RUNTIME_DIR=" + _folder + "/run",
+                  "XDG_STATE_HOME=" + _folder + "/state", "XDG_DATA_HOME=" + _folder + "/data",
+                  "XDG_DATA_DIRS=" + _folder + "/none", "SKEIN_STORE=" + _store,
+                  "PATH=" + std::string(SKEIN_BIN_DIR) + ":/usr/bin:/bin", "TMPDIR=" + _home,
                   "SKEIN_ALLOW_FAULTS=1",
-                  "LANG=C.UTF-8"};
+                  // Nobody is asked; what a test says of uploads takes its place.
+                  "SKEIN_UPLOADS=1024", "LANG=C.UTF-8"};
 }
 
 Drive::~Drive() {

@@ -254,6 +254,91 @@ TEST_F(Files, AMovedDriveIsTheSameAndItsProcessesAreFoundFromEverySession) {
   EXPECT_EQ(contents(socket), "another's");
 }
 
+TEST_F(Files, ANewDriveIsToldOfAndCopiesNothingUntilSomebodyAgrees) {
+  drive.write("/letter.txt", "dear");
+  const auto unset = [&](const std::string& command) {
+    return drive.shell("unset SKEIN_UPLOADS; " + command);
+  };
+  EXPECT_NE(unset("skein stop").errors.find("never opened"), std::string::npos);
+  EXPECT_EQ(unset("skein drives").output, "") << "asking about a folder opens nothing";
+  const Result first = unset("skein ls /");
+  EXPECT_EQ(first.lines(), Lines{"letter.txt"});
+  EXPECT_NE(first.errors.find(drive.store() + " is a drive from now on"), std::string::npos);
+  EXPECT_NE(first.errors.find("/cloud"), std::string::npos) << first.errors;
+  EXPECT_EQ(unset("skein ls /").errors, "") << "once";
+  EXPECT_EQ(Json::parse(unset("skein cloud --json").output)["uploads"], "unasked");
+  EXPECT_NE(unset("skein evict /letter.txt").errors.find("skein cloud uploads on"),
+            std::string::npos);
+  EXPECT_EQ(unset("skein cloud uploads on").code, 0);
+  EXPECT_TRUE(isUploaded("/letter.txt"));
+
+  // What is known is listed, and forgotten when nothing is lost by it.
+  skein({"evict", "/letter.txt"});
+  Json listed = Json::parse(skein({"drives", "--json"}).at(0));
+  EXPECT_EQ(listed["path"], drive.store());
+  EXPECT_EQ(listed["processID"], drive.daemon());
+  EXPECT_GT(listed["bytes"], 0);
+  EXPECT_EQ(fails({"forget"}, "the only copy of 1 evicted"), 8);
+  EXPECT_EQ(skein({"cat", "/letter.txt"}), Lines{"dear"});
+  skein({"get", "/letter.txt"});
+  const Result forgotten = drive.run({"--store", listed["drive"], "forget"});
+  EXPECT_EQ(forgotten.code, 0) << forgotten.errors;
+  EXPECT_EQ(drive.run({"drives"}).output, "");
+  EXPECT_EQ(contents(drive.store() + "/letter.txt"), "dear");
+  EXPECT_EQ(drive.daemon(), 0);
+  EXPECT_NE(unset("skein ls /").errors.find("is a drive from now on"), std::string::npos);
+}
+
+TEST_F(Files, ADriveThatHoldsItsOwnStateLeavesItOut) {
+  // As a drive over the home folder.
+  const fs::path top = fs::path(drive.store()).parent_path();
+  std::ofstream(top / "state/other.txt") << "a document";
+  const auto skeinAtTop = [&](Arguments arguments) {
+    arguments.insert(arguments.begin(), {"--store", top});
+    return drive.run(arguments);
+  };
+  EXPECT_EQ(skeinAtTop({"ls", "/state"}).lines(), Lines{"other.txt"});
+  EXPECT_EQ(skeinAtTop({"ls", "/data"}).lines(), Lines());
+  EXPECT_EQ(skeinAtTop({"doctor"}).code, 0);
+  const Json status = Json::parse(skeinAtTop({"status", "--json"}).output);
+  EXPECT_NE(status["notes"].dump().find(drive.state() + "/skein"), std::string::npos) << status;
+  const Result import = skeinAtTop({"import", top / "state", "/home"});
+  EXPECT_NE(import.code, 0);
+  EXPECT_NE(import.errors.find("/state/skein"), std::string::npos) << import.errors;
+  EXPECT_EQ(drive.run({"--store", drive.state() + "/skein", "ls", "/"}).code, 1);
+}
+
+TEST_F(Files, ADamagedDatabaseIsSetAsideAndTheDriveOpens) {
+  drive.write("/letter.txt", "dear");
+  ASSERT_TRUE(isUploaded("/letter.txt"));
+  skein({"evict", "/letter.txt"});
+  skein({"stop"});
+  const fs::path state = [&] {
+    for (const auto& entry : fs::directory_iterator(drive.state() + "/skein")) {
+      if (entry.is_directory()) return entry.path();
+    }
+    return fs::path();
+  }();
+  const fs::path cloud =
+      fs::path(drive.state()).parent_path() / "data/skein" / state.filename() / "cloud";
+  const std::vector<fs::path> databases{state / "operations.db", state / "shares.sqlite",
+                                        cloud / "records.db"};
+  for (const fs::path& database : databases) {
+    struct stat status {};
+    ASSERT_EQ(::stat(database.c_str(), &status), 0) << database;
+    EXPECT_EQ(status.st_mode & 0777, 0600U) << database;
+    std::fstream file(database, std::ios::in | std::ios::out | std::ios::binary);
+    file << "not a database any more";
+  }
+  EXPECT_EQ(skein({"cat", "/letter.txt"}), Lines{"dear"}) << "the marker names its contents";
+  const std::string told = drive.run({"status"}).output + drive.run({"doctor"}).output;
+  for (const fs::path& database : databases) {
+    const std::size_t first = told.find(database.string() + " was damaged");
+    ASSERT_NE(first, std::string::npos) << told;
+    EXPECT_NE(told.find(database.string() + " was damaged", first + 1), std::string::npos);
+  }
+}
+
 TEST_F(Files, WhatIsEvictedHasAThumbnailThatFileManagersFind) {
   const auto files = [](const fs::path& folder, const std::string& part) {
     std::error_code none;

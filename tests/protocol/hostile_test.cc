@@ -219,7 +219,8 @@ TEST_F(Hostile, ConnectionThatNeverSpeaksIsClosed) {
   options.firstMessage = std::chrono::milliseconds(20);
   const std::string path = folder + "/other";
   const auto other = SocketServer::listen(
-      loop, path, []() -> capnp::Capability::Client { return nullptr; }, log, options, nullptr);
+      loop, path, [](pid_t) -> capnp::Capability::Client { return nullptr; }, log, options,
+      nullptr);
   ASSERT_TRUE(other);
   int code = 0;
   EXPECT_TRUE(closes(connectToUnixSocket(path, code)));

@@ -4,6 +4,7 @@
 
 #include <string>
 
+#include "linux/vald/files/DatabaseFile.h"
 #include "vellum/VLErrors.h"
 
 namespace skein::vald {
@@ -89,6 +90,7 @@ bool CloudStatement::isNull(int column) const {
 
 Outcome<std::unique_ptr<CloudDatabase>> CloudDatabase::open(
     const std::string& path, std::initializer_list<const char*> schemas) {
+  makeDatabasePrivate(path);
   sqlite3* handle = nullptr;
   const int code =
       sqlite3_open_v2(path.c_str(), &handle,

@@ -10,6 +10,7 @@
 #include <iterator>
 #include <utility>
 
+#include "linux/vald/files/DatabaseFile.h"
 #include "linux/vald/files/FileErrors.h"
 #include "linux/vald/files/FileNames.h"
 
@@ -94,6 +95,7 @@ std::unique_ptr<OperationJournal> OperationJournal::open(const std::string& data
         databasePath));
     return nullptr;
   };
+  makeDatabasePrivate(databasePath);
   sqlite3* database = nullptr;
   const int flags = SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE | SQLITE_OPEN_NOMUTEX;
   const int opened = sqlite3_open_v2(databasePath.c_str(), &database, flags, nullptr);

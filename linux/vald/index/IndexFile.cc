@@ -11,6 +11,7 @@
 
 #include "linux/protocol/FileDescriptor.h"
 #include "linux/vald/RandomToken.h"
+#include "linux/vald/files/DatabaseFile.h"
 #include "vellum/VLErrors.h"
 
 namespace skein::vald {
@@ -19,6 +20,9 @@ namespace {
 constexpr int kApplicationID = 0x534b4e49;  // "SKNI"
 constexpr int kVersion = 2;
 constexpr std::string_view kOpenMark = "open since";
+// How many that could not be used are kept.
+constexpr std::size_t kMostAside = 3;
+
 constexpr const char* kParts[] = {"", "-wal", "-shm"};
 
 constexpr char kTables[] = R"(
@@ -193,6 +197,7 @@ std::unique_ptr<SqliteDatabase> openIndexFile(const std::string& path, Log& log,
         return nullptr;
       }
       ::unlink(damageMark(path).c_str());
+      pruneSetAside(path, ".set-aside-", kMostAside);
     }
     int code = 0;
     auto database = SqliteDatabase::open(path, true, code, reason);

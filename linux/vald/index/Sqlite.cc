@@ -1,9 +1,12 @@
 #include "linux/vald/index/Sqlite.h"
 
+#include "linux/vald/files/DatabaseFile.h"
+
 namespace skein::vald {
 
 std::unique_ptr<SqliteDatabase> SqliteDatabase::open(const std::string& path, bool writable,
                                                      int& code, std::string& message) {
+  if (writable) makeDatabasePrivate(path);
   sqlite3* handle = nullptr;
   const int flags = SQLITE_OPEN_NOMUTEX |
                     (writable ? SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE : SQLITE_OPEN_READONLY);

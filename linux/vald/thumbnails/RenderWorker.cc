@@ -121,7 +121,12 @@ NSErrorPtr RenderWorker::awaitGreeting() {
   const int code = await(_options.patienceAtStart, packet);
   if (code == ETIMEDOUT) return notStarted(_options.program, "was not ready in time");
   const auto greeting = code == 0 ? parseGreeting(packet.bytes()) : std::nullopt;
-  if (!greeting) return notStarted(_options.program, "could not be locked down");
+  if (!greeting) {
+    // In the worker's own words, which nobody has to believe.
+    std::string why = code == 0 ? std::string(packet.bytes()) : std::string(std::strerror(code));
+    std::erase_if(why, [](char c) { return c < ' ' || c > '~'; });
+    return notStarted(_options.program, "could not be locked down: " + why);
+  }
   _greeting = *greeting;
   return nullptr;
 }

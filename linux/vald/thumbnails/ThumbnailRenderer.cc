@@ -75,9 +75,12 @@ struct ThumbnailRenderer::Core : std::enable_shared_from_this<Core> {
     auto worker = RenderWorker::start(options.worker);
     if (!worker) {
       VL_ERROR(log, "[ERROR] %@", worker.error()->localizedDescription());
+      MutexLock lock(mutex);
+      startProblem = worker.error()->localizedDescription();
       return worker;
     }
     MutexLock lock(mutex);
+    startProblem.clear();
     ++alive;
     const Greeting& greeting = (*worker)->greeting();
     const bool tells = !toldOfGaps && greeting.hasFonts == 0;
@@ -178,6 +181,7 @@ struct ThumbnailRenderer::Core : std::enable_shared_from_this<Core> {
   bool stopped SKEIN_GUARDED_BY(mutex) = false;
   bool armed SKEIN_GUARDED_BY(mutex) = false;
   bool toldOfGaps SKEIN_GUARDED_BY(mutex) = false;
+  std::string startProblem SKEIN_GUARDED_BY(mutex);
 };
 
 class ThumbnailRenderer::RequestTicket final : public Ticket {
@@ -208,6 +212,11 @@ std::shared_ptr<ThumbnailRenderer::Ticket> ThumbnailRenderer::render(Request req
   }
   _runner.post([core = _core] { core->runNext(); });
   return std::make_shared<RequestTicket>(_core, pending);
+}
+
+std::string ThumbnailRenderer::startProblem() const {
+  MutexLock lock(_core->mutex);
+  return _core->startProblem;
 }
 
 std::size_t ThumbnailRenderer::workers() const {

@@ -3,6 +3,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <memory>
+#include <string>
 #include <thread>
 
 #include "base/Completion.h"
@@ -55,6 +56,9 @@ class ThumbnailRenderer {
   };
   // Returns at once; never answers inside this call.
   std::shared_ptr<Ticket> render(Request request);
+
+  // Why the last process that was needed did not start; empty when it did, or none was.
+  std::string startProblem() const;
 
   // The processes that live at the moment.
   std::size_t workers() const;

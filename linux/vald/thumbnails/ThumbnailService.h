@@ -40,6 +40,8 @@ class ThumbnailService {
     _desktop->documentWasEvicted(std::move(path), std::move(record));
   }
   void documentCameBack(std::string path) { _desktop->documentCameBack(std::move(path)); }
+  // ThumbnailRenderer::startProblem().
+  std::string startProblem() const { return _renderer->startProblem(); }
   // Removes pictures of contents that no record refers to: with the cloud's own garbage.
   Outcome<std::uint64_t> collectGarbage();
 
