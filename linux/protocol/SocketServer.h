@@ -28,7 +28,7 @@ class SocketServer {
   using Bootstrap = std::function<capnp::Capability::Client(pid_t peer)>;
 
   struct Options {
-    std::size_t mostConnections = 256;
+    std::size_t mostConnections = 128;
     // A connection that says nothing for so long from its start is closed.
     std::chrono::milliseconds firstMessage{deadlines::kFirstMessage};
   };
