@@ -1,4 +1,5 @@
 // skein cloud
+#include <optional>
 #include <utility>
 
 #include "linux/cli/CloudText.h"
@@ -12,6 +13,11 @@ namespace {
 
 struct StatusOptions {
   bool json = false;
+};
+
+struct KeepOptions {
+  std::optional<std::uint32_t> days;
+  std::optional<std::uint32_t> percent;
 };
 
 struct TryOptions {
@@ -36,11 +42,40 @@ int runCloudStatus(HostService& host, const StatusOptions& options) {
   };
   field("in the cloud", sizeText(cloud.usedBytes));
   field("uploads", uploadsText(cloud));
+  field("kept", keptText(cloud));
+  field("kept for", keepingText(cloud));
   field("waiting", std::to_string(cloud.waiting));
   field("failed", std::to_string(cloud.failed));
   field("left out", std::to_string(cloud.leftOut));
   field("last failure", cloud.lastFailure.empty() ? "none" : cloud.lastFailure);
   field("conditions", conditionsText(cloud.conditions));
+  return kSuccess;
+}
+
+int runKeep(HostService& host, const KeepOptions& options) {
+  const auto [cloud, unknown] =
+      await<LocalCloudStatus>([&](auto reply) { host.cloudStatus(std::move(reply)); });
+  if (unknown) return complainAbout(unknown);
+  const LocalCloudKeeping keeping{options.days.value_or(cloud.keeping.days),
+                                  options.percent.value_or(cloud.keeping.percent)};
+  const auto [error] =
+      await<>([&](auto reply) { host.setCloudKeeping(keeping, std::move(reply)); });
+  return error ? complainAbout(error) : kSuccess;
+}
+
+int runCollect(HostService& host, const StatusOptions& options) {
+  const auto [collection, error] =
+      await<LocalCloudCollection>([&](auto reply) { host.collectCloud(std::move(reply)); });
+  if (error) return complainAbout(error);
+  Output output;
+  if (options.json) {
+    output.write(jsonOf(collection) + '\n');
+  } else {
+    output.write("freed " + std::to_string(collection.freedFiles) + ", " +
+                 sizeText(collection.freedBytes) + "; kept " +
+                 std::to_string(collection.keptFiles) + ", " + sizeText(collection.keptBytes) +
+                 '\n');
+  }
   return kSuccess;
 }
 
@@ -72,6 +107,27 @@ void addCloudCommand(CLI::App& app, Invocation& invocation) {
   cloud->require_subcommand(0, 1);
   cloud->add_flag("--json", status->json, "As one JSON object");
   cloud->footer("Example: skein cloud");
+
+  auto keep = std::make_shared<KeepOptions>();
+  auto* keeping = cloud->add_subcommand(
+      "keep", "Set how long old revisions and removed documents stay, whichever ends first");
+  keeping->fallthrough();
+  auto* ways = keeping->add_option_group("how long");
+  ways->add_option("--days", keep->days, "DAYS since the revision was replaced or removed")
+      ->check(CLI::Range(0U, LocalCloudKeeping::kMostDays));
+  ways->add_option("--percent", keep->percent, "PERCENT of the disk that they take in all")
+      ->check(CLI::Range(0U, 100U));
+  ways->require_option(1, 2);
+  runs(keeping, invocation,
+       "What may be the only copy of an evicted document stays for all of the days.\n"
+       "Example: skein cloud keep --days 7",
+       keep, runKeep);
+
+  auto collecting = std::make_shared<StatusOptions>();
+  auto* collect = cloud->add_subcommand("gc", "Remove now what is not kept any longer");
+  collect->fallthrough();
+  collect->add_flag("--json", collecting->json, "As one JSON object");
+  runs(collect, invocation, "Example: skein cloud gc", collecting, runCollect);
 
   auto options = std::make_shared<TryOptions>();
   LocalCloudConditions& conditions = options->conditions;

@@ -32,6 +32,23 @@ std::string uploadsText(const LocalCloudStatus& cloud) {
   return cloud.sharesBlocks ? "without limit, sharing the documents' blocks" : "without limit";
 }
 
+std::string keepingText(const LocalCloudStatus& cloud) {
+  std::string text = std::to_string(cloud.keeping.days) + " days, up to " +
+                     sizeText(cloud.keptLimit) + " (" + std::to_string(cloud.keeping.percent) +
+                     " % of the disk";
+  if (cloud.uploads == Uploads::Bounded) text += ", within the bound of uploads";
+  return text + ')';
+}
+
+std::string keptText(const LocalCloudStatus& cloud) {
+  std::string text = std::to_string(cloud.keptFiles) + ", " + sizeText(cloud.keptBytes);
+  if (cloud.onlyCopiesBytes > 0) {
+    text += ", of these " + sizeText(cloud.onlyCopiesBytes) +
+            " that may be the only copy of an evicted document";
+  }
+  return text;
+}
+
 std::string conditionsText(const LocalCloudConditions& conditions) {
   std::string text;
   const auto add = [&text](const std::string& part) { text += (text.empty() ? "" : ", ") + part; };
@@ -66,6 +83,12 @@ std::string jsonOf(const LocalCloudStatus& cloud) {
   const LocalCloudConditions& conditions = cloud.conditions;
   std::string json =
       "{\"usedBytes\":" + std::to_string(cloud.usedBytes) +
+      ",\"keepDays\":" + std::to_string(cloud.keeping.days) +
+      ",\"keepPercent\":" + std::to_string(cloud.keeping.percent) +
+      ",\"keptLimit\":" + std::to_string(cloud.keptLimit) +
+      ",\"keptFiles\":" + std::to_string(cloud.keptFiles) +
+      ",\"keptBytes\":" + std::to_string(cloud.keptBytes) +
+      ",\"onlyCopiesBytes\":" + std::to_string(cloud.onlyCopiesBytes) +
       ",\"uploads\":" + jsonString(wordOf(cloud.uploads)) + ",\"uploadLimit\":" +
       (cloud.uploads == Uploads::Bounded ? std::to_string(cloud.uploadLimit) : "null") +
       ",\"sharesBlocks\":" + flag(cloud.sharesBlocks) +
@@ -79,6 +102,13 @@ std::string jsonOf(const LocalCloudStatus& cloud) {
          ",\"delayMilliseconds\":" + std::to_string(conditions.delayMilliseconds) +
          ",\"bytesPerSecond\":" + std::to_string(conditions.bytesPerSecond) +
          ",\"failures\":" + std::to_string(conditions.failures) + "}}";
+}
+
+std::string jsonOf(const LocalCloudCollection& collection) {
+  return "{\"freedFiles\":" + std::to_string(collection.freedFiles) +
+         ",\"freedBytes\":" + std::to_string(collection.freedBytes) +
+         ",\"keptFiles\":" + std::to_string(collection.keptFiles) +
+         ",\"keptBytes\":" + std::to_string(collection.keptBytes) + "}";
 }
 
 }  // namespace skein::cli

@@ -9,6 +9,11 @@
 namespace skein::cli {
 namespace {
 
+struct DoctorOptions {
+  bool json = false;
+  bool quick = false;
+};
+
 std::string_view wordOf(LocalDaemonStatus::Scan scan) {
   switch (scan) {
     case LocalDaemonStatus::Scan::Idle: return "idle";
@@ -28,6 +33,7 @@ std::string_view wordOf(HostDifference::Kind kind) {
     case HostDifference::Kind::MissingInListing: return "not listed";
     case HostDifference::Kind::OnlyInListing: return "listed only";
     case HostDifference::Kind::Listing: return "listed wrongly";
+    case HostDifference::Kind::Contents: return "cannot come back";
   }
   return "differs";
 }
@@ -148,9 +154,17 @@ void tellNotes(HostService& host, Output& output, bool json) {
   }
 }
 
-int runDoctor(HostService& host, bool json) {
-  const auto [check, error] =
-      await<std::shared_ptr<HostCheck>>([&](auto reply) { host.check(std::move(reply)); });
+// What was verified so far; empty when nothing is evicted.
+std::string verifiedText(const HostCheckStep& step) {
+  if (step.verified == 0) return {};
+  return ", " + std::to_string(step.verified) + " evicted looked at in the cloud (" +
+         sizeText(step.verifiedBytes) + " read)";
+}
+
+int runDoctor(HostService& host, const DoctorOptions& options) {
+  const bool json = options.json;
+  const auto [check, error] = await<std::shared_ptr<HostCheck>>(
+      [&](auto reply) { host.check(options.quick, std::move(reply)); });
   if (error) return complainAbout(error);
   Output output;
   Progress progress;
@@ -183,17 +197,19 @@ int runDoctor(HostService& host, bool json) {
     }
     output.flush();
     progress.show(std::to_string(step.folders) + " folders, " + std::to_string(step.items) +
-                  " items compared ...");
+                  " items compared" + verifiedText(step) + " ...");
     if (!step.finished) continue;
     progress.clear();
     tellNotes(host, output, json);
     if (json) {
-      output.write("{\"folders\":" + std::to_string(step.folders) +
-                   ",\"items\":" + std::to_string(step.items) +
+      output.write("{\"folders\":" + std::to_string(step.folders) + ",\"items\":" +
+                   std::to_string(step.items) + ",\"verified\":" + std::to_string(step.verified) +
+                   ",\"verifiedBytes\":" + std::to_string(step.verifiedBytes) +
                    ",\"differences\":" + std::to_string(found) + "}\n");
     } else {
       output.write(std::to_string(step.folders) + " folders, " + std::to_string(step.items) +
-                   " items: " + (found == 0 ? "no" : std::to_string(found)) +
+                   " items" + verifiedText(step) + ": " +
+                   (found == 0 ? "no" : std::to_string(found)) +
                    (found == 1 ? " difference\n" : " differences\n"));
     }
     return found == 0 ? kSuccess : kFailure;
@@ -214,14 +230,15 @@ void addStatusCommands(CLI::App& app, Invocation& invocation) {
   });
 
   auto* doctor = app.add_subcommand(
-      "doctor", "Compare the disk with the index and with what the extension lists");
-  doctor->add_flag("--json", *json, "One JSON object per line");
-  doctor->footer("Exit code 1 when there is a difference. Example: skein doctor");
-  doctor->callback([&invocation, json] {
-    invocation.run = [&invocation, json] {
-      return withSession(invocation, [&](HostService& host) { return runDoctor(host, *json); });
-    };
-  });
+      "doctor",
+      "Compare the disk with the index and with what the extension lists, and verify that what "
+      "is evicted can come back");
+  auto options = std::make_shared<DoctorOptions>();
+  doctor->add_flag("--json", options->json, "One JSON object per line");
+  doctor->add_flag("--quick", options->quick,
+                   "Look for the contents of what is evicted, and do not read them");
+  runs(doctor, invocation, "Exit code 1 when there is a difference. Example: skein doctor", options,
+       runDoctor);
 }
 
 }  // namespace skein::cli

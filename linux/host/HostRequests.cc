@@ -171,10 +171,28 @@ void HostRequests::setCloudConditions(LocalCloudConditions conditions, Reply<NSE
   });
 }
 
-void HostRequests::check(Reply<std::shared_ptr<HostCheck>, NSErrorPtr> reply) {
+void HostRequests::setCloudKeeping(LocalCloudKeeping keeping, Reply<NSErrorPtr> reply) {
+  auto timed = TimedReply<>::begin(_host->tools(), std::move(reply));
+  _daemon(failing(timed))->cloud().setKeeping(keeping, [timed](NSErrorPtr error) {
+    (*timed)(std::move(error));
+  });
+}
+
+void HostRequests::collectCloud(Reply<LocalCloudCollection, NSErrorPtr> reply) {
+  // Of the two, one is called.
+  const auto shared = std::make_shared<Reply<LocalCloudCollection, NSErrorPtr>>(std::move(reply));
+  _daemon([shared](NSErrorPtr error) { (*shared)({}, std::move(error)); })
+      ->cloud()
+      .collect([shared](LocalCloudCollection collection, NSErrorPtr error) {
+        (*shared)(collection, std::move(error));
+      });
+}
+
+void HostRequests::check(bool quick, Reply<std::shared_ptr<HostCheck>, NSErrorPtr> reply) {
   withDrive<std::shared_ptr<HostCheck>>(
-      std::move(reply), [self = shared_from_this()](Timed<std::shared_ptr<HostCheck>> timed) {
-        (*timed)(std::make_shared<StoreCheck>(self->_host, self->_daemon), nullptr);
+      std::move(reply),
+      [self = shared_from_this(), quick](Timed<std::shared_ptr<HostCheck>> timed) {
+        (*timed)(std::make_shared<StoreCheck>(self->_host, self->_daemon, quick), nullptr);
       });
 }
 

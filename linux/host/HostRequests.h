@@ -30,7 +30,10 @@ class HostRequests final : public HostService, public std::enable_shared_from_th
   void status(Reply<HostStatus, NSErrorPtr> reply) override;
   void cloudStatus(Reply<LocalCloudStatus, NSErrorPtr> reply) override;
   void setCloudConditions(LocalCloudConditions conditions, Reply<NSErrorPtr> reply) override;
-  void check(Reply<std::shared_ptr<HostCheck>, NSErrorPtr> reply) override;
+  void setCloudKeeping(LocalCloudKeeping keeping, Reply<NSErrorPtr> reply) override;
+  // Without a deadline of the host's: vald looks at the whole drive.
+  void collectCloud(Reply<LocalCloudCollection, NSErrorPtr> reply) override;
+  void check(bool quick, Reply<std::shared_ptr<HostCheck>, NSErrorPtr> reply) override;
   void setDebugLog(bool enabled, Reply<NSErrorPtr> reply) override;
   HostFiles& files() override { return *_files; }
   HostThumbnails& thumbnails() override { return _thumbnails; }

@@ -5,6 +5,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
 #include <iterator>
@@ -26,6 +27,9 @@ constexpr std::uint64_t kMostDifferences = 10'000;
 // the disk within this.
 constexpr int kMostLooks = 4;
 constexpr auto kBetweenLooks = 500ms;
+// How many markers vald is asked of at once, by their paths.
+constexpr std::size_t kMostMarkers = 200;
+constexpr std::size_t kMostMarkerBytes = std::size_t{64} << 10;
 
 struct DiskEntry {
   bool isFolder = false;
@@ -62,6 +66,15 @@ bool isNoDocument(const std::string& name) {
                        name.ends_with(".skein-old")));
 }
 
+bool isSetAside(const std::string& name) {
+  return name.starts_with('.') && name.ends_with(".skein-old");
+}
+
+// Whether vald is asked if it is a marker.
+bool mayBeMarker(const std::string& name) {
+  return name.starts_with('.') && name.ends_with(".skein");
+}
+
 // The marker that stands on disk for a document that is not present. A long name's is
 // shortened: then its first bytes tell it.
 DiskEntries::iterator markerOf(DiskEntries& onDisk, const std::string& name) {
@@ -96,9 +109,10 @@ class StoreCheck::Work final : public std::enable_shared_from_this<Work> {
  public:
   using StepReply = Reply<HostCheckStep, NSErrorPtr>;
 
-  Work(std::shared_ptr<FileProviderHost> host, DaemonProxies daemon)
+  Work(std::shared_ptr<FileProviderHost> host, DaemonProxies daemon, bool quick)
       : _host(std::move(host)),
         _daemon(std::move(daemon)),
+        _quick(quick),
         _queue("store-check", tools().executor) {
     _folders.push_back({NSFileProviderRootContainerItemIdentifier, "", "/"});
   }
@@ -117,6 +131,8 @@ class StoreCheck::Work final : public std::enable_shared_from_this<Work> {
       self->_queue.assumeCurrent();
       self->_stopped = true;
       self->_folders.clear();
+      self->_unlisted.clear();
+      self->_markers.clear();
     });
   }
 
@@ -131,6 +147,8 @@ class StoreCheck::Work final : public std::enable_shared_from_this<Work> {
     int number = 0;
     NSFileProviderItems items;
     std::shared_ptr<Listing> listing;
+    std::vector<std::string> markers;   // absolute paths
+    std::vector<std::string> unlisted;  // folders that are in no listing, such as the trash
   };
 
   const HostTools& tools() const { return _host->tools(); }
@@ -141,6 +159,14 @@ class StoreCheck::Work final : public std::enable_shared_from_this<Work> {
       answer({}, nullptr);
     } else if (!std::exchange(_askedDaemon, true)) {
       askDaemon();
+    } else if (!_markers.empty()) {
+      verify();
+    } else if (_folders.empty() && !_unlisted.empty()) {
+      _busy = true;
+      tools().executor->post([self = shared_from_this(), path = std::move(_unlisted.back())] {
+        self->lookIntoUnlisted(path);
+      });
+      _unlisted.pop_back();
     } else if (_folders.empty()) {
       HostCheckStep step;
       step.finished = true;
@@ -167,6 +193,8 @@ class StoreCheck::Work final : public std::enable_shared_from_this<Work> {
     }
     step.folders = _folderCount;
     step.items = _itemCount;
+    step.verified = _verified;
+    step.verifiedBytes = _verifiedBytes;
     auto reply = std::move(_waiting.front());
     _waiting.pop_front();
     reply(std::move(step), std::move(error));
@@ -193,6 +221,69 @@ class StoreCheck::Work final : public std::enable_shared_from_this<Work> {
                        }
                        self->answerLater(std::move(step), std::move(error));
                      });
+  }
+
+  void verify() SKEIN_REQUIRES(_queue) {
+    _busy = true;
+    const auto self = shared_from_this();
+    std::vector<std::string> asked;
+    std::size_t bytes = 0;
+    for (const std::string& marker : _markers) {
+      bytes += marker.size();
+      if (!asked.empty() && (asked.size() == kMostMarkers || bytes > kMostMarkerBytes)) break;
+      asked.push_back(marker);
+    }
+    _daemon([self](NSErrorPtr error) { self->answerLater({}, std::move(error)); })
+        ->cloud()
+        .verify(std::move(asked), _quick,
+                [self](LocalCloudVerification verification, NSErrorPtr error) {
+                  self->_queue.async([self, verification = std::move(verification), error] {
+                    self->_queue.assumeCurrent();
+                    self->didVerify(verification, error);
+                  });
+                });
+  }
+
+  void didVerify(const LocalCloudVerification& verification, const NSErrorPtr& error)
+      SKEIN_REQUIRES(_queue) {
+    // At least one, or this would never end.
+    const std::size_t done =
+        error ? 0 : std::clamp<std::size_t>(verification.done, 1, _markers.size());
+    _markers.erase(_markers.begin(), _markers.begin() + static_cast<std::ptrdiff_t>(done));
+    _verified += done;
+    _verifiedBytes += verification.bytes;
+    HostCheckStep step;
+    for (const LocalCloudFault& fault : verification.faults) {
+      step.differences.push_back({HostDifference::Kind::Contents, fault.path, fault.why});
+    }
+    answer(std::move(step), error);
+  }
+
+  void noteUnlisted(const std::vector<std::string>& markers,
+                    const std::vector<std::string>& folders) SKEIN_REQUIRES(_queue) {
+    if (_stopped) return;
+    _markers.insert(_markers.end(), markers.begin(), markers.end());
+    _unlisted.insert(_unlisted.end(), folders.begin(), folders.end());
+  }
+
+  void lookIntoUnlisted(const std::string& path) {
+    DiskEntries entries;
+    readFolder(path, entries);  // what cannot be read is in no index either
+    std::vector<std::string> markers;
+    std::vector<std::string> folders;
+    for (const auto& [name, entry] : entries) {
+      if (entry.isFolder) {
+        folders.push_back(joined(path, name));
+      } else if (mayBeMarker(name)) {
+        markers.push_back(joined(path, name));
+      }
+    }
+    _queue.async(
+        [self = shared_from_this(), markers = std::move(markers), folders = std::move(folders)] {
+          self->_queue.assumeCurrent();
+          self->noteUnlisted(markers, folders);
+          self->answer({}, nullptr);
+        });
   }
 
   void list(const std::shared_ptr<Look>& look) {
@@ -250,6 +341,15 @@ class StoreCheck::Work final : public std::enable_shared_from_this<Work> {
     DiskEntries onDisk;
     std::vector<HostDifference> differences;
     const int problem = readFolder(folder.diskPath, onDisk);
+    look->markers.clear();
+    look->unlisted.clear();
+    for (const auto& [name, entry] : onDisk) {
+      if (!entry.isFolder && mayBeMarker(name)) {
+        look->markers.push_back(joined(folder.diskPath, name));
+      } else if (entry.isFolder && isNoDocument(name)) {
+        look->unlisted.push_back(joined(folder.diskPath, name));
+      }
+    }
     if (problem != 0 && problem != EACCES) {
       differences.push_back({HostDifference::Kind::OnlyInListing, folder.drivePath,
                              std::string("the folder cannot be read: ") + std::strerror(problem)});
@@ -286,6 +386,12 @@ class StoreCheck::Work final : public std::enable_shared_from_this<Work> {
       onDisk.erase(entry);
     }
     for (const auto& [name, entry] : onDisk) {
+      if (isSetAside(name)) {
+        differences.push_back({HostDifference::Kind::MissingInListing,
+                               joined(folder.drivePath, name),
+                               "a document that an interrupted eviction set aside; get or evict "
+                               "the document, or rename this file to its name"});
+      }
       if (isNoDocument(name)) continue;
       differences.push_back({HostDifference::Kind::MissingInListing, joined(folder.drivePath, name),
                              "on disk, but not listed"});
@@ -319,6 +425,7 @@ class StoreCheck::Work final : public std::enable_shared_from_this<Work> {
       self->_queue.assumeCurrent();
       ++self->_folderCount;
       self->_itemCount += look->items.size();
+      self->noteUnlisted(look->markers, look->unlisted);
       if (!self->_stopped) {
         for (Folder& folder : subfolders) self->_folders.push_back(std::move(folder));
       }
@@ -330,6 +437,7 @@ class StoreCheck::Work final : public std::enable_shared_from_this<Work> {
 
   const std::shared_ptr<FileProviderHost> _host;
   const DaemonProxies _daemon;
+  const bool _quick;
   SerialQueue _queue;
   bool _askedDaemon SKEIN_GUARDED_BY(_queue) = false;
   bool _busy SKEIN_GUARDED_BY(_queue) = false;
@@ -339,10 +447,14 @@ class StoreCheck::Work final : public std::enable_shared_from_this<Work> {
   std::deque<StepReply> _waiting SKEIN_GUARDED_BY(_queue);
   std::uint64_t _folderCount SKEIN_GUARDED_BY(_queue) = 0;
   std::uint64_t _itemCount SKEIN_GUARDED_BY(_queue) = 0;
+  std::deque<std::string> _markers SKEIN_GUARDED_BY(_queue);  // still to be verified
+  std::vector<std::string> _unlisted SKEIN_GUARDED_BY(_queue);
+  std::uint64_t _verified SKEIN_GUARDED_BY(_queue) = 0;
+  std::uint64_t _verifiedBytes SKEIN_GUARDED_BY(_queue) = 0;
 };
 
-StoreCheck::StoreCheck(std::shared_ptr<FileProviderHost> host, DaemonProxies daemon)
-    : _work(std::make_shared<Work>(std::move(host), std::move(daemon))) {}
+StoreCheck::StoreCheck(std::shared_ptr<FileProviderHost> host, DaemonProxies daemon, bool quick)
+    : _work(std::make_shared<Work>(std::move(host), std::move(daemon), quick)) {}
 
 StoreCheck::~StoreCheck() { _work->stop(); }
 

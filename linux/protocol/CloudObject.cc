@@ -24,4 +24,35 @@ kj::Promise<void> CloudObject::cloudStatus(CloudStatusContext context) {
       });
 }
 
+kj::Promise<void> CloudObject::setKeeping(SetKeepingContext context) {
+  return answer(
+      _service, context,
+      [&](auto reply) {
+        cloud().setKeeping(codec::decode(context.getParams().getKeeping()), std::move(reply));
+      },
+      codec::encodeError);
+}
+
+kj::Promise<void> CloudObject::collect(CollectContext context) {
+  return answer(
+      _service, context, [&](auto reply) { cloud().collect(std::move(reply)); },
+      [](auto results, const LocalCloudCollection& collection, const NSErrorPtr& error) {
+        codec::encode(results.initCollection(), collection);
+        codec::setError(results, error);
+      });
+}
+
+kj::Promise<void> CloudObject::verify(VerifyContext context) {
+  return answer(
+      _service, context,
+      [&](auto reply) {
+        const auto params = context.getParams();
+        cloud().verify(codec::decode(params.getMarkers()), params.getQuick(), std::move(reply));
+      },
+      [](auto results, const LocalCloudVerification& verification, const NSErrorPtr& error) {
+        codec::encode(results.initVerification(), verification);
+        codec::setError(results, error);
+      });
+}
+
 }  // namespace skein

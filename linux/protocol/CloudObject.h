@@ -16,6 +16,9 @@ class CloudObject : public virtual wire::Cloud::Server {
 
   kj::Promise<void> setConditions(SetConditionsContext context) override;
   kj::Promise<void> cloudStatus(CloudStatusContext context) override;
+  kj::Promise<void> setKeeping(SetKeepingContext context) override;
+  kj::Promise<void> collect(CollectContext context) override;
+  kj::Promise<void> verify(VerifyContext context) override;
 
  private:
   LocalCloud& cloud() const { return _service->server->daemon->cloud(); }

@@ -33,6 +33,45 @@ class CloudProxy final : public LocalCloud {
         });
   }
 
+  void setKeeping(LocalCloudKeeping keeping, Reply<NSErrorPtr> reply) override {
+    _calls.call<wire::Cloud>(
+        [keeping](wire::Cloud::Client& cloud) {
+          auto request = cloud.setKeepingRequest();
+          codec::encode(request.initKeeping(), keeping);
+          return request.send();
+        },
+        errorReply(std::move(reply)));
+  }
+
+  void verify(std::vector<std::string> markers, bool quick,
+              Reply<LocalCloudVerification, NSErrorPtr> reply) override {
+    _calls.call<wire::Cloud>(
+        [markers = std::move(markers), quick](wire::Cloud::Client& cloud) {
+          auto request = cloud.verifyRequest();
+          codec::encode(request.initMarkers(static_cast<unsigned>(markers.size())), markers);
+          request.setQuick(quick);
+          return request.send();
+        },
+        [reply = std::move(reply)](const auto& results) mutable -> Task {
+          return [reply = std::move(reply), verification = codec::decode(results.getVerification()),
+                  error = codec::errorOf(results)]() mutable {
+            reply(std::move(verification), std::move(error));
+          };
+        },
+        Patience::WhilePeerLives);
+  }
+
+  void collect(Reply<LocalCloudCollection, NSErrorPtr> reply) override {
+    _calls.call<wire::Cloud>(
+        [](wire::Cloud::Client& cloud) { return cloud.collectRequest().send(); },
+        [reply = std::move(reply)](const auto& results) mutable -> Task {
+          return
+              [reply = std::move(reply), collection = codec::decode(results.getCollection()),
+               error = codec::errorOf(results)]() mutable { reply(collection, std::move(error)); };
+        },
+        Patience::WhilePeerLives);
+  }
+
  private:
   const DaemonCalls _calls;
 };

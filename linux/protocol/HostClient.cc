@@ -34,6 +34,8 @@ Task decodeStep(const auto& results, const SharedReply<HostCheckStep>& reply) {
   }
   step.folders = results.getFolders();
   step.items = results.getItems();
+  step.verified = results.getVerified();
+  step.verifiedBytes = results.getVerifiedBytes();
   step.finished = results.getFinished();
   return [reply, step = std::move(step), error = codec::errorOf(results)]() mutable {
     (*reply)(std::move(step), std::move(error));
@@ -177,9 +179,29 @@ class HostProxy final : public HostService, private HostCalls<wire::Host> {
         reply);
   }
 
-  void check(Reply<std::shared_ptr<HostCheck>, NSErrorPtr> reply) override {
+  void setCloudKeeping(LocalCloudKeeping keeping, Reply<NSErrorPtr> reply) override {
+    callForError(
+        [keeping](wire::Host::Client& host) {
+          auto request = host.setCloudKeepingRequest();
+          codec::encode(request.initKeeping(), keeping);
+          return request.send();
+        },
+        reply);
+  }
+
+  void collectCloud(Reply<LocalCloudCollection, NSErrorPtr> reply) override {
+    call<LocalCloudCollection>(
+        [](wire::Host::Client& host) { return host.collectCloudRequest().send(); },
+        [](auto& results) { return codec::decode(results.getCollection()); }, reply);
+  }
+
+  void check(bool quick, Reply<std::shared_ptr<HostCheck>, NSErrorPtr> reply) override {
     call<std::shared_ptr<HostCheck>>(
-        [](wire::Host::Client& host) { return host.checkRequest().send(); },
+        [quick](wire::Host::Client& host) {
+          auto request = host.checkRequest();
+          request.setQuick(quick);
+          return request.send();
+        },
         [socket = _socket](auto& results) -> std::shared_ptr<HostCheck> {
           if (!results.hasCheck()) return nullptr;
           return makeStream<HostCheckStep>(

@@ -76,7 +76,7 @@ void encode(wire::HostDifference::Builder builder, const HostDifference& differe
 }
 
 HostDifference decode(wire::HostDifference::Reader reader) {
-  return {enumerator(reader.getKind(), HostDifference::Kind::Listing), text(reader.getPath()),
+  return {enumerator(reader.getKind(), HostDifference::Kind::Contents), text(reader.getPath()),
           text(reader.getDetail())};
 }
 

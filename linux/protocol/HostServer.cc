@@ -65,6 +65,8 @@ class CheckObject final : public wire::Check::Server {
           }
           results.setFolders(step.folders);
           results.setItems(step.items);
+          results.setVerified(step.verified);
+          results.setVerifiedBytes(step.verifiedBytes);
           results.setFinished(step.finished);
           codec::setError(results, error);
         });
@@ -218,9 +220,30 @@ class HostObject final : public virtual wire::Host::Server,
         encodeError);
   }
 
+  kj::Promise<void> setCloudKeeping(SetCloudKeepingContext context) override {
+    return answerOnExecutor(
+        _peer, context,
+        [service = service(), keeping = codec::decode(context.getParams().getKeeping())](
+            auto reply) { service->setCloudKeeping(keeping, std::move(reply)); },
+        encodeError);
+  }
+
+  kj::Promise<void> collectCloud(CollectCloudContext context) override {
+    return answerOnExecutor(
+        _peer, context,
+        [service = service()](auto reply) { service->collectCloud(std::move(reply)); },
+        [](auto results, const LocalCloudCollection& collection, const NSErrorPtr& error) {
+          codec::encode(results.initCollection(), collection);
+          codec::setError(results, error);
+        });
+  }
+
   kj::Promise<void> check(CheckContext context) override {
     return answerOnExecutor(
-        _peer, context, [service = service()](auto reply) { service->check(std::move(reply)); },
+        _peer, context,
+        [service = service(), quick = context.getParams().getQuick()](auto reply) {
+          service->check(quick, std::move(reply));
+        },
         [peer = _peer](auto results, std::shared_ptr<HostCheck>& check, const NSErrorPtr& error) {
           if (check) results.setCheck(kj::heap<CheckObject>(peer, std::move(check)));
           codec::setError(results, error);

@@ -49,6 +49,7 @@ struct HostDifference {
     MissingInListing,  // on disk, not enumerated
     OnlyInListing,     // enumerated, not on disk
     Listing,           // the folder could not be listed, or an item is told wrongly
+    Contents,          // the evicted document cannot come back
   };
   Kind kind = Kind::MissingInIndex;
   std::string path;
@@ -60,6 +61,8 @@ struct HostCheckStep {
   std::vector<HostDifference> differences;
   std::uint64_t folders = 0;  // so far
   std::uint64_t items = 0;
+  std::uint64_t verified = 0;  // evicted documents, in the cloud
+  std::uint64_t verifiedBytes = 0;
   bool finished = false;
 };
 
@@ -92,7 +95,10 @@ class HostService {
   virtual void cloudStatus(Reply<LocalCloudStatus, NSErrorPtr> reply) = 0;
   // Errors as LocalCloud says.
   virtual void setCloudConditions(LocalCloudConditions conditions, Reply<NSErrorPtr> reply) = 0;
-  virtual void check(Reply<std::shared_ptr<HostCheck>, NSErrorPtr> reply) = 0;
+  virtual void setCloudKeeping(LocalCloudKeeping keeping, Reply<NSErrorPtr> reply) = 0;
+  virtual void collectCloud(Reply<LocalCloudCollection, NSErrorPtr> reply) = 0;
+  // `quick`: of evicted documents it only looks whether there are contents of their size.
+  virtual void check(bool quick, Reply<std::shared_ptr<HostCheck>, NSErrorPtr> reply) = 0;
   virtual void setDebugLog(bool enabled, Reply<NSErrorPtr> reply) = 0;
 
   // What changes documents. Lives as long as this.

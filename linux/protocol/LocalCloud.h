@@ -5,6 +5,7 @@
 #include <cstdint>
 #include <optional>
 #include <string>
+#include <vector>
 
 #include "base/UniqueFunction.h"
 #include "platform/foundation/NSError.h"
@@ -24,6 +25,44 @@ struct LocalCloudConditions {
   friend bool operator==(const LocalCloudConditions&, const LocalCloudConditions&) = default;
 };
 
+// How long old revisions and removed documents are kept, whichever ends first. What may be the
+// only copy of a document is kept for the whole time.
+struct LocalCloudKeeping {
+  static constexpr std::uint32_t kMostDays = 36500;
+
+  std::uint32_t days = 30;
+  std::uint32_t percent = 10;  // of the disk
+
+  friend bool operator==(const LocalCloudKeeping&, const LocalCloudKeeping&) = default;
+};
+
+// What a collection removed, and what is kept still.
+struct LocalCloudCollection {
+  std::uint64_t freedFiles = 0;
+  std::uint64_t freedBytes = 0;
+  std::uint64_t keptFiles = 0;
+  std::uint64_t keptBytes = 0;
+
+  friend bool operator==(const LocalCloudCollection&, const LocalCloudCollection&) = default;
+};
+
+// A document that cannot come back as it was, and why.
+struct LocalCloudFault {
+  std::string path;  // absolute, the document's own
+  std::string why;
+
+  friend bool operator==(const LocalCloudFault&, const LocalCloudFault&) = default;
+};
+
+// How far a verification came.
+struct LocalCloudVerification {
+  std::vector<LocalCloudFault> faults;
+  std::uint64_t done = 0;   // of the markers that were named, in their order
+  std::uint64_t bytes = 0;  // that were read
+
+  friend bool operator==(const LocalCloudVerification&, const LocalCloudVerification&) = default;
+};
+
 struct LocalCloudStatus {
   enum class Uploads : std::uint8_t {
     Off,        // nothing is uploaded
@@ -32,14 +71,19 @@ struct LocalCloudStatus {
     Unasked,    // nothing yet: nobody has agreed to it
   };
   Uploads uploads = Uploads::Bounded;
-  std::uint64_t uploadLimit = 0;    // bytes in the cloud; with Bounded alone
-  bool sharesBlocks = false;        // the file system keeps equal blocks once
-  std::uint64_t usedBytes = 0;      // in the cloud
-  std::uint64_t waiting = 0;        // documents whose upload is to come, or runs
-  std::uint64_t failed = 0;         // documents whose upload failed; tried again when they change
-  std::uint64_t leftOut = 0;        // documents that are not uploaded because of the limit
-  std::string lastFailure;          // why the latest of them failed; empty when none did
-  LocalCloudConditions conditions;  // in force
+  std::uint64_t uploadLimit = 0;  // bytes in the cloud; with Bounded alone
+  bool sharesBlocks = false;      // the file system keeps equal blocks once
+  std::uint64_t usedBytes = 0;    // in the cloud, of documents as they are
+  std::uint64_t waiting = 0;      // documents whose upload is to come, or runs
+  std::uint64_t failed = 0;       // documents whose upload failed; tried again when they change
+  std::uint64_t leftOut = 0;      // documents that are not uploaded because of the limit
+  std::string lastFailure;        // why the latest of them failed; empty when none did
+  LocalCloudKeeping keeping;
+  std::uint64_t keptLimit = 0;        // bytes that old revisions and removed documents may take
+  std::uint64_t keptFiles = 0;        // of them
+  std::uint64_t keptBytes = 0;        //
+  std::uint64_t onlyCopiesBytes = 0;  // of those, in what may be the only copy of a document
+  LocalCloudConditions conditions;    // in force
 
   friend bool operator==(const LocalCloudStatus&, const LocalCloudStatus&) = default;
 };
@@ -53,6 +97,17 @@ class LocalCloud {
   // fault injection allowed; else NSFeatureUnsupportedError.
   virtual void setConditions(LocalCloudConditions conditions, Reply<NSErrorPtr> reply) = 0;
   virtual void cloudStatus(Reply<LocalCloudStatus, NSErrorPtr> reply) = 0;
+  virtual void setKeeping(LocalCloudKeeping keeping, Reply<NSErrorPtr> reply) = 0;
+  // Looks whether evicted documents can come back: `markers` are the absolute paths of files
+  // that have a marker's name. Reads their contents and compares the hash, or, when it is to be
+  // quick, only looks whether contents of their size are there. Ends after some seconds, when at
+  // least one was looked at: then whoever asked asks for the rest. What is no marker, or went
+  // meanwhile, is no fault.
+  virtual void verify(std::vector<std::string> markers, bool quick,
+                      Reply<LocalCloudVerification, NSErrorPtr> reply) = 0;
+  // Removes what is not kept any longer. Takes as long as it takes: it looks at all of the
+  // drive. An error: nothing more was removed.
+  virtual void collect(Reply<LocalCloudCollection, NSErrorPtr> reply) = 0;
 };
 
 }  // namespace skein

@@ -27,9 +27,41 @@ struct CloudStatus {
   leftOut @6 :UInt64;
   lastFailure @7 :Data;
   conditions @8 :CloudConditions;
+  keeping @9 :CloudKeeping;
+  keptLimit @10 :UInt64;
+  keptFiles @11 :UInt64;
+  keptBytes @12 :UInt64;
+  onlyCopiesBytes @13 :UInt64;
+}
+
+struct CloudKeeping {
+  days @0 :UInt32;
+  percent @1 :UInt32;
+}
+
+struct CloudCollection {
+  freedFiles @0 :UInt64;
+  freedBytes @1 :UInt64;
+  keptFiles @2 :UInt64;
+  keptBytes @3 :UInt64;
+}
+
+struct CloudFault {
+  path @0 :Data;
+  why @1 :Data;
+}
+
+struct CloudVerification {
+  faults @0 :List(CloudFault);
+  done @1 :UInt64;
+  bytes @2 :UInt64;
 }
 
 interface Cloud {
   setConditions @0 (conditions :CloudConditions) -> (error :Types.Error);
   cloudStatus @1 () -> (status :CloudStatus, error :Types.Error);
+  setKeeping @2 (keeping :CloudKeeping) -> (error :Types.Error);
+  collect @3 () -> (collection :CloudCollection, error :Types.Error);
+  verify @4 (markers :List(Data), quick :Bool)
+      -> (verification :CloudVerification, error :Types.Error);
 }

@@ -49,11 +49,13 @@ interface Host extends(HostFiles.HostFiles, HostThumbnails.HostThumbnails) {
   logIn @7 (account :Daemon.Account) -> (error :Types.Error);
   logOut @8 () -> (error :Types.Error);
   status @9 () -> (status :HostStatus, error :Types.Error);
-  check @10 () -> (check :Check, error :Types.Error);
+  check @10 (quick :Bool) -> (check :Check, error :Types.Error);
   setDebugLog @11 (enabled :Bool) -> (error :Types.Error);
   services @12 () -> (services :Capability);  # Services of services.capnp
   cloudStatus @13 () -> (status :Cloud.CloudStatus, error :Types.Error);
   setCloudConditions @14 (conditions :Cloud.CloudConditions) -> (error :Types.Error);
+  setCloudKeeping @15 (keeping :Cloud.CloudKeeping) -> (error :Types.Error);
+  collectCloud @16 () -> (collection :Cloud.CloudCollection, error :Types.Error);
 }
 
 # Streams: each ends when its last reference goes. next may be called again before the
@@ -66,5 +68,5 @@ interface Watch {
 }
 interface Check {
   next @0 () -> (differences :List(HostDifference), folders :UInt64, items :UInt64,
-                 finished :Bool, error :Types.Error);
+                 finished :Bool, error :Types.Error, verified :UInt64, verifiedBytes :UInt64);
 }

@@ -9,11 +9,37 @@
 #include <algorithm>
 #include <utility>
 
+#include "linux/vald/cloud/CloudErrors.h"
 #include "linux/vald/cloud/CloudRecovery.h"
+#include "linux/vald/cloud/MarkerCheck.h"
 #include "linux/vald/files/FileErrors.h"
 #include "linux/vald/files/FileNames.h"
+#include "vellum/VLErrors.h"
 
 namespace skein::vald {
+namespace {
+
+// For how long markers are verified before it is said how far this came.
+constexpr std::chrono::seconds kVerifyStep{1};
+
+// Counts what is read.
+class CountedRead final : public StreamObserver {
+ public:
+  explicit CountedRead(const Cancellation& cancellation) : _cancellation(cancellation) {}
+  NSErrorPtr didPass(std::uint64_t bytes) override {
+    if (bytes == 0) _before = _total;
+    _total = _before + bytes;
+    return _cancellation.isCancelled() ? cancelledError() : nullptr;
+  }
+  std::uint64_t total() const { return _total; }
+
+ private:
+  const Cancellation& _cancellation;
+  std::uint64_t _before = 0;  // of earlier streams
+  std::uint64_t _total = 0;
+};
+
+}  // namespace
 
 Cloud::Cloud(Options options, FileOperations& operations, Log& log)
     : _options(std::move(options)),
@@ -21,7 +47,8 @@ Cloud::Cloud(Options options, FileOperations& operations, Log& log)
       _log(log),
       _uploadThreads(std::make_shared<ClosableExecutor>(_options.uploads.limit, "vald-upload")),
       _downloadThreads(std::make_shared<ClosableExecutor>(_options.downloads, "vald-download")),
-      _answers(std::make_shared<ClosableExecutor>(1, "vald-cloud")) {}
+      _answers(std::make_shared<ClosableExecutor>(1, "vald-cloud")),
+      _checks(std::make_shared<ClosableExecutor>(1, "vald-check")) {}
 
 std::unique_ptr<Cloud> Cloud::open(Options options, FileOperations& operations, Log& log,
                                    NSErrorOut error) {
@@ -148,6 +175,8 @@ void Cloud::stop() {
   }
   if (rounds) rounds->stop();
   if (feed) feed->stop();
+  _checksCancellation.cancel();
+  _checks->close();
   _answers->close();
   // While the executors run: both wait for what they have begun.
   _uploader.reset();
@@ -266,12 +295,64 @@ void Cloud::cloudStatus(Reply<LocalCloudStatus, NSErrorPtr> reply) {
       status.leftOut = asked->leftOut();
       status.lastFailure = asked->lastFailure();
     }
+    const auto keeping = _records->keeping();
+    const auto kept = _records->kept();
+    const auto rule = collectionRule();
+    if (!keeping || !kept || !rule) {
+      return reply({}, !keeping ? keeping.error() : !kept ? kept.error() : rule.error());
+    }
+    status.keeping = {keeping->days, keeping->percent};
+    status.keptLimit = rule->bytes;
+    status.keptFiles = kept->files;
+    status.keptBytes = kept->bytes;
+    status.onlyCopiesBytes = kept->givenUpBytes;
     const CloudConditions::Settings settings = _conditions.settings();
     status.conditions = {
         settings.offline,        settings.corrupt,
         settings.quota,          static_cast<std::uint32_t>(settings.delay.count()),
         settings.bytesPerSecond, settings.failures};
     reply(std::move(status), nullptr);
+  });
+}
+
+void Cloud::setKeeping(LocalCloudKeeping keeping, Reply<NSErrorPtr> reply) {
+  _answers->post([this, keeping, reply = std::move(reply)]() mutable {
+    if (keeping.days > LocalCloudKeeping::kMostDays) {
+      return reply(vlc_errorInvalidParameter("days", std::to_string(keeping.days)));
+    }
+    if (keeping.percent > 100) {
+      return reply(vlc_errorInvalidParameter("percent", std::to_string(keeping.percent)));
+    }
+    reply(_records->setKeeping({keeping.days, keeping.percent}));
+  });
+}
+
+void Cloud::collect(Reply<LocalCloudCollection, NSErrorPtr> reply) {
+  Reply<CloudCollector::Result, NSErrorPtr> collected =
+      [reply = std::move(reply)](CloudCollector::Result result, NSErrorPtr error) mutable {
+        reply({result.freed.files, result.freed.bytes, result.kept.files, result.kept.bytes},
+              std::move(error));
+      };
+  if (const auto asked = rounds(); asked && asked->collect(collected)) return;
+  _answers->post([collected = std::move(collected)]() mutable { collected({}, cancelledError()); });
+}
+
+void Cloud::verify(std::vector<std::string> markers, bool quick,
+                   Reply<LocalCloudVerification, NSErrorPtr> reply) {
+  _checks->post([this, markers = std::move(markers), quick, reply = std::move(reply)]() mutable {
+    LocalCloudVerification verification;
+    CountedRead read(_checksCancellation);
+    const auto end = std::chrono::steady_clock::now() + kVerifyStep;
+    for (const std::string& marker : markers) {
+      if (auto lost = checkMarker(places(), marker, quick, read)) {
+        verification.faults.push_back({std::move(lost->path), std::move(lost->why)});
+      }
+      ++verification.done;
+      if (std::chrono::steady_clock::now() >= end) break;
+    }
+    verification.bytes = read.total();
+    if (_checksCancellation.isCancelled()) return reply({}, cancelledError());
+    reply(std::move(verification), nullptr);
   });
 }
 

@@ -59,6 +59,10 @@ class Cloud final : public LocalCloud {
   // Answered on a thread of the cloud's.
   void setConditions(LocalCloudConditions conditions, Reply<NSErrorPtr> reply) override;
   void cloudStatus(Reply<LocalCloudStatus, NSErrorPtr> reply) override;
+  void setKeeping(LocalCloudKeeping keeping, Reply<NSErrorPtr> reply) override;
+  void collect(Reply<LocalCloudCollection, NSErrorPtr> reply) override SKEIN_EXCLUDES(_mutex);
+  void verify(std::vector<std::string> markers, bool quick,
+              Reply<LocalCloudVerification, NSErrorPtr> reply) override;
 
  private:
   Cloud(Options options, FileOperations& operations, Log& log);
@@ -84,6 +88,8 @@ class Cloud final : public LocalCloud {
   const std::shared_ptr<ClosableExecutor> _uploadThreads;
   const std::shared_ptr<ClosableExecutor> _downloadThreads;
   const std::shared_ptr<ClosableExecutor> _answers;
+  const std::shared_ptr<ClosableExecutor> _checks;
+  Cancellation _checksCancellation;
   std::unique_ptr<Downloader> _downloader;
   std::unique_ptr<Uploader> _uploader;
 

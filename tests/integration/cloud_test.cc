@@ -115,5 +115,88 @@ TEST_F(CloudTrial, AFullCloudIsToldOfAndUploadsGoOnWhenThereIsRoom) {
   EXPECT_NE(refused.errors.find("SKEIN_ALLOW_FAULTS=1"), std::string::npos) << refused.errors;
 }
 
+TEST_F(CloudTrial, OldRevisionsAndRemovedDocumentsAreKeptByARuleAndThenGo) {
+  // What the contents in the cloud take.
+  const auto room = [&] {
+    std::uintmax_t bytes = 0;
+    std::error_code failure;
+    const fs::path data = fs::path(drive.state()).parent_path() / "data/skein";
+    for (const auto& one : fs::directory_iterator(data, failure)) {
+      for (const auto& entry :
+           fs::recursive_directory_iterator(one.path() / "cloud/objects", failure)) {
+        if (entry.is_regular_file()) bytes += entry.file_size();
+      }
+    }
+    return bytes;
+  };
+  constexpr std::size_t kSize = 300'000;
+  for (const char* words : {"1", "2", "3"}) {
+    drive.write("/letter.txt", std::string(kSize, *words));
+    ASSERT_TRUE(comesTrue([&] { return room() == kSize * (*words - '0'); }));
+  }
+  EXPECT_EQ(cloud()["keptBytes"], 2 * kSize);
+  EXPECT_EQ(json({"cloud", "gc", "--json"})["freedFiles"], 0);
+  const std::string shown = drive.run({"cloud"}).output;
+  EXPECT_NE(shown.find("30 days"), std::string::npos) << shown;
+  EXPECT_NE(shown.find("10 % of the disk"), std::string::npos) << shown;
+
+  EXPECT_EQ(drive.run({"cloud", "keep"}).code, 2);
+  EXPECT_EQ(drive.run({"cloud", "keep", "--percent", "101"}).code, 2);
+  EXPECT_EQ(drive.run({"cloud", "keep", "--days", "0"}).code, 0);
+  EXPECT_EQ(cloud()["keepDays"], 0);
+  EXPECT_EQ(cloud()["keepPercent"], 10);
+  const Result freed = drive.run({"cloud", "gc"});
+  EXPECT_EQ(freed.output, "freed 2, 600.0 kB; kept 0, 0 bytes\n") << freed.errors;
+  EXPECT_EQ(room(), kSize);
+
+  // An evicted document's contents outlive a marker that is away for a while.
+  ASSERT_TRUE(isUploaded("/letter.txt"));
+  EXPECT_EQ(drive.run({"evict", "/letter.txt"}).code, 0);
+  const fs::path marker = fs::path(drive.store()) / ".letter.txt.skein";
+  const fs::path away = fs::path(drive.store()).parent_path() / "away";
+  fs::rename(marker, away);
+  ASSERT_TRUE(comesTrue([&] { return cloud()["onlyCopiesBytes"] == kSize; }));
+  EXPECT_EQ(json({"cloud", "gc", "--json"})["freedFiles"], 0);
+  fs::rename(away, marker);
+  ASSERT_TRUE(comesTrue([&] { return drive.run({"get", "/letter.txt"}).code == 0; }));
+  EXPECT_EQ(drive.run({"cat", "/letter.txt"}).output, std::string(kSize, '3'));
+}
+
+TEST_F(CloudTrial, DoctorNamesWhatCannotComeBack) {
+  drive.write("/letter.txt", "dear");
+  drive.write("/other.txt", "others");
+  fs::create_directory(drive.store() + "/folder");
+  drive.write("/folder/whole.txt", "whole");
+  for (const char* path : {"/letter.txt", "/other.txt", "/folder/whole.txt"}) {
+    ASSERT_TRUE(isUploaded(path));
+    EXPECT_EQ(drive.run({"evict", path}).code, 0);
+  }
+  EXPECT_EQ(drive.run({"trash", "/other.txt"}).code, 0);
+  const Result whole = drive.run({"doctor"});
+  EXPECT_EQ(whole.code, 0) << whole.output;
+  EXPECT_NE(whole.output.find("3 evicted looked at in the cloud (15 bytes read): no difference"),
+            std::string::npos)
+      << whole.output;
+
+  // All but the whole one are spoiled, with as many bytes as before.
+  const fs::path data = fs::path(drive.state()).parent_path() / "data/skein";
+  for (const auto& entry : fs::recursive_directory_iterator(data)) {
+    const bool isObject = entry.path().string().find("/cloud/objects/") != std::string::npos;
+    if (!isObject || !entry.is_regular_file() || entry.file_size() == 5) continue;
+    fs::permissions(entry.path(), fs::perms::owner_all);
+    std::ofstream(entry.path()) << std::string(entry.file_size(), 'x');
+  }
+  EXPECT_EQ(drive.run({"doctor", "--quick"}).code, 0);
+  std::ofstream(drive.store() + "/.left.txt.skein-old") << "set aside";
+  const Result spoiled = drive.run({"doctor"});
+  EXPECT_EQ(spoiled.code, 1);
+  for (const char* told :
+       {"cannot come back  ", "/letter.txt: its contents in the cloud are damaged",
+        "/other.txt: its contents in the cloud are damaged",
+        "/.left.txt.skein-old: ", "3 differences"}) {
+    EXPECT_NE(spoiled.output.find(told), std::string::npos) << told << " in " << spoiled.output;
+  }
+}
+
 }  // namespace
 }  // namespace skein

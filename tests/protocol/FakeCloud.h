@@ -2,7 +2,9 @@
 // told to.
 #pragma once
 
+#include <string>
 #include <utility>
+#include <vector>
 
 #include "linux/protocol/LocalCloud.h"
 
@@ -12,6 +14,7 @@ class FakeCloud final : public LocalCloud {
  public:
   // What is answered; set it before asking.
   LocalCloudStatus status;
+  LocalCloudCollection collection;
   NSErrorPtr error;
 
   void setConditions(LocalCloudConditions conditions, Reply<NSErrorPtr> reply) override {
@@ -19,6 +22,19 @@ class FakeCloud final : public LocalCloud {
     reply(error);
   }
   void cloudStatus(Reply<LocalCloudStatus, NSErrorPtr> reply) override { reply(status, error); }
+  void setKeeping(LocalCloudKeeping keeping, Reply<NSErrorPtr> reply) override {
+    status.keeping = keeping;
+    reply(error);
+  }
+  void verify(std::vector<std::string> markers, bool quick,
+              Reply<LocalCloudVerification, NSErrorPtr> reply) override {
+    LocalCloudVerification verification;
+    for (std::string& marker : markers) verification.faults.push_back({std::move(marker), "gone"});
+    verification.done = quick ? 1 : 2;
+    verification.bytes = ~0ULL;
+    reply(std::move(verification), error);
+  }
+  void collect(Reply<LocalCloudCollection, NSErrorPtr> reply) override { reply(collection, error); }
 };
 
 }  // namespace skein

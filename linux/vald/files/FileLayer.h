@@ -86,7 +86,8 @@ class FileLayer {
   int step(FileStep step, std::string_view name) { return beforeStep(step, name); }
 
  protected:
-  // 0 to go on, or the errno that the step fails with.
+  // 0 to go on, or the errno that the step fails with. The name is what the call names; for a
+  // sync it is the descriptorPath() of what waits for the disk.
   virtual int beforeStep(FileStep, std::string_view) { return 0; }
   // The system call that promises it.
   virtual int renameKeeping(int at, const std::string& name, int newAt, const std::string& newName);
