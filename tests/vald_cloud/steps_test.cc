@@ -123,7 +123,8 @@ TEST_F(StepsTest, WhatTheRecordsPromiseIsOnTheDiskWhenTheyAnswer) {
     EXPECT_FALSE(waits([&] { works(rig.records->setStamp(kDocument, std::nullopt)); }));
     EXPECT_TRUE(waits([&] { works(rig.records->setKeeping({1, 2})); }));
     EXPECT_FALSE(waits([&] { works(rig.records->setThumbnail(kDocument, contents.hash, "/t")); }));
-    EXPECT_TRUE(waits([&] { works(rig.records->addUnknown(contents, rig.clock.date())); }));
+    const ContentHash unknown({static_cast<std::uint8_t>(round)});
+    EXPECT_TRUE(waits([&] { works(rig.records->addUnknown({unknown, 1}, rig.clock.date())); }));
   }
   EXPECT_TRUE(waits([&] { works(rig.records->remove(kDocument)); }));
 }
