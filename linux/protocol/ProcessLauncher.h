@@ -4,6 +4,7 @@
 #include <string>
 #include <vector>
 
+#include "linux/protocol/Deadlines.h"
 #include "platform/foundation/NSError.h"
 
 namespace skein {
