@@ -317,7 +317,7 @@ TEST_F(HandMade, AnEndpointThatIsHandedOnReachesTheSameItemAlone) {
   ASSERT_TRUE(endpoint);
   const auto relay = SocketServer::listen(
       clientLoop, folder + "/relay",
-      [own = *endpoint]() -> capnp::Capability::Client { return *own; }, env.log, {}, nullptr);
+      [own = *endpoint](pid_t) -> capnp::Capability::Client { return *own; }, env.log, {}, nullptr);
   const std::shared_ptr<RpcLoop> otherLoop = RpcLoop::start("other-io");
   SocketClient other(otherLoop, clientPool,
                      {"relay", folder + "/relay", std::nullopt, std::chrono::seconds(20)});
