@@ -69,7 +69,7 @@ bool Files::recognize(Subject& subject, VLFileObjectID id) {
 }
 
 void Files::lookAgainAfter(const NSErrorPtr& error, const Subject& subject) {
-  if (isAnotherFileError(error)) _parts.store.catchUp(subject.place.path);
+  if (error && error->code() == NSFileNoSuchFileError) _parts.store.catchUp(subject.place.path);
 }
 
 FileRequest Files::request(const Subject& subject, RequestOrigin origin) const {
@@ -187,9 +187,11 @@ void Files::answerMove(URLReply& reply, const Subject& subject, RequestOrigin or
     waitForStore();
     if (!result.error) return reply(urlOf(places.back()), nullptr);
     // It was taken back.
+    lookAgainAfter(result.error, subject);
     _parts.store.lookAtPaths(places);
+  } else {
+    lookAgainAfter(result.error, subject);
   }
-  lookAgainAfter(result.error, subject);
   answerResult(reply, result, std::move(places));
 }
 
@@ -244,8 +246,8 @@ std::shared_ptr<NSProgress> Files::remove(NSURLPtr url, RequestOrigin origin,
       if (!result.path.empty()) {
         places.push_back(documentPath(&_parts.operations.roots(), result.path));
       }
-      _parts.store.lookAtPaths(places);
       lookAgainAfter(result.error, subject);
+      _parts.store.lookAtPaths(places);
     }
     answered(result.error);
     if (deletion) _parts.importExecutor->post(std::move(deletion));

@@ -109,7 +109,7 @@ class Files final : public LocalFiles {
   NSErrorPtr willLeave(const Subject& subject) const;
   // Whether the item is at the subject's place; then the subject is that item.
   bool recognize(Subject& subject, VLFileObjectID id);
-  // After an error: another file that came between is looked at.
+  // After an error, before anything else is looked at: what came between.
   void lookAgainAfter(const NSErrorPtr& error, const Subject& subject);
   FileRequest request(const Subject& subject, RequestOrigin origin) const;
   // Lets the store look, and answers with the path that people know.

@@ -486,11 +486,32 @@ Look StoreWriter::lookAtNames(const std::vector<Place>& places) {
   _disk.forget();
   begin();
   checkTrashes(true);
+  std::vector<std::pair<Look, FileState>> seen;
+  const auto lookAtAll = [&] {
+    _disk.forget();
+    seen.clear();
+    bool isReplaced = false;
+    for (const auto& [folder, name] : places) {
+      FileState state;
+      seen.emplace_back(_disk.at(folder, name, state), state);
+      isReplaced = isReplaced || (seen.back().first == Look::Seen &&
+                                  _reconciler.isReplacement(folder, name, state));
+    }
+    return isReplaced;
+  };
+  // Where another file has the name now, the watcher may tell where the old one is, without which
+  // that looks like a save: all of it is decided together.
+  if (lookAtAll()) {
+    _watcher.drain();
+    reconcileDirt(_watcher.take());
+    begin();
+    lookAtAll();
+  }
   Look look = Look::Gone;
-  for (const auto& [folder, name] : places) {
-    FileState state;
-    look = _disk.at(folder, name, state);
-    if (look == Look::Seen) _reconciler.addName(folder, name, state);
+  for (std::size_t at = 0; at < places.size(); ++at) {
+    const auto& [folder, name] = places[at];
+    look = seen[at].first;
+    if (look == Look::Seen) _reconciler.addName(folder, name, seen[at].second);
     if (look == Look::Gone) _reconciler.addName(folder, name, std::nullopt);
   }
   _reconciler.decide(false, [this](FolderKey folder) { return _watcher.isWatched(folder); });

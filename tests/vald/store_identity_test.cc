@@ -117,6 +117,26 @@ TEST_F(StoreIdentity, RenamedAwayAndANewFileUnderTheName) {
            "doc-2023.txt");
 }
 
+// As after an operation: what is seen of one name does not pass for the whole change.
+TEST_F(StoreIdentity, ALookAtOneNameOfSeveralThatChanged) {
+  for (const bool isBetween : {false, true}) {
+    TearDown();
+    SetUp();
+    write("a.txt", "a");
+    write("c.txt", "c");
+    open();
+    const std::string a = id("a.txt");
+    const std::string c = id("c.txt");
+    rename("a.txt", "b.txt");
+    if (isBetween) store->lookAtPaths({at("a.txt")});
+    rename("c.txt", "a.txt");
+    store->lookAtPaths({at("a.txt")});
+    settle();
+    EXPECT_EQ(id("b.txt"), a);
+    EXPECT_EQ(id("a.txt"), c);
+  }
+}
+
 TEST_F(StoreIdentity, OldDocumentsThatReplaceOrExchangeMove) {
   write("a.txt", "a");
   write("b.txt", "bb");

@@ -666,7 +666,7 @@ TEST(Operations, LeaveAnotherFileAloneThatTookTheName) {
       }
       const NSErrorPtr error = operations[i](*files, drive, request);
       EXPECT_EQ(codeOf(error), NSFileNoSuchFileError);
-      EXPECT_TRUE(isAnotherFileError(error));
+      EXPECT_EQ(posixOf(error), ESTALE);
       const bool isThird = when == Swap::AndTheNameIsTakenAgain;
       EXPECT_EQ(TestDrive::get(drive.at("b")), "meant");
       EXPECT_EQ(TestDrive::get(drive.at(isThird ? "a 2" : "a")), "other");

@@ -84,9 +84,4 @@ NSErrorPtr fileError(int number, const std::string& doing, const std::string& pa
                             path);
 }
 
-bool isAnotherFileError(const NSErrorPtr& error) {
-  const NSErrorPtr cause = error ? error->underlyingError() : nullptr;
-  return cause && cause->domain() == NSPOSIXErrorDomain && cause->code() == ESTALE;
-}
-
 }  // namespace skein::vald

@@ -27,9 +27,6 @@ NSErrorPtr fileError(int number, const std::string& doing, const std::string& pa
 NSErrorPtr fileErrorWithWords(std::int64_t cocoaCode, int posix, std::string words,
                               const std::string& path);
 
-// Whether `error` says, by ESTALE, that another file has the name than the one that was meant.
-bool isAnotherFileError(const NSErrorPtr& error);
-
 // A path for people: bytes that are no text, and control characters, as "?".
 std::string printable(const std::string& path);
 

@@ -95,6 +95,11 @@ void Reconciler::addName(FolderKey folder, const std::string& name,
   _selves.insert(folder);
 }
 
+bool Reconciler::isReplacement(FolderKey folder, const std::string& name, const FileState& state) {
+  if (const auto row = rowAt({folder, name})) return !row->state.key.names(state.key);
+  return _index.tombstoneAt(folder, name, _clock() - _grace).has_value();
+}
+
 bool Reconciler::differs(const ItemRow& row, const FileState& state) {
   return row.state.kind != state.kind || !row.state.key.names(state.key) ||
          (row.folder == kNoFolder && !row.state.looksLike(state));
@@ -409,6 +414,13 @@ bool Reconciler::handBack(const Place& place, const FileState& state,
   if (!tombstone || _index.rowWithID(tombstone->id)) return false;
   // What died there was another link to the mover's own file: nothing was saved.
   if (mover && tombstone->key.names(state.key)) return false;
+  // Nor when its file turned up elsewhere: it was renamed.
+  for (const Difference& other : _deciding) {
+    if (other.state.kind == ItemKind::Document && tombstone->key.names(other.state.key) &&
+        !tombstone->key.names(state.key) && !isBackupNameOf(other.place.name, place.name)) {
+      return false;
+    }
+  }
   // The very file of another document that died comes back as that one.
   for (const Tombstone& other : _index.tombstonesWithInode(state.key.inode)) {
     if (other.id != tombstone->id && other.kind == state.kind && other.key.names(state.key)) {

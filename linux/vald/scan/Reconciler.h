@@ -57,6 +57,8 @@ class Reconciler {
   bool addFolder(FolderKey folder, const FolderSnapshot& snapshot, bool isOld = false);
   // Gathers how one name differs. `state` nil: there is nothing.
   void addName(FolderKey folder, const std::string& name, const std::optional<FileState>& state);
+  // Whether the file at a name is another than the name's document has, or had until a moment ago.
+  bool isReplacement(FolderKey folder, const std::string& name, const FileState& state);
   // The folder's own dates, or its count of children, may have changed.
   void addSelf(FolderKey folder) { _selves.insert(folder); }
 
