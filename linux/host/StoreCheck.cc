@@ -10,10 +10,13 @@
 #include <cstring>
 #include <iterator>
 #include <map>
+#include <set>
+#include <string>
 #include <utility>
 
 #include "linux/protocol/AnswerRoom.h"
 #include "linux/protocol/FileDescriptor.h"
+#include "linux/protocol/LeftOutNote.h"
 #include "platform/fileprovider/NSFileProviderError.h"
 #include "vellum/VLQueryItem.h"
 
@@ -144,6 +147,7 @@ class StoreCheck::Work final : public std::enable_shared_from_this<Work> {
   };
   struct Look {
     Folder folder;
+    std::set<std::string> leftOut;  // folders that are no part of the drive, by their paths
     int number = 0;
     NSFileProviderItems items;
     std::shared_ptr<Listing> listing;
@@ -174,6 +178,7 @@ class StoreCheck::Work final : public std::enable_shared_from_this<Work> {
     } else {
       auto look = std::make_shared<Look>();
       look->folder = std::move(_folders.back());
+      look->leftOut = _leftOut;
       _folders.pop_back();
       _busy = true;
       tools().executor->post([self = shared_from_this(), look] { self->list(look); });
@@ -210,6 +215,22 @@ class StoreCheck::Work final : public std::enable_shared_from_this<Work> {
 
   void askDaemon() SKEIN_REQUIRES(_queue) {
     _busy = true;
+    const auto self = shared_from_this();
+    _daemon([self](NSErrorPtr error) {
+      self->answerLater({}, std::move(error));
+    })->status([self](const LocalDaemonStatus& status, NSErrorPtr error) {
+      if (error) return self->answerLater({}, std::move(error));
+      self->_queue.async([self, notes = status.notes] {
+        self->_queue.assumeCurrent();
+        for (const std::string& note : notes) {
+          if (auto path = pathLeftOut(note)) self->_leftOut.insert(std::move(*path));
+        }
+        self->checkIndex();
+      });
+    });
+  }
+
+  void checkIndex() SKEIN_REQUIRES(_queue) {
     const auto self = shared_from_this();
     _daemon([self](NSErrorPtr error) { self->answerLater({}, std::move(error)); })
         ->checkIndex(kMostDifferences,
@@ -341,6 +362,9 @@ class StoreCheck::Work final : public std::enable_shared_from_this<Work> {
     DiskEntries onDisk;
     std::vector<HostDifference> differences;
     const int problem = readFolder(folder.diskPath, onDisk);
+    std::erase_if(onDisk, [&](const auto& entry) {
+      return look->leftOut.contains(joined(folder.diskPath, entry.first));
+    });
     look->markers.clear();
     look->unlisted.clear();
     for (const auto& [name, entry] : onDisk) {
@@ -445,6 +469,7 @@ class StoreCheck::Work final : public std::enable_shared_from_this<Work> {
   std::vector<Folder> _folders SKEIN_GUARDED_BY(_queue);
   std::deque<HostDifference> _found SKEIN_GUARDED_BY(_queue);  // and not told of yet
   std::deque<StepReply> _waiting SKEIN_GUARDED_BY(_queue);
+  std::set<std::string> _leftOut SKEIN_GUARDED_BY(_queue);
   std::uint64_t _folderCount SKEIN_GUARDED_BY(_queue) = 0;
   std::uint64_t _itemCount SKEIN_GUARDED_BY(_queue) = 0;
   std::deque<std::string> _markers SKEIN_GUARDED_BY(_queue);  // still to be verified

@@ -44,12 +44,16 @@ kj::Promise<void> BoundedMessageStream::whenPeerReads() {
 }
 
 void BoundedMessageStream::wroteSome() {
-  KJ_IF_MAYBE (waiting, _peerReads) {
-    if (_network->getCurrentQueueSize() > _limits.unreadBytes) return;
-    auto fulfiller = kj::mv(*waiting);
-    _peerReads = nullptr;
-    fulfiller->fulfill();
-  }
+  if (_peerReads == nullptr) return;
+  // Last: the library takes what was written off its queue only after this call.
+  _look = kj::evalLast([this] {
+            KJ_IF_MAYBE (waiting, _peerReads) {
+              if (_network->getCurrentQueueSize() > _limits.unreadBytes) return;
+              auto fulfiller = kj::mv(*waiting);
+              _peerReads = nullptr;
+              fulfiller->fulfill();
+            }
+          }).eagerlyEvaluate(nullptr);
 }
 
 void BoundedMessageStream::count(capnp::MessageReader& message) {

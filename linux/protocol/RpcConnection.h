@@ -85,6 +85,7 @@ class BoundedMessageStream final : public capnp::MessageStream {
   kj::Maybe<kj::Own<kj::PromiseFulfiller<void>>> _peerReads;
   kj::Own<kj::PromiseFulfiller<void>> _endFulfiller;
   kj::ForkedPromise<void> _end;
+  kj::Promise<void> _look = nullptr;  // at what is still unread
 };
 
 // A connected socket with the RPC system on it. Lives on the loop's thread. Its end

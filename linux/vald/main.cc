@@ -19,6 +19,7 @@
 #include "linux/desktop/DesktopEntries.h"
 #include "linux/protocol/DaemonServer.h"
 #include "linux/protocol/DrivePaths.h"
+#include "linux/protocol/LeftOutNote.h"
 #include "linux/protocol/LogFile.h"
 #include "linux/protocol/RpcLoop.h"
 #include "linux/protocol/RunLock.h"
@@ -138,7 +139,7 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
   setOwnFolders(ownFolders);
   std::vector<std::string> notes;
   for (const std::string& folder : foldersBelow(paths.store, ownFolders)) {
-    notes.push_back("left out, as this system keeps its own files there: " + folder);
+    notes.push_back(noteOfLeftOut(folder));
   }
   const auto executor = std::make_shared<ClosableExecutor>(kWorkers, "vald");
   const auto slowExecutor = std::make_shared<ClosableExecutor>(1, "vald-slow");

@@ -119,6 +119,8 @@ TEST_F(ListingTest, RequestsAboveTheMostWaitTheirTurnAndExpireThere) {
   EXPECT_EQ(heard, Words{}) << "nobody wants the work any more";
   const auto fifth = begin("5");
   EXPECT_EQ(heard, (Words{"5"}));
+  (*fifth)(nullptr);
+  run();
 }
 
 TEST_F(ListingTest, OpeningIsTimedAndItsErrorToldAsItIs) {

@@ -168,7 +168,7 @@ TEST_F(HostTest, TheWatchSurvivesADaemonThatDies) {
   // It dies again before that is complete: the listing's anchor is of no use.
   enumerator(1).givePage({item(2, "two")}, "p2");
   EXPECT_EQ(calls(), (Words{"list p2"}));
-  timers->advance(std::chrono::milliseconds(4500));
+  timers->advance(deadlines::kPage);
   EXPECT_EQ(calls(), (Words{"invalidate"}));
   timers->advance(std::chrono::milliseconds(400));
   EXPECT_EQ(calls(), (Words{"open i1", "anchor", "list start"}));
@@ -268,7 +268,7 @@ TEST_F(HostTest, LogoutAndDeletionEndTheWatch) {
 TEST_F(HostTest, ALostAnswerFailsTheFirstWatchAndIsIgnoredWhenItComesLate) {
   const auto subscription = host->watch("i1", watcher);
   run();
-  timers->advance(std::chrono::milliseconds(4499));
+  timers->advance(deadlines::kPage - std::chrono::milliseconds(1));
   run();
   EXPECT_EQ(watcher->take(), Words{});
   timers->advance(std::chrono::milliseconds(1));

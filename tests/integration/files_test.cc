@@ -36,7 +36,7 @@ class Files : public testing::Test {
   }
   Json stat(const std::string& path) {
     const Result result = drive.run({"stat", "--json", path});
-    return result.code == 0 ? Json::parse(result.output) : Json();
+    return result.code == 0 ? Json::parse(result.output) : Json::object();
   }
   std::string id(const std::string& path) { return stat(path).value("id", ""); }
   // For what vald does by itself some time later. Each look is a program of its own.

@@ -74,6 +74,18 @@ class NoRecords final : public LocalRecords {
   std::shared_ptr<NSProgress> fetchRecords(RecordQuery, RecordsReply) override { return nullptr; }
 };
 
+// The daemon's calls may wait for the store, which answers at once here.
+class DaemonExecutor final : public Executor {
+ public:
+  explicit DaemonExecutor(std::shared_ptr<Executor> executor) : _executor(std::move(executor)) {}
+  void post(Task task) override { _executor->post(std::move(task)); }
+  void beginWait() override {}
+  void endWait() override {}
+
+ private:
+  const std::shared_ptr<Executor> _executor;
+};
+
 class TestDaemon {
  public:
   explicit TestDaemon(SenderLimits limits = {}, FakeStore::Settings settings = {})
@@ -90,9 +102,10 @@ class TestDaemon {
     shareRecords = std::move(*ShareRecords::open(state.path + "/shares.sqlite"));
     shares = std::make_shared<Shares>(SharesParts{executor, *store, *shareRecords, sharedItems,
                                                   *accounts, *containers, log, drive.path});
-    daemon = std::make_shared<Daemon>(
-        DaemonParts{executor, executor, *store, senders, *accounts, *containers, subscribers, files,
-                    records, *shares, cloud, faults, log, drive.path, [this] { ++stops; }});
+    daemon = std::make_shared<Daemon>(DaemonParts{std::make_shared<DaemonExecutor>(executor),
+                                                  executor, *store, senders, *accounts, *containers,
+                                                  subscribers, files, records, *shares, cloud,
+                                                  faults, log, drive.path, [this] { ++stops; }});
   }
 
   // Makes the call that `request(daemon, reply)` makes, and runs everything; the test

@@ -28,7 +28,9 @@ constexpr char kTables[] = R"(
   CREATE INDEX IF NOT EXISTS operationDocument ON operation(document) WHERE document <> '';
   CREATE INDEX IF NOT EXISTS operationOpen ON operation(state) WHERE state = 0;
 )";
-constexpr char kColumns[] = "id, kind, state, time, origin, document, path, destination, aside";
+#define SKEIN_COLUMNS "kind, state, time, origin, document, path, destination, aside"
+constexpr char kInsert[] =
+    "INSERT INTO operation(" SKEIN_COLUMNS ") VALUES(?, 0, ?, ?, ?, ?, ?, ?)";
 constexpr std::int64_t kPruneEvery = 256;
 constexpr off_t kReserve = off_t{2} << 20;
 // For some entries with long paths, and what the index notes of what went.
@@ -129,11 +131,9 @@ std::unique_ptr<OperationJournal> OperationJournal::open(const std::string& data
   if (code == SQLITE_OK && version != kVersion) {
     code = journal->run("PRAGMA user_version = " + std::to_string(kVersion));
   }
-  const std::string insert =
-      std::string("INSERT INTO operation(") + (kColumns + 4) + ") VALUES(?, 0, ?, ?, ?, ?, ?, ?)";
   if (code == SQLITE_OK) code = journal->prepare("BEGIN IMMEDIATE", journal->_beginTransaction);
   if (code == SQLITE_OK) code = journal->prepare("COMMIT", journal->_commit);
-  if (code == SQLITE_OK) code = journal->prepare(insert, journal->_insert);
+  if (code == SQLITE_OK) code = journal->prepare(kInsert, journal->_insert);
   if (code == SQLITE_OK) {
     code = journal->prepare("UPDATE operation SET state = ?1 WHERE id = ?2", journal->_setState);
   }
@@ -286,7 +286,7 @@ std::vector<OperationEntry> OperationJournal::select(const std::string& conditio
                                                      NSErrorOut error) {
   MutexLock lock(_mutex);
   writeEnds();
-  const std::string sql = std::string("SELECT ") + kColumns + " FROM operation WHERE " + condition;
+  const std::string sql = "SELECT id, " SKEIN_COLUMNS " FROM operation WHERE " + condition;
   sqlite3_stmt* statement = nullptr;
   int code = sqlite3_prepare_v2(_database, sql.c_str(), -1, &statement, nullptr);
   std::vector<OperationEntry> entries;
