@@ -36,6 +36,7 @@ void Reconciler::forget() {
   _newFolders.clear();
   _removedFolders.clear();
   _deciding.clear();
+  _decidingByInode.clear();
   _departures.clear();
 }
 
@@ -133,6 +134,10 @@ void Reconciler::decide(bool inRound, const IsFollowed& isFollowed) {
 void Reconciler::decideOnce(bool inRound) {
   _disk.forget();
   _deciding = std::exchange(_appeared, {});
+  _decidingByInode.clear();
+  for (std::size_t at = 0; at < _deciding.size(); ++at) {
+    _decidingByInode.emplace(_deciding[at].state.key.inode, at);
+  }
   // Folders first: the ways to everything else lead through them.
   for (const Difference& difference : _deciding) {
     if (difference.state.kind == ItemKind::Folder) appeared(difference);
@@ -150,6 +155,7 @@ void Reconciler::decideOnce(bool inRound) {
     if (difference.state.kind != ItemKind::Folder) appeared(difference);
   }
   _deciding.clear();
+  _decidingByInode.clear();
   const auto losses = std::exchange(_vanished, {});
   for (const ItemRow& row : losses) {
     if (inRound) {
@@ -158,6 +164,18 @@ void Reconciler::decideOnce(bool inRound) {
       vanished(row);
     }
   }
+}
+
+const Reconciler::Difference* Reconciler::appearedDocument(const FileKey& file) const {
+  std::size_t first = _deciding.size();
+  const auto [begin, end] = _decidingByInode.equal_range(file.inode);
+  for (auto one = begin; one != end; ++one) {
+    const FileState& state = _deciding[one->second].state;
+    if (state.kind == ItemKind::Document && file.names(state.key)) {
+      first = std::min(first, one->second);
+    }
+  }
+  return first < _deciding.size() ? &_deciding[first] : nullptr;
 }
 
 void Reconciler::endRound() {
@@ -218,12 +236,9 @@ void Reconciler::replaced(const Difference& difference) {
   }
 
   // Where the old file went decides whether this was a save.
-  const auto whereItWent =
-      std::find_if(_deciding.begin(), _deciding.end(), [&](const Difference& other) {
-        return other.state.kind == ItemKind::Document && old->state.key.names(other.state.key);
-      });
+  const Difference* const whereItWent = appearedDocument(old->state.key);
   const bool livesElsewhere =
-      whereItWent != _deciding.end() && !isBackupNameOf(whereItWent->place.name, place.name);
+      whereItWent != nullptr && !isBackupNameOf(whereItWent->place.name, place.name);
   if (const std::optional<ItemRow> mover = moverTo(place, state)) {
     const Place from{mover->parent, mover->name};
     FileState there;
@@ -415,11 +430,9 @@ bool Reconciler::handBack(const Place& place, const FileState& state,
   // What died there was another link to the mover's own file: nothing was saved.
   if (mover && tombstone->key.names(state.key)) return false;
   // Nor when its file turned up elsewhere: it was renamed.
-  for (const Difference& other : _deciding) {
-    if (other.state.kind == ItemKind::Document && tombstone->key.names(other.state.key) &&
-        !tombstone->key.names(state.key) && !isBackupNameOf(other.place.name, place.name)) {
-      return false;
-    }
+  if (!tombstone->key.names(state.key)) {
+    const Difference* const other = appearedDocument(tombstone->key);
+    if (other != nullptr && !isBackupNameOf(other->place.name, place.name)) return false;
   }
   // The very file of another document that died comes back as that one.
   for (const Tombstone& other : _index.tombstonesWithInode(state.key.inode)) {

@@ -95,6 +95,8 @@ class Reconciler {
   enum class Whereabouts : std::uint8_t { StillThere, Gone, Displaced, Unknown };
 
   void decideOnce(bool inRound);
+  // Of what appeared, the first document that is this file; null: none is.
+  const Difference* appearedDocument(const FileKey& file) const;
   // Whether the item's file is another, or looks otherwise. A folder's dates are its own matter.
   static bool differs(const ItemRow& row, const FileState& state);
   void compare(const ItemRow& row, const FileState& state);
@@ -129,6 +131,7 @@ class Reconciler {
 
   std::vector<Difference> _appeared;
   std::vector<Difference> _deciding;  // what appeared, of the decisions under way
+  std::unordered_multimap<std::uint64_t, std::size_t> _decidingByInode;  // indices of these
   std::vector<Difference> _replaced;
   std::vector<ItemRow> _vanished;
   std::vector<ItemRow> _vanishedInRound;
