@@ -1,13 +1,16 @@
 #include "linux/vald/MovedDrive.h"
 
+#include <fcntl.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <cerrno>
+#include <climits>
 #include <filesystem>
 #include <fstream>
-#include <iterator>
 #include <memory>
 
+#include "linux/protocol/FileDescriptor.h"
 #include "linux/vald/files/FileErrors.h"
 #include "linux/vald/files/FileNames.h"
 #include "linux/vald/index/Sqlite.h"
@@ -49,13 +52,28 @@ NSErrorPtr move(const std::string& file, const Statements& statements, const std
                                "The paths in " + file + " can't be moved along: " + message + ".");
 }
 
+// A small file's text; empty when there is none. 0 or an errno. Whatever has the name, a pipe's
+// other end is not waited for.
+int readNote(const std::string& path, std::string& text) {
+  const FileDescriptor file(open(path.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
+  if (!file) return errno == ENOENT ? 0 : errno;
+  struct stat status {};
+  if (fstat(file.get(), &status) != 0) return errno;
+  if (!S_ISREG(status.st_mode)) return EINVAL;
+  text.resize(PATH_MAX);
+  const ssize_t length = read(file.get(), text.data(), text.size());
+  if (length < 0) return errno;
+  text.resize(static_cast<std::size_t>(length));
+  return 0;
+}
+
 }  // namespace
 
 NSErrorPtr followMovedDrive(const std::string& stateDirectory, const std::string& cloudDirectory,
                             const std::string& store) {
   const std::string note = joinPath(stateDirectory, "served");
-  std::ifstream noted(note, std::ios::binary);
-  const std::string from{std::istreambuf_iterator<char>(noted), {}};
+  std::string from;
+  if (const int failure = readNote(note, from)) return fileError(failure, "can't read", note);
   if (from == store) return nullptr;
   if (!from.empty()) {
     NSErrorPtr error = move(joinPath(stateDirectory, "operations.db"), kJournal, from, store);

@@ -134,8 +134,9 @@ TEST_F(CloudTrial, OldRevisionsAndRemovedDocumentsAreKeptByARuleAndThenGo) {
   for (const char* words : {"1", "2", "3"}) {
     drive.write("/letter.txt", std::string(kSize, *words));
     ASSERT_TRUE(comesTrue([&] { return room() == kSize * (*words - '0'); }));
+    ASSERT_TRUE(comesTrue([&] { return cloud()["keptBytes"] == kSize * (*words - '1'); }));
+    ASSERT_TRUE(isUploaded("/letter.txt"));
   }
-  EXPECT_TRUE(comesTrue([&] { return cloud()["keptBytes"] == 2 * kSize; }));
   EXPECT_EQ(json({"cloud", "gc", "--json"})["freedFiles"], 0);
   const std::string shown = drive.run({"cloud"}).output;
   EXPECT_NE(shown.find("30 days"), std::string::npos) << shown;

@@ -37,7 +37,7 @@ NSErrorPtr CloudPlaces::refusalOf(const EvictionMarker& marker, const std::strin
   return fileErrorWithWords(NSFileReadCorruptFileError, 0,
                             "the marker of \"" + printable(path) +
                                 "\" was not made by this drive's cloud, or was changed since; "
-                                "remove it, or get the document where it comes from",
+                                "keep it: the drive that made it can bring the document back",
                             path);
 }
 

@@ -11,6 +11,7 @@
 #include "linux/vald/files/DocumentHint.h"
 #include "linux/vald/files/FileErrors.h"
 #include "linux/vald/files/FileNames.h"
+#include "linux/vald/files/OwnFolders.h"
 #include "linux/vald/files/TrashInfo.h"
 
 namespace skein::vald {
@@ -134,6 +135,13 @@ NSErrorPtr FileOperations::take(const std::string& path, std::vector<std::string
   if (trashed && trashed->name.empty()) {
     return fileErrorWithWords(NSFileWriteNoPermissionError, EACCES,
                               "\"" + printable(path) + "\" belongs to the trash itself", path);
+  }
+  if (holdsOwnFolder(place.path())) {
+    return fileErrorWithWords(NSFileWriteNoPermissionError, EACCES,
+                              "\"" + printable(path) +
+                                  "\" holds this system's own files, such as the contents of "
+                                  "evicted documents, so it stays where it is",
+                              path);
   }
   struct stat status {};
   if (const int failure = place.folder.status(place.name, status)) {

@@ -21,6 +21,9 @@ inline bool isOwnFolder(const struct stat& status) {
   return S_ISDIR(status.st_mode) && isOwnFolder(status.st_dev, status.st_ino);
 }
 
+// Whether one of them is this folder or lies below it: then it must stay where it is.
+bool holdsOwnFolder(const std::string& path);
+
 // Those of `paths` that lie below the folder `top`, as they are called there.
 std::vector<std::string> foldersBelow(const std::string& top,
                                       const std::vector<std::string>& paths);

@@ -429,15 +429,15 @@ bool Reconciler::handBack(const Place& place, const FileState& state,
   if (!tombstone || _index.rowWithID(tombstone->id)) return false;
   // What died there was another link to the mover's own file: nothing was saved.
   if (mover && tombstone->key.names(state.key)) return false;
-  // Nor when its file turned up elsewhere: it was renamed.
   if (!tombstone->key.names(state.key)) {
+    // Nor when its file turned up elsewhere: it was renamed.
     const Difference* const other = appearedDocument(tombstone->key);
     if (other != nullptr && !isBackupNameOf(other->place.name, place.name)) return false;
-  }
-  // The very file of another document that died comes back as that one.
-  for (const Tombstone& other : _index.tombstonesWithInode(state.key.inode)) {
-    if (other.id != tombstone->id && other.kind == state.kind && other.key.names(state.key)) {
-      return false;
+    // The very file of another document that died comes back as that one.
+    for (const Tombstone& dead : _index.tombstonesWithInode(state.key.inode)) {
+      if (dead.id != tombstone->id && dead.kind == state.kind && dead.key.names(state.key)) {
+        return false;
+      }
     }
   }
   if (mover) _journal.bury(*mover, _now);
