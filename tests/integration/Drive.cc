@@ -165,7 +165,7 @@ void Drive::write(const std::string& path, const std::string& contents) const {
 }
 
 std::unique_ptr<Process> Drive::start(const Arguments& arguments) const {
-  return std::make_unique<Process>(std::string(SKEIN_BIN_DIR) + "/skein", arguments, _environment);
+  return std::make_unique<Process>(SKEIN_BIN_DIR "/skein", arguments, _environment);
 }
 
 Result Drive::finish(Process& process) {

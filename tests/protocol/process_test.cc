@@ -215,7 +215,8 @@ TEST_F(Processes, PathProblemsNameTheirCause) {
 TEST_F(Processes, SocketsMayHaveLongPaths) {
   std::string deep = folder;
   while (deep.size() < 300) {
-    deep += '/' + std::string(60, 'd');
+    deep += '/';
+    deep.append(60, 'd');
     mkdir(deep.c_str(), 0700);
   }
   const std::string path = deep + "/vald.socket";

@@ -299,8 +299,10 @@ TEST(Import, RefusesWhatIsBeingWritten) {
   };
   const NSErrorPtr disturbed = import(request);
   // A copy by reference is whole before anybody can come.
-  if (disturbed) EXPECT_EQ(posixOf(disturbed), ETXTBSY);
-  if (disturbed) EXPECT_EQ(import(kRequest), nullptr);
+  if (disturbed) {
+    EXPECT_EQ(posixOf(disturbed), ETXTBSY);
+    EXPECT_EQ(import(kRequest), nullptr);
+  }
 }
 
 // An access list: "system.posix_acl_access" of what a named user, and not the group, may read.
@@ -670,7 +672,9 @@ TEST(Operations, LeaveAnotherFileAloneThatTookTheName) {
       const bool isThird = when == Swap::AndTheNameIsTakenAgain;
       EXPECT_EQ(TestDrive::get(drive.at("b")), "meant");
       EXPECT_EQ(TestDrive::get(drive.at(isThird ? "a 2" : "a")), "other");
-      if (isThird) EXPECT_EQ(TestDrive::get(drive.at("a")), "third");
+      if (isThird) {
+        EXPECT_EQ(TestDrive::get(drive.at("a")), "third");
+      }
       std::size_t all = 0;
       for (const auto& entry : std::filesystem::recursive_directory_iterator(drive.store)) {
         all += entry.is_directory() ? 0 : 1;

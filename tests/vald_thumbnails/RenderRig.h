@@ -17,7 +17,7 @@ namespace skein::vald {
 
 inline RenderWorker::Options workerOptions() {
   RenderWorker::Options options;
-  options.program = std::string(SKEIN_BIN_DIR) + "/skein-thumbnailer";
+  options.program = SKEIN_BIN_DIR "/skein-thumbnailer";
   options.keepsStandardError = true;           // a sanitizer's report is to be seen
   options.patience = std::chrono::minutes(2);  // tests may run on a busy machine
   return options;
@@ -33,8 +33,9 @@ inline std::string failureOf(const NSErrorPtr& error) {
   return error == nullptr ? "none" : error->domain() + " " + std::to_string(error->code());
 }
 inline std::string failureText(RenderFailure failure) {
-  return std::string(SkeinRenderErrorDomain) + " " +
-         std::to_string(static_cast<std::int64_t>(failure));
+  std::string text = SkeinRenderErrorDomain;
+  text += ' ';
+  return text + std::to_string(static_cast<std::int64_t>(failure));
 }
 
 struct RenderRig {
