@@ -18,6 +18,12 @@ constexpr std::uint64_t kMostHistory = 1000;
 constexpr auto kSameRemoval = std::chrono::minutes(1);
 constexpr char kByAnother[] = "another program";
 
+// Each folder above is asked for, so a path that is far deeper than any item's is not.
+bool mayHaveHistory(const std::string& path) {
+  return !path.empty() &&
+         static_cast<std::size_t>(std::count(path.begin(), path.end(), '/')) <= 2 * kDeepestTree;
+}
+
 std::size_t bytesOf(const FileHistoryEntry& entry) {
   return entry.origin.size() + entry.identifier.size() + entry.path.size() +
          entry.destination.size();
@@ -182,7 +188,7 @@ std::vector<FileHistoryEntry> Files::historyOf(const std::string& path,
     entries.insert(entries.end(), std::make_move_iterator(more.begin()),
                    std::make_move_iterator(more.end()));
   };
-  if (!path.empty()) {
+  if (mayHaveHistory(path)) {
     add(journal.historyOfPath(path, limit, error));
     const std::string marker = MarkerNames(nameOfPath(path)).marker;
     add(journal.historyOfPath(joinPath(parentOfPath(path), marker), limit, error));
@@ -234,7 +240,7 @@ void Files::history(std::string path, std::string identifier, std::uint64_t limi
     NSErrorPtr error;
     std::vector<FileHistoryEntry> entries = historyOf(path, identifier, most, &error);
     if (error) return answerError(answered, error);
-    if (!path.empty()) addRemovalsByOthers(path, most, entries);
+    if (mayHaveHistory(path)) addRemovalsByOthers(path, most, entries);
     AnswerRoom room(kAnswerBytes);
     std::size_t count = 0;
     while (count < std::min(entries.size(), most) && room.take(bytesOf(entries[count]))) ++count;
