@@ -26,7 +26,7 @@ bool writeAll(int to, const char* bytes, std::size_t length) {
   return true;
 }
 
-NSErrorPtr failure(const std::string& what) {
+NSErrorPtr spoolFailure(const std::string& what) {
   const int code = errno;
   return vl_errorWithPOSIXCode(code, what + ": " + std::strerror(code));
 }
@@ -37,10 +37,10 @@ NSErrorPtr copyInput(int to, const std::string& path) {
     if (!waitForInput()) return interruptedError();
     const ssize_t got = read(STDIN_FILENO, buffer.data(), buffer.size());
     if (got < 0 && errno == EINTR) continue;
-    if (got < 0) return failure("standard input cannot be read");
+    if (got < 0) return spoolFailure("standard input cannot be read");
     if (got == 0) return nullptr;
     if (!writeAll(to, buffer.data(), static_cast<std::size_t>(got))) {
-      return failure(path + " cannot be written; name a folder with more room in TMPDIR");
+      return spoolFailure(path + " cannot be written; name a folder with more room in TMPDIR");
     }
   }
 }
@@ -64,13 +64,13 @@ std::unique_ptr<SpooledInput> SpooledInput::read(const std::string& name, NSErro
   std::string folder = std::string(parent != nullptr && *parent == '/' ? parent : "/var/tmp") +
                        "/skein-input-XXXXXX";
   if (mkdtemp(folder.data()) == nullptr) {
-    error.store(failure(folder + " cannot be made; name another folder in TMPDIR"));
+    error.store(spoolFailure(folder + " cannot be made; name another folder in TMPDIR"));
     return nullptr;
   }
   const std::string path = folder + '/' + name;
   std::unique_ptr<SpooledInput> spooled(new SpooledInput(folder, path));
   const FileDescriptor file(open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0600));
-  NSErrorPtr problem = file ? copyInput(file.get(), path) : failure(path + " cannot be made");
+  NSErrorPtr problem = file ? copyInput(file.get(), path) : spoolFailure(path + " cannot be made");
   if (!problem) return spooled;
   error.store(std::move(problem));
   return nullptr;

@@ -21,7 +21,7 @@ struct RemoveOptions : ItemOptions {
   bool force = false;
 };
 
-NSErrorPtr failure(std::string text, std::int64_t code = NSFileWriteUnknownError) {
+NSErrorPtr trashFailure(std::string text, std::int64_t code = NSFileWriteUnknownError) {
   return NSError::errorWithDomain(NSCocoaErrorDomain, code,
                                   {{NSLocalizedDescriptionKey, std::move(text)}});
 }
@@ -98,14 +98,14 @@ std::pair<std::string, NSErrorPtr> identifierInTrash(const std::vector<HostTrash
     });
   }
   if (found.empty()) {
-    return {"", failure("it is not in the trash; see what is with: skein trash list",
-                        NSFileNoSuchFileError)};
+    return {"", trashFailure("it is not in the trash; see what is with: skein trash list",
+                             NSFileNoSuchFileError)};
   }
   if (found.size() == 1) return {found.front()->item.item->itemIdentifier(), nullptr};
   std::string candidates;
   for (const HostTrashedItem* trashed : found) candidates += "\n  " + lineOf(*trashed);
-  return {"",
-          failure(std::to_string(found.size()) +
+  return {"", trashFailure(
+                  std::to_string(found.size()) +
                   " items in the trash have that name; name one by its identifier:" + candidates)};
 }
 
@@ -158,11 +158,11 @@ int runRemove(HostService& host, const RemoveOptions& options) {
     auto [named, error] = namedItem(host, item);
     const bool isFolder = !named.isAlias && named.found.item && named.found.item->isFolder();
     if (!error && isFolder && !options.folders) {
-      error = failure("it is a folder; remove it and all that is in it with: skein rm -r");
+      error = trashFailure("it is a folder; remove it and all that is in it with: skein rm -r");
     }
     if (!error && !options.force && !isWanted(item)) {
-      error =
-          interruption() != 0 ? interruptedError() : failure("it was not removed; nobody said yes");
+      error = interruption() != 0 ? interruptedError()
+                                  : trashFailure("it was not removed; nobody said yes");
     }
     if (!error) error = removeOne(host, item);
     report.ended(item, error);

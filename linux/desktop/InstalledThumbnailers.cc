@@ -12,7 +12,7 @@ namespace {
 
 namespace fs = std::filesystem;
 
-constexpr char kGroup[] = "Thumbnailer Entry";
+constexpr char kThumbnailerGroup[] = "Thumbnailer Entry";
 
 using KeyFile = std::unique_ptr<GKeyFile, decltype(&g_key_file_unref)>;
 using Text = std::unique_ptr<char, decltype(&g_free)>;
@@ -27,10 +27,12 @@ std::vector<std::string> typesOf(const fs::path& entry) {
   std::vector<std::string> types;
   const KeyFile file(g_key_file_new(), g_key_file_unref);
   if (!g_key_file_load_from_file(file.get(), entry.c_str(), G_KEY_FILE_NONE, nullptr)) return types;
-  const Text program(g_key_file_get_string(file.get(), kGroup, "TryExec", nullptr), g_free);
+  const Text program(g_key_file_get_string(file.get(), kThumbnailerGroup, "TryExec", nullptr),
+                     g_free);
   if (program && !isThere(program.get())) return types;
-  const Texts names(g_key_file_get_string_list(file.get(), kGroup, "MimeType", nullptr, nullptr),
-                    g_strfreev);
+  const Texts names(
+      g_key_file_get_string_list(file.get(), kThumbnailerGroup, "MimeType", nullptr, nullptr),
+      g_strfreev);
   if (!names) return types;
   for (char** name = names.get(); *name != nullptr; ++name) types.emplace_back(*name);
   return types;

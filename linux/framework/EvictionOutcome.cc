@@ -5,18 +5,18 @@
 namespace skein {
 namespace {
 
-thread_local EvictionOutcomeScope* scopeOfThread = nullptr;
+thread_local EvictionOutcomeScope* evictionOfThread = nullptr;
 
 }  // namespace
 
-EvictionOutcomeScope::EvictionOutcomeScope() : _outer(std::exchange(scopeOfThread, this)) {}
+EvictionOutcomeScope::EvictionOutcomeScope() : _outer(std::exchange(evictionOfThread, this)) {}
 
-EvictionOutcomeScope::~EvictionOutcomeScope() { scopeOfThread = _outer; }
+EvictionOutcomeScope::~EvictionOutcomeScope() { evictionOfThread = _outer; }
 
 void EvictionOutcomeScope::note(NSErrorPtr error) {
-  if (scopeOfThread == nullptr) return;
-  scopeOfThread->_wasAsked = true;
-  scopeOfThread->_error = std::move(error);
+  if (evictionOfThread == nullptr) return;
+  evictionOfThread->_wasAsked = true;
+  evictionOfThread->_error = std::move(error);
 }
 
 }  // namespace skein

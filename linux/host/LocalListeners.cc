@@ -9,7 +9,7 @@
 namespace skein {
 namespace {
 
-std::atomic<std::size_t> livingCount{0};
+std::atomic<std::size_t> livingListenerCount{0};
 
 class LocalListener;
 
@@ -26,9 +26,9 @@ class LocalListener final : public NSXPCListener,
                             public std::enable_shared_from_this<LocalListener> {
  public:
   explicit LocalListener(std::shared_ptr<Executor> executor) : _executor(std::move(executor)) {
-    ++livingCount;
+    ++livingListenerCount;
   }
-  ~LocalListener() override { --livingCount; }
+  ~LocalListener() override { --livingListenerCount; }
 
   void setDelegate(std::weak_ptr<NSXPCListenerDelegate> delegate) override SKEIN_EXCLUDES(_mutex) {
     MutexLock lock(_mutex);
@@ -83,7 +83,7 @@ std::shared_ptr<NSXPCListener> LocalListeners::anonymousListener() {
   return std::make_shared<LocalListener>(_executor);
 }
 
-std::size_t LocalListeners::livingListeners() { return livingCount; }
+std::size_t LocalListeners::livingListeners() { return livingListenerCount; }
 std::size_t LocalListeners::livingConnections() { return LocalConnection::living(); }
 
 std::shared_ptr<ServiceEndpoint> serviceEndpoint(

@@ -6,7 +6,7 @@
 namespace skein {
 namespace {
 
-constexpr std::chrono::milliseconds kBetweenLooks{100};
+constexpr std::chrono::milliseconds kBetweenPolls{100};
 
 class TransferStream final : public HostTransfer {
  public:
@@ -70,7 +70,7 @@ HostTransferStep Transfer::measured() const {
 
 void Transfer::lookLater() {
   if (std::exchange(_timed, true)) return;
-  _timers->after(kBetweenLooks, [self = shared_from_this()] {
+  _timers->after(kBetweenPolls, [self = shared_from_this()] {
     self->_queue.async([self] {
       self->_queue.assumeCurrent();
       self->_timed = false;

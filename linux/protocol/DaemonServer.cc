@@ -21,7 +21,6 @@ namespace {
 // What one connection may have and one call may ask for.
 constexpr std::size_t kMostSenders = 2048;
 constexpr std::size_t kMostSubscriptions = 16;
-constexpr std::uint64_t kLongestPage = 1000;
 constexpr std::uint64_t kMostDifferences = 10'000;
 
 void encodePage(auto results, const NSFileProviderItems& items, std::uint64_t nextOffset,
@@ -59,7 +58,7 @@ class DaemonObject : public wire::Daemon::Server,
         _service, context,
         [&](auto reply) {
           daemon().enumerateItemsInFolder(folder, params.getSortOrder(), params.getOffset(),
-                                          std::min(params.getLimit(), kLongestPage),
+                                          std::min(params.getLimit(), DaemonService::kLongestPage),
                                           std::move(reply));
         },
         [](auto results, const auto& items, std::uint64_t nextOffset, const NSErrorPtr& error) {
@@ -72,9 +71,9 @@ class DaemonObject : public wire::Daemon::Server,
     return answer(
         _service, context,
         [&](auto reply) {
-          daemon().enumerateAllFoldersWithSortOrder(params.getSortOrder(), params.getOffset(),
-                                                    std::min(params.getLimit(), kLongestPage),
-                                                    std::move(reply));
+          daemon().enumerateAllFoldersWithSortOrder(
+              params.getSortOrder(), params.getOffset(),
+              std::min(params.getLimit(), DaemonService::kLongestPage), std::move(reply));
         },
         [](auto results, const auto& items, std::uint64_t nextOffset, const NSErrorPtr& error) {
           encodePage(results, items, nextOffset, error);
@@ -102,7 +101,8 @@ class DaemonObject : public wire::Daemon::Server,
         _service, context,
         [&](auto reply) {
           daemon().enumerateWorkingSetChangesFromChangeToken(
-              std::move(token), std::min(params.getLimit(), kLongestPage), std::move(reply));
+              std::move(token), std::min(params.getLimit(), DaemonService::kLongestPage),
+              std::move(reply));
         },
         [](auto results, const NSFileProviderItems& updates,
            const std::vector<VLFileObjectID>& deletions, const std::optional<NSData>& newToken,

@@ -5,6 +5,7 @@
 #include <kj/async.h>
 
 #include <cstddef>
+#include <cstdint>
 #include <functional>
 #include <memory>
 
@@ -48,6 +49,8 @@ struct ServedDaemon final : private kj::TaskSet::ErrorHandler {
 // What the objects of one connection share. Its fields are used on the loop's thread.
 struct DaemonService {
   static constexpr std::size_t kMostUnanswered = 4096;
+  // Items, changes or entries that one call may ask for.
+  static constexpr std::uint64_t kLongestPage = 1000;
 
   const std::shared_ptr<RpcLoop> loop;
   const std::shared_ptr<Executor> executor;

@@ -36,11 +36,7 @@ constexpr std::size_t kDigits = 32;
 constexpr char kRecordName[] = "/folder";
 // Who holds the list of drives only reads and writes a few small files.
 constexpr std::chrono::milliseconds kPatience{3000};
-constexpr std::chrono::milliseconds kBetweenTries{5};
-
-NSErrorPtr failure(int code, const std::string& what) {
-  return vl_errorWithPOSIXCode(code, what + ": " + std::strerror(code) + ".");
-}
+constexpr std::chrono::milliseconds kBetweenListTries{5};
 
 bool isThere(const std::string& path) {
   struct stat status {};
@@ -147,7 +143,7 @@ std::optional<Record> readRecord(const std::string& state) {
 NSErrorPtr writeRecord(const std::string& state, const Record& record) {
   const std::string path = state + kRecordName;
   const std::string partial = path + ".new";
-  const auto failed = [&] { return failure(errno, "The note " + path + " cannot be written"); };
+  const auto failed = [&] { return pathFailure(errno, "The note " + path + " cannot be written"); };
   FileDescriptor file(
       open(partial.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC | O_NOFOLLOW, 0600));
   if (!file) return failed();
@@ -203,17 +199,17 @@ NSErrorPtr olderVersionRuns(const std::string& path, const std::string& name) {
 NSErrorPtr lockDrives(const std::string& stateTop, FileDescriptor& file) {
   const std::string path = stateTop + "/drives.lock";
   file = FileDescriptor(open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600));
-  if (!file) return failure(errno, "The lock file " + path + " cannot be used");
+  if (!file) return pathFailure(errno, "The lock file " + path + " cannot be used");
   const auto deadline = std::chrono::steady_clock::now() + kPatience;
   while (flock(file.get(), LOCK_EX | LOCK_NB) != 0) {
     if (errno != EWOULDBLOCK && errno != EINTR) {
-      return failure(errno, "The lock file " + path + " cannot be used");
+      return pathFailure(errno, "The lock file " + path + " cannot be used");
     }
     if (std::chrono::steady_clock::now() >= deadline) {
       return vl_errorWithPOSIXCode(
           EBUSY, "Another process holds " + path + "; find it with \"fuser\" and let it end.");
     }
-    std::this_thread::sleep_for(kBetweenTries);
+    std::this_thread::sleep_for(kBetweenListTries);
   }
   return nullptr;
 }
@@ -257,7 +253,7 @@ class Finder {
     const std::string state = stateOf(identity.name);
     identity.isNew = !isThere(state + kRecordName) && !isThere(state + "/index.sqlite");
     if (mkdir(state.c_str(), 0700) != 0 && errno != EEXIST) {
-      return failure(errno, "The folder " + state + " cannot be made");
+      return pathFailure(errno, "The folder " + state + " cannot be made");
     }
     if (identity.isNew) {
       if (NSErrorPtr error = setUploadConsent(state, UploadConsent::Unasked)) return error;
@@ -276,8 +272,8 @@ class Finder {
     int code = 0;
     const std::string other = attributeOf(record->path, code);
     if (code != 0 && code != ENOENT && code != ENOTDIR) {
-      return failure(code, "The folder " + _path + " has the identity of the drive " +
-                               record->path + ", which cannot be looked at");
+      return pathFailure(code, "The folder " + _path + " has the identity of the drive " +
+                                   record->path + ", which cannot be looked at");
     }
     if (other == identity.name) {
       const auto otherKey = keyOf(record->path);
@@ -311,7 +307,7 @@ class Finder {
     for (const std::string& top : {_dataTop, _stateTop}) {
       const std::string from = top + '/' + byPath;
       if (rename(from.c_str(), (top + '/' + name).c_str()) != 0 && errno != ENOENT) {
-        return failure(errno, "The drive's folder " + from + " cannot be renamed to " + name);
+        return pathFailure(errno, "The drive's folder " + from + " cannot be renamed to " + name);
       }
     }
     return nullptr;
@@ -325,6 +321,10 @@ class Finder {
 
 }  // namespace
 
+NSErrorPtr pathFailure(int code, const std::string& what) {
+  return vl_errorWithPOSIXCode(code, what + ": " + std::strerror(code) + ".");
+}
+
 DriveIdentity identityOfDrive(const std::string& path, const std::string& stateTop,
                               const std::string& dataTop, NSErrorOut error) {
   DriveIdentity identity;
@@ -333,7 +333,8 @@ DriveIdentity identityOfDrive(const std::string& path, const std::string& stateT
     return DriveIdentity{};
   };
   const auto key = keyOf(path);
-  if (!key) return failed(failure(errno, "The drive's folder " + path + " cannot be looked at"));
+  if (!key)
+    return failed(pathFailure(errno, "The drive's folder " + path + " cannot be looked at"));
   Finder finder(path, *key, stateTop, dataTop);
   if (finder.isSettled(identity)) return identity;
   FileDescriptor lock;

@@ -26,6 +26,10 @@ struct DriveIdentity {
   bool isNew = false;  // nothing was known of the drive, and now it is
 };
 
+// "`what`: the text of errno `code`.", in NSPOSIXErrorDomain: a folder of the drive or of its
+// processes could not be used.
+NSErrorPtr pathFailure(int code, const std::string& what);
+
 // Finds the identity of the folder `path` (absolute, links resolved, there), and gives it one
 // when it has none. `stateTop` and `dataTop` are the folders that hold each drive's folders of
 // that name; `stateTop` is there. When it returns, the drive's state folder is there and notes

@@ -16,10 +16,6 @@
 namespace skein {
 namespace {
 
-NSErrorPtr failure(int code, const std::string& what) {
-  return vl_errorWithPOSIXCode(code, what + ": " + std::strerror(code) + ".");
-}
-
 // The variable's value when it is an absolute path; others are to be ignored.
 std::string folderFromEnvironment(const char* variable) {
   const char* value = std::getenv(variable);
@@ -46,7 +42,7 @@ bool isFolder(const std::string& path) {
 
 NSErrorPtr makeFolder(const std::string& path, mode_t mode) {
   if (mkdir(path.c_str(), mode) == 0 || errno == EEXIST) return nullptr;
-  return failure(errno, "The folder " + path + " cannot be made");
+  return pathFailure(errno, "The folder " + path + " cannot be made");
 }
 
 NSErrorPtr makeFoldersAbove(const std::string& path) {
@@ -65,15 +61,15 @@ NSErrorPtr makePrivateFolder(const std::string& path) {
   if (NSErrorPtr error = makeFoldersAbove(path)) return error;
   if (NSErrorPtr error = makeFolder(path, 0700)) return error;
   struct stat status {};
-  if (lstat(path.c_str(), &status) != 0) return failure(errno, path + " cannot be looked at");
-  if (!S_ISDIR(status.st_mode)) return failure(ENOTDIR, path + " has to be a folder");
+  if (lstat(path.c_str(), &status) != 0) return pathFailure(errno, path + " cannot be looked at");
+  if (!S_ISDIR(status.st_mode)) return pathFailure(ENOTDIR, path + " has to be a folder");
   if (status.st_uid != geteuid()) {
-    return failure(EACCES, path + " belongs to another user (number " +
-                               std::to_string(status.st_uid) + "); set XDG_STATE_HOME and " +
-                               "XDG_DATA_HOME to folders of your own");
+    return pathFailure(EACCES, path + " belongs to another user (number " +
+                                   std::to_string(status.st_uid) + "); set XDG_STATE_HOME and " +
+                                   "XDG_DATA_HOME to folders of your own");
   }
   if ((status.st_mode & 077) != 0 && chmod(path.c_str(), 0700) != 0) {
-    return failure(errno, path + " cannot be closed to other users");
+    return pathFailure(errno, path + " cannot be closed to other users");
   }
   return nullptr;
 }
@@ -86,10 +82,10 @@ NSErrorPtr resolveStore(const std::string& store, std::string& resolved) {
   const std::unique_ptr<char, decltype(&std::free)> real(realpath(store.c_str(), nullptr),
                                                          &std::free);
   if (real == nullptr) {
-    return failure(errno, "The drive's folder " + store + " cannot be opened");
+    return pathFailure(errno, "The drive's folder " + store + " cannot be opened");
   }
   if (!isFolder(real.get())) {
-    return failure(ENOTDIR, "The drive " + store + " has to be a folder");
+    return pathFailure(ENOTDIR, "The drive " + store + " has to be a folder");
   }
   resolved = real.get();
   return nullptr;

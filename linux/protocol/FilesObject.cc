@@ -14,7 +14,6 @@ namespace {
 // What one connection may have and one call may ask for.
 // Each keeps a call open, and these count against what a peer may leave unanswered.
 constexpr std::size_t kMostTransfers = 256;
-constexpr std::uint64_t kLongestPage = 1000;
 
 constexpr auto encodeURL = [](auto results, const NSURLPtr& url, const NSErrorPtr& error) {
   if (url) results.setUrl(codec::bytes(url->path()));
@@ -22,7 +21,7 @@ constexpr auto encodeURL = [](auto results, const NSURLPtr& url, const NSErrorPt
 };
 
 // All of `values`, into a list as long as that.
-void encodeAll(auto list, const auto& values) {
+void encodeList(auto list, const auto& values) {
   unsigned at = 0;
   for (const auto& value : values) codec::encode(list[at++], value);
 }
@@ -196,7 +195,7 @@ kj::Promise<void> FilesObject::tagsInUse(TagsInUseContext context) {
         files().tagsInUse(codec::text(context.getParams().getAfter()), std::move(reply));
       },
       [](auto results, const std::vector<TagUse>& tags, const NSErrorPtr& error) {
-        encodeAll(results.initTags(static_cast<unsigned>(tags.size())), tags);
+        encodeList(results.initTags(static_cast<unsigned>(tags.size())), tags);
         codec::setError(results, error);
       });
 }
@@ -231,12 +230,13 @@ kj::Promise<void> FilesObject::trashedItems(TrashedItemsContext context) {
   return answer(
       _service, context,
       [&](auto reply) {
-        files().trashedItems(params.getOffset(), std::min(params.getLimit(), kLongestPage),
+        files().trashedItems(params.getOffset(),
+                             std::min(params.getLimit(), DaemonService::kLongestPage),
                              std::move(reply));
       },
       [](auto results, const std::vector<TrashedItem>& items, std::uint64_t nextOffset,
          const NSErrorPtr& error) {
-        encodeAll(results.initItems(static_cast<unsigned>(items.size())), items);
+        encodeList(results.initItems(static_cast<unsigned>(items.size())), items);
         results.setNextOffset(nextOffset);
         codec::setError(results, error);
       });
@@ -248,10 +248,10 @@ kj::Promise<void> FilesObject::history(HistoryContext context) {
       _service, context,
       [&](auto reply) {
         files().history(codec::text(params.getPath()), codec::text(params.getIdentifier()),
-                        std::min(params.getLimit(), kLongestPage), std::move(reply));
+                        std::min(params.getLimit(), DaemonService::kLongestPage), std::move(reply));
       },
       [](auto results, const std::vector<FileHistoryEntry>& entries, const NSErrorPtr& error) {
-        encodeAll(results.initEntries(static_cast<unsigned>(entries.size())), entries);
+        encodeList(results.initEntries(static_cast<unsigned>(entries.size())), entries);
         codec::setError(results, error);
       });
 }

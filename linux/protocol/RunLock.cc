@@ -14,7 +14,7 @@
 namespace skein {
 namespace {
 
-constexpr std::chrono::milliseconds kBetweenTries{50};
+constexpr std::chrono::milliseconds kBetweenLockTries{50};
 // How long one that was told to stop may go on accepting.
 constexpr std::chrono::milliseconds kLastAccepted{500};
 
@@ -41,7 +41,7 @@ RunLock::Outcome RunLock::take(const std::string& path, const std::string& socke
     if (waited >= patience || (waited >= kLastAccepted && somebodyAccepts(socketPath))) {
       return Outcome::AlreadyRunning;
     }
-    std::this_thread::sleep_for(kBetweenTries);
+    std::this_thread::sleep_for(kBetweenLockTries);
   }
   writeProcessID();
   return Outcome::Taken;

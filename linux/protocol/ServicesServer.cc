@@ -55,12 +55,13 @@ void requireRoom(const ServicePeerPtr& peer) {
 
 using codec::encodeError;
 
-constexpr auto encodeShare = [](auto results, const CKSharePtr& share, const NSErrorPtr& error) {
+constexpr auto encodeClientShare = [](auto results, const CKSharePtr& share,
+                                      const NSErrorPtr& error) {
   if (share) codec::encodeForClient(results.initShare(), *share);
   codec::setError(results, error);
 };
 
-constexpr auto encodeURL = [](auto results, const NSURLPtr& url, const NSErrorPtr& error) {
+constexpr auto encodeAddress = [](auto results, const NSURLPtr& url, const NSErrorPtr& error) {
   if (url) results.setUrl(codec::bytes(codec::address(url)));
   codec::setError(results, error);
 };
@@ -231,7 +232,7 @@ class SharingObject final : public ConnectionObject<wire::Sharing::Server, VLSha
         [](auto& service, auto reply) {
           return service.fetchShareWithCompletion(std::move(reply));
         },
-        encodeShare);
+        encodeClientShare);
   }
 
   kj::Promise<void> fetchShareURL(FetchShareURLContext context) override {
@@ -240,7 +241,7 @@ class SharingObject final : public ConnectionObject<wire::Sharing::Server, VLSha
         [](auto& service, auto reply) {
           return service.fetchShareURLWithCompletion(std::move(reply));
         },
-        encodeURL);
+        encodeAddress);
   }
 
   kj::Promise<void> saveShare(SaveShareContext context) override {
@@ -252,7 +253,7 @@ class SharingObject final : public ConnectionObject<wire::Sharing::Server, VLSha
         [share = std::move(share)](auto& service, auto reply) {
           return service.saveShare(share, std::move(reply));
         },
-        encodeShare);
+        encodeClientShare);
   }
 
   kj::Promise<void> unshare(UnshareContext context) override {
@@ -347,7 +348,7 @@ class CollaborationObject final
         [](auto results, bool first, bool second, const NSURLPtr& url, const NSErrorPtr& error) {
           results.setFirst(first);
           results.setSecond(second);
-          encodeURL(results, url, error);
+          encodeAddress(results, url, error);
         });
   }
 
@@ -376,7 +377,7 @@ class CollaborationObject final
         [](auto& service, auto reply) {
           service.fetchURLForSharingFileWithCompletionHandler(std::move(reply));
         },
-        encodeURL);
+        encodeAddress);
   }
 
   kj::Promise<void> fetchFolderSharingState(FetchFolderSharingStateContext context) override {

@@ -9,7 +9,8 @@
 namespace skein {
 namespace {
 
-constexpr auto encodeShare = [](auto results, const CKSharePtr& share, const NSErrorPtr& error) {
+constexpr auto encodeWholeShare = [](auto results, const CKSharePtr& share,
+                                     const NSErrorPtr& error) {
   if (share) codec::encode(results.initShare(), *share);
   codec::setError(results, error);
 };
@@ -50,7 +51,7 @@ kj::Promise<void> SharesObject::copyShare(CopyShareContext context) {
       [](auto results, const CKSharePtr& share, const std::optional<std::string>& folder,
          const NSErrorPtr& error) {
         if (folder) results.setFolder(codec::bytes(*folder));
-        encodeShare(results, share, error);
+        encodeWholeShare(results, share, error);
       });
 }
 
@@ -60,7 +61,7 @@ kj::Promise<void> SharesObject::newShare(NewShareContext context) {
       [](LocalShares& shares, auto params, auto reply) {
         return shares.newShare(urlFromClient(params.getUrl()), std::move(reply));
       },
-      encodeShare);
+      encodeWholeShare);
 }
 
 kj::Promise<void> SharesObject::copyShareURL(CopyShareURLContext context) {
@@ -81,7 +82,7 @@ kj::Promise<void> SharesObject::saveShare(SaveShareContext context) {
       [](LocalShares& shares, auto params, auto reply) {
         return shares.saveShare(codec::decode(params.getShare()), std::move(reply));
       },
-      encodeShare);
+      encodeWholeShare);
 }
 
 kj::Promise<void> SharesObject::destroyShare(DestroyShareContext context) {

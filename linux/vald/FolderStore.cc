@@ -11,6 +11,7 @@
 
 #include "base/Numbers.h"
 #include "linux/protocol/AnswerRoom.h"
+#include "linux/vald/DrivePath.h"
 #include "linux/vald/RandomToken.h"
 #include "linux/vald/files/DatabaseFile.h"
 #include "linux/vald/files/FileNames.h"
@@ -27,11 +28,6 @@ constexpr std::size_t kMostListings = 1024;
 // nothing is known yet is waited for.
 constexpr auto kLongestCatchUp = std::chrono::seconds(3);
 constexpr auto kLongestRead = std::chrono::seconds(60);
-
-NSErrorPtr noSuchFile(const std::string& what) {
-  return NSError::errorWithDomain(NSCocoaErrorDomain, NSFileNoSuchFileError,
-                                  {{NSLocalizedDescriptionKey, what}});
-}
 
 bool isOnDisk(const std::string& path) {
   struct stat status {};

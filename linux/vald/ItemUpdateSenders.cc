@@ -11,7 +11,7 @@ namespace {
 
 constexpr std::size_t kMostSenders = 4096;
 
-NSErrorPtr changesLost() {
+NSErrorPtr scannedAnew() {
   return NSError::errorWithDomain(
       VLVellumErrorDomain, VLVellumErrorChangesLost,
       {{NSLocalizedDescriptionKey,
@@ -57,7 +57,7 @@ void ItemUpdateSenders::storeDidChange(const std::vector<StoreChange>& changes) 
 
 void ItemUpdateSenders::storeDidOverflow(std::optional<VLFileObjectID> folder) {
   if (!folder) {
-    breakAll(changesLost());
+    breakAll(scannedAnew());
     return;
   }
   // Whom it concerns is for the store to say, and its writer must not wait for that.

@@ -9,7 +9,6 @@ namespace skein::vald {
 namespace {
 
 constexpr int kMostTries = 25;
-constexpr char kAttributesRead[] = "attributes read";
 constexpr std::size_t kAttributesAtOnce = 256;
 constexpr std::uint64_t kAttributesUnsaved = 16'384;
 

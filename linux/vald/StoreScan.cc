@@ -16,7 +16,6 @@ namespace skein::vald {
 namespace {
 
 constexpr char kComplete[] = "scanned once";
-constexpr char kAttributesRead[] = "attributes read";
 constexpr char kAttributesUntil[] = "attributes until";
 // A bulk load tells so many items one by one; a small folder is all there is to many.
 constexpr std::uint64_t kMostToldInBulk = 5000;

@@ -179,6 +179,7 @@ class StoreWriter {
   DirtySet _later;  // what could not be read yet
   int _laterTries = 0;
   // The attributes of rows with ranks from here to there are yet to be read.
+  static constexpr char kAttributesRead[] = "attributes read";  // the setting that keeps it
   std::uint64_t _attributesAt = 0;
   std::uint64_t _attributesUntil = 0;
   // The rank before the first row whose hint waits for the others.

@@ -16,7 +16,7 @@ constexpr std::size_t kAtOnce = 64;
 constexpr std::size_t kMostPending = 128;
 constexpr std::size_t kMostRemembered = 10'000;
 constexpr auto kPause = 500ms;
-constexpr auto kGatherWindow = 20ms;
+constexpr auto kUploadWindow = 20ms;
 // How soon uploads begin that somebody agreed to: a file is looked at until then.
 constexpr auto kUntilAskedAgain = 1s;
 // What died may come back under its number: in a save, or in the trash.
@@ -138,7 +138,7 @@ void UploadFeed::run() {
     forgetDead();
     tellUploader();
     // What comes in quick succession is told together.
-    pause(kGatherWindow);
+    pause(kUploadWindow);
   }
 }
 

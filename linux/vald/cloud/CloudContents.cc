@@ -46,12 +46,6 @@ int entries(int folder, std::vector<std::string>& names) {
   return code;
 }
 
-// Reading here, without the cloud's conditions.
-class LocalRead final : public StreamObserver {
- public:
-  NSErrorPtr didPass(std::uint64_t) override { return nullptr; }
-};
-
 // The key that markers are sealed with; made when there is none, or only a part of one.
 Outcome<std::string> openKey(FileLayer& files, int top, int incoming, const std::string& folder) {
   constexpr std::size_t kKeySize = 32;

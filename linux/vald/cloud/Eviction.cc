@@ -29,12 +29,6 @@ NSErrorPtr refusal(EvictionRefusal reason, const std::string& path, const std::s
 // Read in a second or two, from a slow disk too: whoever evicts waits for that long.
 constexpr std::uint64_t kMostCompared = std::uint64_t{128} << 20;
 
-// Reading here, without the cloud's conditions.
-class LocalRead final : public StreamObserver {
- public:
-  NSErrorPtr didPass(std::uint64_t) override { return nullptr; }
-};
-
 NSErrorPtr changedSinceUpload(const std::string& path) {
   return refusal(EvictionRefusal::ChangedSinceUpload, path,
                  "it changed since it was uploaded; wait until it is uploaded again");

@@ -13,9 +13,9 @@ namespace skein::vald {
 namespace {
 
 // Reading here, without the cloud's conditions.
-class LocalRead final : public StreamObserver {
+class CancellableRead final : public StreamObserver {
  public:
-  explicit LocalRead(Cancellation& cancellation) : _cancellation(cancellation) {}
+  explicit CancellableRead(Cancellation& cancellation) : _cancellation(cancellation) {}
   NSErrorPtr didPass(std::uint64_t) override {
     return _cancellation.isCancelled() ? cancelledError() : nullptr;
   }
@@ -87,7 +87,7 @@ class Attempt {
 
   Outcome<CloudContents::Added> addContents(const std::optional<CloudRecord>& record) {
     if (record && record->contents.size == _before.size) {
-      LocalRead observer(_cancellation);
+      CancellableRead observer(_cancellation);
       const auto here = hashContents(_file.get(), _path, observer);
       if (!here) return here.error();
       if (here->hash == record->contents.hash) {

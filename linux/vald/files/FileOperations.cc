@@ -17,7 +17,7 @@
 namespace skein::vald {
 namespace {
 
-constexpr unsigned kMostNames = 10'000;
+constexpr unsigned kMostNumberedNames = 10'000;
 
 }  // namespace
 
@@ -115,7 +115,7 @@ bool FileOperations::isAsked(const FileRequest& request, const DirectoryHandle& 
 int FileOperations::putBack(const DirectoryHandle& folder, const std::string& name,
                             const StorePlace& place) {
   int failure = EEXIST;
-  for (unsigned number = 1; failure == EEXIST && number <= kMostNames; ++number) {
+  for (unsigned number = 1; failure == EEXIST && number <= kMostNumberedNames; ++number) {
     failure = _files.renameWithoutReplacing(folder.get(), name, place.folder.get(),
                                             numberedName(place.name, number, ' '));
   }

@@ -11,7 +11,7 @@ namespace skein::vald {
 
 namespace {
 
-constexpr unsigned kMostNames = 1000;
+constexpr unsigned kMostTakenNames = 1000;
 
 FileResult cancelledRemoval(const StorePlace& place, const std::string& name) {
   const bool isTaken = name != place.name;
@@ -101,7 +101,7 @@ FileResult FileOperations::removeAside(const StorePlace& place, const FileReques
 int FileOperations::putBackRemoved(const StagingPlace& aside, const StorePlace& place,
                                    std::string& name) {
   int failure = EEXIST;
-  for (unsigned number = 1; failure == EEXIST && number <= kMostNames; ++number) {
+  for (unsigned number = 1; failure == EEXIST && number <= kMostTakenNames; ++number) {
     name = numberedName(place.name, number, ' ');
     failure =
         _files.renameWithoutReplacing(aside.folder.get(), aside.name, place.folder.get(), name);

@@ -13,7 +13,7 @@
 namespace skein::vald {
 namespace {
 
-constexpr unsigned kMostNames = 100'000;
+constexpr unsigned kMostTrashNames = 100'000;
 constexpr off_t kLongestInfo = 64 << 10;
 
 // A folder of the trash: made when missing; never a link, and nobody else's.
@@ -66,7 +66,7 @@ FileResult FileOperations::trash(const std::string& path, const FileRequest& req
   DirectoryHandle files;
   DirectoryHandle info;
   if (NSErrorPtr error = openTrash(*place.root, files, info)) return {{}, error};
-  for (unsigned number = 1; number <= kMostNames; ++number) {
+  for (unsigned number = 1; number <= kMostTrashNames; ++number) {
     const std::string name = numberedName(place.name, number, '.', std::strlen(kTrashInfoSuffix));
     if (files.exists(name) || info.exists(name + kTrashInfoSuffix)) continue;
     bool taken = false;
