@@ -1,7 +1,8 @@
 #!/usr/bin/env python3
 """Measures the programs end to end, each figure beside a baseline of the same run.
 
-Usage: bench/end_to_end.py [--bin DIR] [--files N] [--gib N] [--work DIR] [STEP...]
+Usage: bench/end_to_end.py [--bin DIR] [--files N] [--gib N] [--pictures N] [--work DIR]
+                           [STEP...]
 
 Steps: listing   a folder of N files (100,000) by name and by date, beside find | sort; the
                  same with N/10 files; what the host's memory grows by
@@ -12,6 +13,9 @@ Steps: listing   a folder of N files (100,000) by name and by date, beside find 
                  memory vald and the host took at most
        download  an evicted document of 1 GiB beside cp and sha256sum; how fast a cancelled
                  download ends, and what it leaves
+       crowd     64 commands at once on a fresh drive, with vald stopped, and after it goes on
+       thumbs    1,000 pictures of about 120 kB each through both sockets, beside one process
+                 that reads the stored pictures, and beside cp of them
 Without a step: all of them.
 """
 import argparse
@@ -26,6 +30,7 @@ import sys
 import tarfile
 import tempfile
 import time
+import zlib
 
 
 class Drive:
@@ -301,8 +306,120 @@ def download(drive: Drive, _options):
           f"was gone within {max(gone) * 1000:.0f} ms")
 
 
+def crowd(drive: Drive, _options):
+    for number in range(8):
+        make_files(drive.store / f"folder {number}", 5)
+    asked = [["ls", "/folder 3"], ["id", "/folder 1/document 000002.txt"],
+             ["stat", "--json", "/folder 2"], ["status", "--json"]]
+
+    def all_at_once():
+        start = time.perf_counter()
+        # Each waits for its end by itself: files, not pipes, take the output.
+        running = []
+        for number in range(64):
+            output = tempfile.TemporaryFile()
+            arguments = asked[number % len(asked)]
+            running.append((arguments, output, subprocess.Popen(
+                [drive.skein, *arguments], env=drive.environment, stdout=output,
+                stderr=subprocess.DEVNULL)))
+        answers = []
+        for arguments, output, process in running:
+            process.wait()
+            output.seek(0)
+            answers.append((arguments, process.returncode, output.read()))
+        return answers, time.perf_counter() - start
+
+    def check(answers):
+        identifiers = set()
+        for arguments, code, output in answers:
+            assert code == 0, f"skein {arguments} ended with {code}"
+            if arguments[0] == "ls":
+                assert output.split(b"\n")[:-1] == \
+                    sorted(os.fsencode(n) for n in os.listdir(drive.store / "folder 3")), output
+            elif arguments[0] == "id":
+                identifiers.add(output)
+            else:
+                told = json.loads(output)
+                assert arguments[0] == "status" or told["path"] == "/folder 2", output
+        assert len(identifiers) == 1, f"one document has {len(identifiers)} identifiers"
+
+    answers, took = all_at_once()
+    check(answers)
+    print(f"64 commands at once on a fresh drive: all right after {took:.2f} s")
+    status = drive.wait_until_scanned()
+    os.kill(status["processID"], signal.SIGSTOP)
+    try:
+        answers, took = all_at_once()
+    finally:
+        os.kill(status["processID"], signal.SIGCONT)
+    codes = sorted({code for _, code, _ in answers})
+    print(f"the same with vald stopped: exit codes {codes}, the last after {took:.2f} s")
+    answers, took = all_at_once()
+    check(answers)
+    print(f"the same after it goes on: all right after {took:.2f} s")
+
+
+def picture(path: pathlib.Path, side: int):
+    """A picture of noise: a PNG file without compression, of side x side pixels."""
+    rows = b"".join(b"\0" + os.urandom(3 * side) for _ in range(side))
+
+    def chunk(kind, data):
+        return (len(data).to_bytes(4, "big") + kind + data +
+                zlib.crc32(kind + data).to_bytes(4, "big"))
+    path.write_bytes(b"\x89PNG\r\n\x1a\n" + chunk(
+        b"IHDR", side.to_bytes(4, "big") * 2 + b"\x08\x02\0\0\0") +
+        chunk(b"IDAT", zlib.compress(rows, 0)) + chunk(b"IEND", b""))
+
+
+def thumbs(drive: Drive, options):
+    count = options.pictures
+    album = drive.store / "album"
+    album.mkdir()
+    for number in range(count):
+        picture(album / f"picture {number:04}.png", 394)
+    paths = [f"/album/picture {number:04}.png" for number in range(count)]
+    drive.wait_until_scanned()
+
+    def missing():
+        answer = drive.command("thumb", "--json", *paths, check=False, stdout=subprocess.PIPE)
+        told = [json.loads(line) for line in answer.stdout.splitlines()]
+        assert len(told) == count, f"{len(told)} of {count} were answered"
+        return sum(1 for one in told if one["result"] != "thumbnail")
+    while left := missing():
+        print(f"  {left} pictures are still to be drawn", file=sys.stderr)
+        time.sleep(2)
+    data = pathlib.Path(drive.environment["XDG_DATA_HOME"])
+    # Other documents of the drive have smaller ones.
+    stored = sorted((path for path in data.rglob("*") if "thumbnails" in path.parts and
+                     path.suffix in (".jpg", ".png")), key=lambda path: path.stat().st_size)
+    stored = stored[-count:]
+    size = sum(path.stat().st_size for path in stored)
+    names = drive.store.parent / "stored"
+    names.write_bytes(b"\0".join(os.fsencode(path) for path in stored))
+    sink = open(os.devnull, "wb")
+    read = best(lambda: subprocess.run(["sh", "-c", 'xargs -0 cat <"$0"', str(names)], check=True,
+                                       stdout=sink))
+    told = best(lambda: drive.command("thumb", "--json", *paths, stdout=sink))
+    target = drive.store.parent / "pictures"
+
+    def fresh(function):
+        shutil.rmtree(target, ignore_errors=True)
+        target.mkdir()
+        return seconds(function)
+    copied = min(fresh(lambda: subprocess.run(
+        ["sh", "-c", 'xargs -0 cp -t "$1" <"$0"', str(names), str(target)], check=True))
+        for _ in range(5))
+    written = min(fresh(lambda: drive.command("thumb", "-o", str(target), *paths, stdout=sink))
+                  for _ in range(5))
+    assert len(list(target.iterdir())) == count
+    print(f"thumb of {count} pictures, {size / count / 1000:.0f} kB each: {told * 1000:.0f} ms; "
+          f"cat of the stored ones: {read * 1000:.0f} ms, ratio {told / read:.2f}")
+    print(f"the same written to a folder: {written * 1000:.0f} ms; cp: {copied * 1000:.0f} ms, "
+          f"ratio {written / copied:.2f}")
+
+
 STEPS = {"listing": listing, "latency": latency, "unpack": unpack, "kill": kill,
-         "import": import_files, "download": download}
+         "import": import_files, "download": download, "crowd": crowd, "thumbs": thumbs}
 
 
 def main():
@@ -312,6 +429,7 @@ def main():
     parser.add_argument("--bin", type=pathlib.Path, default=top / "build/release/bin")
     parser.add_argument("--files", type=int, default=100_000)
     parser.add_argument("--gib", type=int, default=4, help="of the large file that is imported")
+    parser.add_argument("--pictures", type=int, default=1000)
     parser.add_argument("--work", help="where the drives are made")
     parser.add_argument("steps", nargs="*", choices=[*STEPS, []])
     options = parser.parse_args()

@@ -52,10 +52,10 @@ function(skein_precompile target)
   endif()
 endfunction()
 
-# skein_unity(TARGET): compiles several files of the target as one where SKEIN_UNITY is on, so
+# skein_unity(TARGET SIZE): compiles SIZE files of the target as one where SKEIN_UNITY is on, so
 # that the headers they share are read once. Names in unnamed namespaces must then differ within
 # a target. Builds that start from nothing gain by it; a change to one file then costs its group.
-option(SKEIN_UNITY "Compile the files of a Linux room in groups" OFF)
-function(skein_unity target)
-  set_target_properties(${target} PROPERTIES UNITY_BUILD ${SKEIN_UNITY} UNITY_BUILD_BATCH_SIZE 8)
+option(SKEIN_UNITY "Compile files in groups" OFF)
+function(skein_unity target size)
+  set_target_properties(${target} PROPERTIES UNITY_BUILD ${SKEIN_UNITY} UNITY_BUILD_BATCH_SIZE ${size})
 endfunction()

@@ -14,7 +14,7 @@
 namespace skein {
 namespace {
 
-constexpr char kRoot[] = "NSFileProviderRootContainerItemIdentifier";
+constexpr char kRootIdentifier[] = "NSFileProviderRootContainerItemIdentifier";
 
 struct Identity : testing::Test {
   Identity() { framework.documents.urls[VLFileObjectID::documentWithRawID(1)] = storeURL("/a"); }
@@ -31,27 +31,28 @@ TEST_F(Identity, TheRootsURLIsFoundOnceAndIgnoresLogInFlagsAndLocation) {
   framework.containers.table.clear();
   framework.containers.add(VLUbiquitousDefaultContainerID, NSURL::fileURLWithPath("/elsewhere"));
   framework.documents.references["/elsewhere"] = storeURL("/target");
-  const NSURLPtr root = identity._URLForItemWithPersistentIdentifier(kRoot, true, true);
+  const NSURLPtr root = identity._URLForItemWithPersistentIdentifier(kRootIdentifier, true, true);
   ASSERT_TRUE(root);
   EXPECT_EQ(root->path(), "/elsewhere");
   EXPECT_FALSE(root->isPhysical());
-  EXPECT_EQ(env.run(), (Lines{"[DEBUG] ┏1 asked url for " + std::string(kRoot), "containers: table",
-                              "[DEBUG] returning file:///elsewhere", "[DEBUG] ┗1 "}));
+  EXPECT_EQ(env.run(),
+            (Lines{"[DEBUG] ┏1 asked url for " + std::string(kRootIdentifier), "containers: table",
+                   "[DEBUG] returning file:///elsewhere", "[DEBUG] ┗1 "}));
   framework.containers.table.clear();
-  EXPECT_EQ(identity.URLForItemWithPersistentIdentifier(kRoot), root);
+  EXPECT_EQ(identity.URLForItemWithPersistentIdentifier(kRootIdentifier), root);
 
   NSErrorPtr error;
-  EXPECT_FALSE(identity.itemForIdentifier(kRoot, &error));
+  EXPECT_FALSE(identity.itemForIdentifier(kRootIdentifier, &error));
   EXPECT_EQ(brief(error), "NSFileProviderErrorDomain -1000 under VLVellumErrorDomain 2");
 }
 
 TEST_F(Identity, ARootThatCouldNotBeAskedForIsAskedForAgainAndOneWithoutAFolderIsNot) {
   framework.containers.table.clear();
-  EXPECT_FALSE(identity.URLForItemWithPersistentIdentifier(kRoot));
+  EXPECT_FALSE(identity.URLForItemWithPersistentIdentifier(kRootIdentifier));
   framework.containers.add(VLUbiquitousDefaultContainerID, nullptr);
-  EXPECT_FALSE(identity.URLForItemWithPersistentIdentifier(kRoot));
+  EXPECT_FALSE(identity.URLForItemWithPersistentIdentifier(kRootIdentifier));
   framework.containers.add(VLUbiquitousDefaultContainerID, storeURL());
-  EXPECT_FALSE(identity.URLForItemWithPersistentIdentifier(kRoot));
+  EXPECT_FALSE(identity.URLForItemWithPersistentIdentifier(kRootIdentifier));
   EXPECT_EQ(env.runCalls(), (Lines{"containers: table", "containers: table"}));
 }
 

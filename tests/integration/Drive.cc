@@ -22,10 +22,11 @@
 namespace skein {
 namespace {
 
-using Clock = std::chrono::steady_clock;
+using SteadyClock = std::chrono::steady_clock;
 
-int millisecondsUntil(Clock::time_point deadline) {
-  const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(deadline - Clock::now());
+int millisecondsUntil(SteadyClock::time_point deadline) {
+  const auto left =
+      std::chrono::duration_cast<std::chrono::milliseconds>(deadline - SteadyClock::now());
   return static_cast<int>(std::max<std::int64_t>(left.count(), 0));
 }
 
@@ -66,7 +67,7 @@ Process::~Process() {
   waitpid(_pid, nullptr, 0);
 }
 
-bool Process::readSome(Clock::time_point deadline) {
+bool Process::readSome(SteadyClock::time_point deadline) {
   while (_output || _errors) {
     pollfd ends[2] = {{_output.get(), POLLIN, 0}, {_errors.get(), POLLIN, 0}};
     const int count = poll(ends, 2, millisecondsUntil(deadline));
@@ -87,7 +88,7 @@ bool Process::readSome(Clock::time_point deadline) {
 }
 
 std::optional<std::string> Process::readLine(std::chrono::milliseconds deadline) {
-  const auto end = Clock::now() + deadline;
+  const auto end = SteadyClock::now() + deadline;
   for (;;) {
     if (const auto at = output.find('\n'); at != std::string::npos) {
       std::string line = output.substr(0, at);
@@ -99,7 +100,7 @@ std::optional<std::string> Process::readLine(std::chrono::milliseconds deadline)
 }
 
 int Process::finish(std::chrono::milliseconds deadline) {
-  const auto end = Clock::now() + deadline;
+  const auto end = SteadyClock::now() + deadline;
   while (readSome(end)) {
   }
   const FileDescriptor handle(static_cast<int>(syscall(SYS_pidfd_open, _pid, 0)));
@@ -169,12 +170,12 @@ std::unique_ptr<Process> Drive::start(const Arguments& arguments) const {
 }
 
 Result Drive::finish(Process& process) {
-  const auto begin = Clock::now();
+  const auto begin = SteadyClock::now();
   Result result;
   result.code = process.finish(std::chrono::seconds(60));
   result.output = process.output;
   result.errors = process.errors;
-  result.time = std::chrono::duration_cast<std::chrono::milliseconds>(Clock::now() - begin);
+  result.time = std::chrono::duration_cast<std::chrono::milliseconds>(SteadyClock::now() - begin);
   return result;
 }
 

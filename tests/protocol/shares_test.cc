@@ -7,7 +7,7 @@
 namespace skein {
 namespace {
 
-NSURLPtr url(const char* path) { return NSURL::fileURLWithPath(path); }
+NSURLPtr shareURL(const char* path) { return NSURL::fileURLWithPath(path); }
 
 CKShare fullShare() {
   CKShare share;
@@ -97,7 +97,7 @@ TEST_F(SharesAcross, EverythingCrosses) {
   shares().share = std::make_shared<const CKShare>(fullShare());
   shares().text = "i0000000000000002";
   const auto [copied, folder, _] = askShares<CKSharePtr, std::optional<std::string>, NSErrorPtr>(
-      [](LocalShares& to, auto reply) { to.copyShare(url("/s/a"), std::move(reply)); });
+      [](LocalShares& to, auto reply) { to.copyShare(shareURL("/s/a"), std::move(reply)); });
   EXPECT_EQ(asked(), "copyShare /s/a");
   expectEqual(*copied, fullShare());
   EXPECT_EQ(folder, "i0000000000000002");
@@ -114,7 +114,7 @@ TEST_F(SharesAcross, EverythingCrosses) {
                                {{std::string(CKPartialErrorsByItemIDKeyPrefix) + "x",
                                  NSError::errorWithDomain(CKErrorDomain, CKErrorUnknownItem)}});
   const auto [address, error] = askShares<NSURLPtr, NSErrorPtr>(
-      [](LocalShares& to, auto reply) { to.copyShareURL(url("/s/../a"), std::move(reply)); });
+      [](LocalShares& to, auto reply) { to.copyShareURL(shareURL("/s/../a"), std::move(reply)); });
   EXPECT_EQ(asked(), "copyShareURL nil");
   EXPECT_EQ(address->absoluteString(), "skein://share/1");
   EXPECT_TRUE(vlc_checkErrorsFromCloudKit(error, vlc_isCloudKitUnknownItemError));
@@ -131,13 +131,13 @@ TEST_F(SharesAcross, EverythingCrosses) {
   });
   EXPECT_EQ(asked(), "answer skein://share/1 bob yes");
   askShares<NSErrorPtr>([](LocalShares& to, auto reply) {
-    to.attachZone(url("/s/b"), {"zone", "bob"}, 2, std::move(reply));
+    to.attachZone(shareURL("/s/b"), {"zone", "bob"}, 2, std::move(reply));
   });
   EXPECT_EQ(asked(), "attach /s/b zone bob 2");
   askShares<NSErrorPtr>(
-      [](LocalShares& to, auto reply) { to.detachZone(url("/s/b"), std::move(reply)); });
+      [](LocalShares& to, auto reply) { to.detachZone(shareURL("/s/b"), std::move(reply)); });
   EXPECT_EQ(asked(), "detach /s/b");
-  shares().zones = {{url("/s/b"), {"zone", "bob"}, 2}, {}};
+  shares().zones = {{shareURL("/s/b"), {"zone", "bob"}, 2}, {}};
   const auto [zones, problem] = askShares<std::vector<AttachedZone>, NSErrorPtr>(
       [](LocalShares& to, auto reply) { to.attachedZones(std::move(reply)); });
   ASSERT_EQ(zones.size(), 2U);
@@ -235,7 +235,7 @@ TEST_F(SharesAcross, WhatIsGivenUpWhileItIsHeldUpIsNeverBegun) {
       std::make_shared<SameFault>(FaultInjection{"copyShare", FaultInjection::Action::AnswerError,
                                                  CKErrorDomain, CKErrorPartialFailure, 0, 1}));
   const auto error = std::get<2>(askShares<CKSharePtr, std::optional<std::string>, NSErrorPtr>(
-      [](LocalShares& to, auto reply) { to.copyShare(url("/s/a"), std::move(reply)); }));
+      [](LocalShares& to, auto reply) { to.copyShare(shareURL("/s/a"), std::move(reply)); }));
   EXPECT_TRUE(vlc_checkErrorsFromCloudKit(error, vlc_isCloudKitUnknownItemError));
 }
 
@@ -245,7 +245,7 @@ TEST_F(SharesAcross, OperationsReportOnce) {
   auto nulls = everyOperation(nullptr, nullptr);
   for (auto& [operation, outcome] : nulls) operation->start();
   expectAll(nulls, VLVellumErrorDomain, VLVellumErrorInvalidParameter);
-  auto before = everyOperation(url("/s/a"), share);
+  auto before = everyOperation(shareURL("/s/a"), share);
   for (auto& [operation, outcome] : before) {
     operation->cancel();
     operation->start();
@@ -254,14 +254,14 @@ TEST_F(SharesAcross, OperationsReportOnce) {
   EXPECT_EQ(shares().asked.count(), 0U);
 
   shares().holds = true;
-  auto during = everyOperation(url("/s/a"), share);
+  auto during = everyOperation(shareURL("/s/a"), share);
   for (auto& [operation, outcome] : during) operation->start();
   ASSERT_TRUE(shares().held.waitForCount(during.size()));
   for (auto& [operation, outcome] : during) operation->cancel();
   expectAll(during, NSCocoaErrorDomain, NSUserCancelledError);
   answerLate(during.size());
 
-  auto cut = everyOperation(url("/s/a"), share);
+  auto cut = everyOperation(shareURL("/s/a"), share);
   for (auto& [operation, outcome] : cut) operation->start();
   ASSERT_TRUE(shares().held.waitForCount(cut.size()));
   const auto cutAt = std::chrono::steady_clock::now();
@@ -279,13 +279,13 @@ TEST_F(SharesAcross, OperationsReportOnce) {
 TEST_F(SharesAcross, TheFrameworkMakesSharesAndReadsFlags) {
   shares().share = std::make_shared<const CKShare>(fullShare());
   VLSharingOperations& operations = framework->sharingOperations();
-  expectEqual(*operations.VLSharingCreateShareForItemAtURL(url("/s/a"), nullptr), fullShare());
+  expectEqual(*operations.VLSharingCreateShareForItemAtURL(shareURL("/s/a"), nullptr), fullShare());
   NSErrorPtr error;
   EXPECT_FALSE(operations.VLSharingCreateShareForItemAtURL(nullptr, &error));
   EXPECT_EQ(error->code(), VLVellumErrorInvalidParameter);
   shares().share = nullptr;
   shares().error = NSError::errorWithDomain(CKErrorDomain, CKErrorPermissionFailure);
-  EXPECT_FALSE(operations.VLSharingCreateShareForItemAtURL(url("/s/a"), &error));
+  EXPECT_FALSE(operations.VLSharingCreateShareForItemAtURL(shareURL("/s/a"), &error));
   EXPECT_EQ(error->code(), CKErrorPermissionFailure);
 
   VLQueryItem::Properties properties;
@@ -294,16 +294,18 @@ TEST_F(SharesAcross, TheFrameworkMakesSharesAndReadsFlags) {
   properties.typeIdentifier = "inode/symlink";
   daemon->item = std::make_shared<const VLQueryItem>(properties);
   VLResourceValues& values = framework->resourceValues();
-  EXPECT_EQ(values.getResourceValue(url("/s/a"), NSURLUbiquitousItemIsSharedKey, nullptr), true);
-  EXPECT_EQ(values.getPromisedItemResourceValue(url("/s/a"), NSURLIsAliasFileKey, nullptr), true);
-  EXPECT_EQ(values.vl_typeIdentifierWithError(url("/s/a"), nullptr), "inode/symlink");
+  EXPECT_EQ(values.getResourceValue(shareURL("/s/a"), NSURLUbiquitousItemIsSharedKey, nullptr),
+            true);
+  EXPECT_EQ(values.getPromisedItemResourceValue(shareURL("/s/a"), NSURLIsAliasFileKey, nullptr),
+            true);
+  EXPECT_EQ(values.vl_typeIdentifierWithError(shareURL("/s/a"), nullptr), "inode/symlink");
   error = nullptr;
   EXPECT_FALSE(values.getResourceValue(nullptr, NSURLIsAliasFileKey, &error));
-  EXPECT_FALSE(values.getResourceValue(url("/s/a"), "other", &error));
+  EXPECT_FALSE(values.getResourceValue(shareURL("/s/a"), "other", &error));
   EXPECT_FALSE(error);
   daemon->item = nullptr;
   daemon->error = NSError::errorWithDomain(NSCocoaErrorDomain, NSFileNoSuchFileError);
-  EXPECT_FALSE(values.getResourceValue(url("/s/a"), NSURLIsAliasFileKey, &error));
+  EXPECT_FALSE(values.getResourceValue(shareURL("/s/a"), NSURLIsAliasFileKey, &error));
   EXPECT_EQ(error->code(), NSFileNoSuchFileError);
 }
 
