@@ -147,6 +147,12 @@ std::string openMark(SqliteDatabase& database) {
   return mark.start(kOpenMark).step() ? std::string(mark.bytes(0)) : std::string();
 }
 
+// Whether it failed since the disk is full. What its connections share is a file as well.
+bool lacksRoom(SqliteDatabase& database) {
+  return database.code() == SQLITE_FULL ||
+         sqlite3_extended_errcode(database.handle()) == SQLITE_IOERR_SHMSIZE;
+}
+
 void runDurably(SqliteDatabase& database, SqliteStatement& statement) {
   database.execute("PRAGMA synchronous = FULL");
   statement.run();
@@ -227,7 +233,8 @@ std::unique_ptr<SqliteDatabase> openIndexFile(const std::string& path, Log& log,
     if (verdict == Verdict::Empty || failure == SQLITE_FULL || failure == SQLITE_BUSY ||
         failure == SQLITE_READONLY || failure == SQLITE_CANTOPEN || failure == SQLITE_IOERR) {
       error.store(
-          vl_errorWithPOSIXCode(EIO, "The index " + path + " could not be used: " + reason + "."));
+          vl_errorWithPOSIXCode(lacksRoom(*database) ? ENOSPC : EIO,
+                                "The index " + path + " could not be used: " + reason + "."));
       return nullptr;
     }
     setAside = true;
