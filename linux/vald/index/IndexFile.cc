@@ -147,12 +147,6 @@ std::string openMark(SqliteDatabase& database) {
   return mark.start(kOpenMark).step() ? std::string(mark.bytes(0)) : std::string();
 }
 
-// Whether it failed since the disk is full. What its connections share is a file as well.
-bool lacksRoom(SqliteDatabase& database) {
-  return database.code() == SQLITE_FULL ||
-         sqlite3_extended_errcode(database.handle()) == SQLITE_IOERR_SHMSIZE;
-}
-
 void runDurably(SqliteDatabase& database, SqliteStatement& statement) {
   database.execute("PRAGMA synchronous = FULL");
   statement.run();
@@ -160,6 +154,12 @@ void runDurably(SqliteDatabase& database, SqliteStatement& statement) {
 }
 
 }  // namespace
+
+bool indexLacksRoom(SqliteDatabase& database) {
+  // What its connections share is a file as well.
+  return database.code() == SQLITE_FULL ||
+         sqlite3_extended_errcode(database.handle()) == SQLITE_IOERR_SHMSIZE;
+}
 
 bool setIndexFileAside(const std::string& path, const std::string& suffix) {
   bool moved = true;
@@ -233,7 +233,7 @@ std::unique_ptr<SqliteDatabase> openIndexFile(const std::string& path, Log& log,
     if (verdict == Verdict::Empty || failure == SQLITE_FULL || failure == SQLITE_BUSY ||
         failure == SQLITE_READONLY || failure == SQLITE_CANTOPEN || failure == SQLITE_IOERR) {
       error.store(
-          vl_errorWithPOSIXCode(lacksRoom(*database) ? ENOSPC : EIO,
+          vl_errorWithPOSIXCode(indexLacksRoom(*database) ? ENOSPC : EIO,
                                 "The index " + path + " could not be used: " + reason + "."));
       return nullptr;
     }
