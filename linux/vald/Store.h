@@ -32,6 +32,9 @@ struct StoreOptions {
   std::chrono::milliseconds graceWindow{2000};
   // How many changes the journal keeps before older tokens expire.
   std::uint64_t journalRetention = 200'000;
+  // Called when the index's disk is full: whether it has a little more room now. On the writer's
+  // thread. Null: it never has.
+  std::function<bool()> makeRoom = {};
 };
 
 struct Page {

@@ -64,7 +64,7 @@ FileResult FileOperations::removeAside(const StorePlace& place, const FileReques
   }
   if (failure != 0) return {{}, fileError(failure, "can't remove", path)};
   std::string name;
-  // Gone for good before the first part of it is deleted: a power cut shall not bring
+  // Aside for good before the first part of it is deleted: a power cut shall not bring
   // half a tree back.
   failure = isAsked(request, aside->folder, aside->name) ? syncFolders(place.folder, &aside->folder)
                                                          : ESTALE;
@@ -79,6 +79,10 @@ FileResult FileOperations::removeAside(const StorePlace& place, const FileReques
              std::generic_category().message(failure));
   }
 
+  if (NSErrorPtr error = scope->decide()) {
+    if (putBackRemoved(*aside, place, name) != 0) scope->leaveOpen();
+    return {{}, error};
+  }
   // From here on it is removed; what cannot be deleted now is deleted at the next start.
   scope->leaveOpen();
   const int forgetting = removeTrashInfo(place);
