@@ -70,6 +70,15 @@ TEST_F(ListingTest, FailsWhenAnAnswerIsLostOrGivenUp) {
   given->cancel();
   run();
   EXPECT_EQ(pages.heard.back(), "error " + std::to_string(NSUserCancelledError));
+  // Nor is a page handed out that came before.
+  const auto full = open();
+  enumerator(2).givePage({item(1, "a")}, "p2");
+  run();
+  full->cancel();
+  full->next(pages.reply());
+  run();
+  EXPECT_EQ(pages.heard.back(), "error " + std::to_string(NSUserCancelledError));
+  EXPECT_EQ(pages.heard.size(), 3U);
 }
 
 // The enumerator holds a sender of vald's, which nobody else would give back.

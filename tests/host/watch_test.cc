@@ -3,7 +3,9 @@
 
 #include <algorithm>
 
+#include "linux/host/WorkingSetWatch.h"
 #include "tests/host/HostFixture.h"
+#include "tests/protocol/FakeDaemon.h"
 
 namespace skein {
 namespace {
@@ -48,6 +50,16 @@ TEST_F(HostTest, SignalsCoalesceAndNoneIsLost) {
   EXPECT_EQ(calls(), (Words{"changes a0.1"}));
   enumerator().giveChanges({}, {}, "a0.1");
   EXPECT_EQ(calls(), Words{});
+
+  // During the round that ends the first listing.
+  const auto second = host->watch("i2", std::make_shared<Watcher>());
+  run();
+  enumerator(1).givePage({});
+  EXPECT_EQ(calls(), (Words{"open i2", "anchor", "list start", "changes a1"}));
+  host->signalEnumeratorForContainerItemIdentifier("i2", nullptr);
+  run();
+  enumerator(1).giveChanges({}, {}, "a1.1");
+  EXPECT_EQ(calls(), (Words{"changes a1.1"}));
 }
 
 TEST_F(HostTest, SignalOfAnUnknownContainerAnswersAnError) {
@@ -58,6 +70,12 @@ TEST_F(HostTest, SignalOfAnUnknownContainerAnswersAnError) {
   EXPECT_TRUE(codes.empty());  // never inside the call
   run();
   EXPECT_EQ(codes, (std::vector<std::int64_t>{NSFileProviderErrorNoSuchItem, 0}));
+  // One that was listed is known.
+  host->list("i9", NSFileProviderInitialPageSortedByName(), [](const auto&, const auto&) {});
+  run();
+  host->signalEnumeratorForContainerItemIdentifier("i9", note);
+  run();
+  EXPECT_EQ(codes.back(), 0);
 }
 
 TEST_F(HostTest, ExpiryIsFollowedByAListingAndTheDifference) {
@@ -140,12 +158,20 @@ TEST_F(HostTest, WatchersShareAnEnumeratorUntilTheLastLeaves) {
   first.reset();
   EXPECT_EQ(calls(), (Words{"changes a0"}));
   EXPECT_EQ(second->take(), (Words{"+two"}));
+  signal();
+  EXPECT_EQ(calls(), (Words{"changes a0.1"}));
+  enumerator().giveChanges({}, {}, "a0.1");
   other.reset();
   EXPECT_EQ(calls(), (Words{"invalidate"}));
   EXPECT_EQ(host->watchedContainers(), 0U);
   // A later watcher begins anew.
-  const auto third = host->watch("i1", std::make_shared<Watcher>());
+  auto third = host->watch("i1", std::make_shared<Watcher>());
   EXPECT_EQ(calls(), (Words{"open i1", "anchor", "list start"}));
+  third.reset();
+  calls();
+  // One who leaves before it is opened.
+  host->watch("i1", std::make_shared<Watcher>());
+  EXPECT_EQ(calls(), (Words{"open i1", "invalidate"}));
 }
 
 TEST_F(HostTest, TheWatchSurvivesADaemonThatDies) {
@@ -210,6 +236,30 @@ TEST_F(HostTest, TheWorkingSetGoesOnFromItsAnchorAfterAFailure) {
   const auto third = host->watch(workingSet, std::make_shared<Watcher>());
   run();
   EXPECT_EQ(news->listeners, 1);
+}
+
+TEST_F(HostTest, NewsOfTheWorkingSetBeginAgainWhereTheyFailed) {
+  const auto daemon = std::make_shared<FakeDaemon>();
+  daemon->statusNow.store = "/drive";
+  WorkingSetWatch watch([&](const auto&) { return daemon; }, timers);
+  int told = 0;
+  auto listening = watch.begin([&] { ++told; });
+  ASSERT_EQ(daemon->senders.count(), 1U);
+  auto sender = *daemon->senders.take();
+  auto asked = *sender->watches.take();
+  EXPECT_EQ(asked.path, "/drive");
+  EXPECT_EQ(asked.options, 23U);
+  EXPECT_EQ(told, 1) << "what changed while there was no link";
+  sender->receiver->receiveUpdates({}, {}, {}, nullptr);
+  EXPECT_EQ(told, 2);
+  asked.reply(vlc_errorLoggedOut());
+  timers->advance(std::chrono::milliseconds(500));
+  run();
+  ASSERT_EQ(daemon->senders.count(), 1U);
+  sender = *daemon->senders.take();
+  EXPECT_EQ(told, 3);
+  listening.reset();
+  EXPECT_EQ(sender->invalidations.count(), 1U);
 }
 
 // The target's own changes are none of what it holds; with the target it ends.

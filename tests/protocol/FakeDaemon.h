@@ -21,7 +21,9 @@
 namespace skein {
 
 // vald's end of a watch, as the test sees it.
-class FakeSender final : public VLItemNotificationSender, public LinkBreaking {
+class FakeSender final : public VLItemNotificationSender,
+                         public LinkBreaking,
+                         public std::enable_shared_from_this<FakeSender> {
  public:
   FakeSender(std::shared_ptr<VLItemNotificationReceiving> to, std::shared_ptr<Inbox<int>> ended)
       : receiver(std::move(to)), _ended(std::move(ended)) {}
@@ -35,7 +37,7 @@ class FakeSender final : public VLItemNotificationSender, public LinkBreaking {
   void invalidate() override { invalidations.add(1); }
   std::shared_ptr<VLItemNotificationSending> remoteObjectProxyWithErrorHandler(
       std::function<void(NSErrorPtr)>) override {
-    return nullptr;
+    return shared_from_this();
   }
   void setLinkBrokenHandler(std::function<void(NSErrorPtr)> handler) override {
     linkBrokenHandlers.add(std::move(handler));

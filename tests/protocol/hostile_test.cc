@@ -5,6 +5,7 @@
 #include <capnp/schema.h>
 #include <capnp/serialize.h>
 #include <poll.h>
+#include <sys/resource.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/un.h>
@@ -202,6 +203,32 @@ TEST_F(Hostile, QuestionsThatAreNeverFinishedCloseTheConnection) {
   }
   EXPECT_TRUE(closes(socket));
   expectServed();
+}
+
+TEST_F(Hostile, AConnectionThatFinishesItsQuestionsMayAskAnyNumber) {
+  for (int question = 0; question < 5000; ++question) expectServed();
+}
+
+TEST_F(Hostile, WhoCameWhileThereWereNoDescriptorsIsAcceptedOnceThereAre) {
+  expectServed();
+  sockaddr_un address{};
+  address.sun_family = AF_UNIX;
+  socketPath.copy(address.sun_path, sizeof address.sun_path - 1);
+  const FileDescriptor waiting(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  rlimit before{};
+  ASSERT_EQ(getrlimit(RLIMIT_NOFILE, &before), 0);
+  const rlimit few{256, before.rlim_max};
+  ASSERT_EQ(setrlimit(RLIMIT_NOFILE, &few), 0);
+  std::vector<FileDescriptor> all;
+  while (all.empty() || all.back()) all.emplace_back(dup(waiting.get()));
+  ASSERT_EQ(connect(waiting.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address), 0);
+  EXPECT_NE(log.lines.take()->find("cannot be accepted"), std::string::npos);
+  all.clear();
+  ASSERT_EQ(setrlimit(RLIMIT_NOFILE, &before), 0);
+  // Nobody else comes, who could wake the server.
+  sendSome(waiting, bootstrapMessage(0));
+  pollfd answer{waiting.get(), POLLIN, 0};
+  EXPECT_EQ(poll(&answer, 1, 20'000), 1);
 }
 
 TEST_F(Hostile, CrowdOfSilentConnectionsIsThinnedOut) {

@@ -98,16 +98,26 @@ TEST_F(Senders, HoldOnePushAtATimeAndCoalesceWhatWaits) {
   EXPECT_EQ(receiver->pushes[0][0]->properties().size, 2u);  // the latest state
   EXPECT_EQ(receiver->seen(), (Names{second.asString(), dead(third), first.asString()}));
 
-  for (int i = 0; i < 450; ++i) store.addFile("many" + std::to_string(i), folder);
+  std::vector<VLFileObjectID> many;
+  for (int i = 0; i < 450; ++i) {
+    many.push_back(store.addFile("many" + std::to_string(i), folder));
+  }
   std::size_t total = 0;
-  for (const std::size_t expected : {200, 200, 50}) {
+  for (const std::size_t expected : {200, 200, 51}) {
     receiver->reply();
     d.executor->runAll();
     ASSERT_EQ(receiver->pushes.size(), 1u);
     EXPECT_EQ(receiver->pushes[0].size(), expected);
+    if (total == 0) store.touch(many.front());   // it was just told, and is told again
+    if (total == 200) store.touch(many.back());  // it waits, at another place by now
+    if (total == 400) {
+      EXPECT_EQ(receiver->pushes[0][49]->fileObjectID(), many.back());
+      EXPECT_EQ(receiver->pushes[0][49]->properties().size, 1u);
+      EXPECT_EQ(receiver->pushes[0][50]->fileObjectID(), many.front());
+    }
     total += receiver->seen().size();
   }
-  EXPECT_EQ(total, 450u);
+  EXPECT_EQ(total, 451u);
 }
 
 TEST_F(Senders, CollectFromTheVeryCallThatStartsTheWatch) {
@@ -119,7 +129,11 @@ TEST_F(Senders, CollectFromTheVeryCallThatStartsTheWatch) {
   store.move(passing, folder);
   store.move(passing, other);
   EXPECT_TRUE(gathered.empty());
-  EXPECT_EQ(pushed(), (Names{file.asString(), dead(passing)}));
+  EXPECT_TRUE(d.executor->runOne());
+  ASSERT_EQ(gathered, std::vector<NSErrorPtr>{nullptr});
+  // What comes before the first visit is told after what waits for it.
+  store.remove(file);
+  EXPECT_EQ(pushed(), (Names{dead(file), dead(passing)}));
 }
 
 TEST_F(Senders, WatchASubtreeByWhereFoldersAre) {
@@ -225,6 +239,13 @@ TEST_F(Senders, PushNothingAfterInvalidateOrTheLastReference) {
     EXPECT_EQ(d.senders.count(), 0u);
     EXPECT_EQ(store.watches(folder), 0);
   }
+  // Nor does one that is ended before its folder is found.
+  const SenderPtr early = make();
+  watch(early, folder);
+  early->invalidate();
+  d.executor->runAll();
+  EXPECT_TRUE(gathered.back());
+  EXPECT_EQ(store.watches(folder), 0);
 }
 
 class BoundedSenders : public Senders {
@@ -317,6 +338,16 @@ TEST_F(BoundedSenders, BreakWhatTheStoresOverflowConcerns) {
   EXPECT_TRUE(broke(folder, 19, std::nullopt));
   EXPECT_FALSE(broke(folder, 19, deep));
   EXPECT_FALSE(broke(other, 23, folder));
+  broken.clear();
+  const SenderPtr sender = make();
+  listen(sender);
+  watch(sender, other);
+  d.executor->runAll();
+  store.remove(other);
+  d.executor->runAll();
+  d.senders.storeDidOverflow(folder);
+  d.executor->runAll();
+  EXPECT_FALSE(broken.empty()) << "where the folder was cannot be told any more";
   EXPECT_TRUE(broke(store.root(), 23, VLFileObjectID::folderOrAliasWithRawID(77)));
 }
 

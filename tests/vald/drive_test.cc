@@ -13,6 +13,7 @@
 
 #include "linux/protocol/DocumentURL.h"
 #include "tests/vald/DriveFixture.h"
+#include "tests/vald_cloud/DiskWaits.h"
 
 namespace skein::vald {
 namespace {
@@ -130,6 +131,12 @@ TEST_F(DriveTest, TagsFollowTheFileWhoeverSetsThem) {
 TEST_F(DriveTest, AFirstScanFindsTagsAndNumbersLater) {
   open();
   const std::string before = makePrecious("doc.txt");
+  // What the index alone knows is on the disk when it is answered.
+  for (const std::int64_t rank : {8, 7}) {
+    const std::uint64_t waits = diskWaits();
+    EXPECT_EQ(ranked("doc.txt", rank), "");
+    EXPECT_NE(diskWaits(), waits);
+  }
   const std::string copied = id("doc.txt");
   close();
   // The index is lost; the file has kept its tags and its number.

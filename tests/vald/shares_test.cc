@@ -40,9 +40,12 @@ TEST_F(SharesTest, AShareIsMadeChangedAndRemovedAndSurvivesARestart) {
   EXPECT_EQ(told(), std::set<std::string>{"+Notes.md"});
   EXPECT_TRUE(isShared("Notes.md"));
 
-  EXPECT_FALSE(std::get<0>(call<NSErrorPtr>([&, url = saved->url](auto& to, auto reply) {
-    to.answerInvitation(url, "ann", true, std::move(reply));
-  })));
+  const auto answer = [&, url = saved->url](const char* who) {
+    return codeOf(std::get<0>(call<NSErrorPtr>(
+        [&](auto& to, auto reply) { to.answerInvitation(url, who, true, std::move(reply)); })));
+  };
+  EXPECT_EQ(answer("ann"), "");
+  EXPECT_EQ(answer("me"), "CKErrorDomain 11");  // the owner was not invited
   const auto tokens = [&] {
     const auto [share, base, problem] =
         call<std::optional<std::string>, std::optional<std::string>, NSErrorPtr>(
@@ -101,6 +104,14 @@ TEST_F(SharesTest, WhatASharedFolderHoldsIsSharedByTheFoldersShare) {
   EXPECT_TRUE(told().contains("+B.txt"));
   move("Team/Sub", "Other/Sub");
   EXPECT_TRUE(told().contains("B.txt"));
+  // One that comes into another, later one still has its own share.
+  makeFolder("Near");
+  makeFile("Near/C.txt");
+  create("Near");
+  makeFolder("Far");
+  create("Far");
+  move("Near", "Far/Near");
+  EXPECT_EQ(std::get<1>(copy("Far/Near/C.txt")), id("Far/Near").asString());
 
   const auto options = [&](const std::string& name) {
     return std::get<0>(call<ShareOptions, NSErrorPtr>(
@@ -220,6 +231,9 @@ TEST_F(SharesTest, BothOwnersHaveItems) {
   makeFile("Mine.txt");
   EXPECT_EQ(codeOf(attach("Mine.txt", "ann")), "VLVellumErrorDomain 15");
   EXPECT_EQ(codeOf(attach("From ann", CKCurrentUserDefaultName)), "VLVellumErrorDomain 15");
+  const CKShare inner = create("From ann/Deep/A.txt");
+  EXPECT_EQ(codeOf(attach("From ann", "ann")), kRefused);
+  EXPECT_FALSE(destroy(inner));
   ASSERT_FALSE(attach("From ann", "ann"));
   EXPECT_EQ(codeOf(attach("From ann/Deep", "bob")), kRefused);
 
@@ -256,11 +270,17 @@ TEST_F(SharesTest, RefreshingBringsTheStoreInLineWithTheCloud) {
     return std::get<0>(call<NSErrorPtr>(
         [&](auto& to, auto reply) { to.refreshSharingState(team, std::move(reply)); }));
   };
-  const CKShare share = create("Team");
-  ASSERT_FALSE(records->remove(*VLFileObjectID::fileObjectIDWithString(team)));
+  create("Team");
+  const auto record = *records->share(id("Team"));
+  ASSERT_FALSE(records->remove(id("Team")));
   EXPECT_TRUE(isShared("Team"));
   EXPECT_FALSE(refresh());
   EXPECT_FALSE(isShared("Team"));
+  ASSERT_FALSE(records->put(*record));
+  EXPECT_FALSE(refresh());
+  EXPECT_TRUE(isShared("Team"));
+  ASSERT_FALSE(records->remove(id("Team")));
+  EXPECT_FALSE(refresh());
 
   // What is away for a moment keeps its share.
   create("Team");

@@ -1,8 +1,11 @@
 // The journal equals the store at every moment; lost events, spent budgets and a missing
 // folder are visible and cost nothing but time.
+#include <sqlite3.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <atomic>
+#include <cerrno>
 #include <csignal>
 #include <filesystem>
 #include <random>
@@ -225,6 +228,50 @@ TEST_F(StoreChanges, AMissingDriveFolderDeletesNothing) {
   }
   EXPECT_EQ(status.watch, LocalDaemonStatus::Watch::Complete);
   EXPECT_EQ(id("f/doc"), doc);
+}
+
+std::atomic<bool> isDiskFull{false};
+
+ssize_t writeUnlessFull(int file, const void* bytes, std::size_t size, off64_t at) {
+  if (!isDiskFull) return ::pwrite64(file, bytes, size, at);
+  errno = ENOSPC;
+  return -1;
+}
+
+TEST_F(StoreChanges, WhatTheDiskRefusesToTheIndexIsFoundAgainAndToldOnce) {
+  sqlite3_vfs* const system = sqlite3_vfs_find(nullptr);
+  for (const char* name : {"pwrite", "pwrite64"}) {
+    ASSERT_EQ(system->xSetSystemCall(system, name,
+                                     reinterpret_cast<sqlite3_syscall_ptr>(writeUnlessFull)),
+              SQLITE_OK);
+  }
+  write("a");
+  open();
+  Tree tree;
+  std::uint64_t rank = 0;
+  ASSERT_TRUE(replay(tree, rank));
+  listener.take();
+  isDiskFull = true;
+  write("b");
+  remove("a");
+  const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(30);
+  while (!log.holds("the index could not be written") &&
+         std::chrono::steady_clock::now() < deadline) {
+    store->settle(std::chrono::milliseconds(100));
+  }
+  EXPECT_TRUE(log.holds("the index could not be written"));
+  EXPECT_TRUE(listener.take().empty());
+  isDiskFull = false;
+  settle();
+  EXPECT_EQ(item("a"), nullptr);
+  EXPECT_NE(item("b"), nullptr);
+  EXPECT_TRUE(store->check(1).empty());
+  ASSERT_TRUE(replay(tree, rank));
+  const Tree now = listed();
+  EXPECT_EQ(tree, now);
+  for (const StoreChange& change : listener.take()) {
+    EXPECT_TRUE(change.item->isDead() || now.contains(change.item->itemIdentifier()));
+  }
 }
 
 TEST_F(StoreChanges, AMoveTellsBothFolders) {

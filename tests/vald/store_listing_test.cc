@@ -8,8 +8,11 @@
 #include <csignal>
 #include <filesystem>
 #include <fstream>
+#include <functional>
 
+#include "linux/vald/index/IndexFile.h"
 #include "tests/vald/StoreFixture.h"
+#include "tests/vald_cloud/DiskWaits.h"
 
 namespace skein::vald {
 namespace {
@@ -436,6 +439,19 @@ TEST_F(StoreListing, APowerCutEndsTheJournalAndAKillDoesNot) {
   EXPECT_EQ(id("doc"), doc);
   reopen();
   EXPECT_EQ(store->journalID(), next);
+
+  // What tells it the next time is on the disk before the index is used, or left.
+  NSErrorPtr error;
+  const auto fresh = openIndexFile(options.databasePath + "-2", log, &error);
+  ASSERT_NE(fresh, nullptr);
+  const auto waits = [](const std::function<void()>& call) {
+    const std::uint64_t before = diskWaits();
+    call();
+    return diskWaits() != before;
+  };
+  EXPECT_TRUE(waits([&] { markIndexOpen(*fresh); }));
+  EXPECT_FALSE(waits([&] { markIndexOpen(*fresh); }));
+  EXPECT_TRUE(waits([&] { markIndexClosed(*fresh); }));
 }
 
 TEST_F(StoreListing, PathsOfManyAtOnce) {
@@ -520,7 +536,9 @@ TEST_F(StoreListing, HasWhatWasDoneBeforeItWasAskedFor) {
 
 TEST_F(StoreListing, SettingsSurviveARestart) {
   open();
+  const std::uint64_t waits = diskWaits();
   store->setSetting("account", "anna");
+  EXPECT_NE(diskWaits(), waits);
   store->setSetting("gone", "x");
   store->setSetting("gone", std::nullopt);
   reopen();

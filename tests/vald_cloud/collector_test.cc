@@ -72,6 +72,12 @@ TEST_F(CollectorTest, RevisionsAndRemovedDocumentsGoWithTimeOrTheOldestForRoom) 
   EXPECT_EQ(freed->freed.bytes, 4u);
   EXPECT_EQ(freed->kept.files, 0u);
   EXPECT_EQ(rig.records->kept()->files, 0u);
+
+  // What may be the only copy takes no room from the others.
+  lose("b", "not counted");
+  upload("c", "old");
+  upload("c", "new");
+  EXPECT_EQ(collect(kTime, 3), 0u);
 }
 
 TEST_F(CollectorTest, TheOnlyCopyStaysForTheWholeTimeAndIsNeverMissedByOneLook) {
@@ -80,10 +86,16 @@ TEST_F(CollectorTest, TheOnlyCopyStaysForTheWholeTimeAndIsNeverMissedByOneLook) 
   EXPECT_EQ(rig.records->kept()->givenUpBytes, 5u);
   rig.clock.advance(kTime - 1h);
   // Back for a moment: the time begins anew, and the looks before do not count.
-  fs::rename(elsewhere(), path(".a.skein"));
-  EXPECT_EQ(collect(kTime, 0), 0u);
-  fs::rename(path(".a.skein"), elsewhere());
-  rig.clock.advance(kTime);
+  for (const auto& whenMissed : {kTime - 2 * CloudCollector::kMargin, kTime}) {
+    fs::rename(elsewhere(), path(".a.skein"));
+    EXPECT_EQ(collect(kTime, 0), 0u);
+    fs::rename(path(".a.skein"), elsewhere());
+    rig.clock.advance(whenMissed);
+    if (whenMissed == kTime) continue;
+    EXPECT_EQ(collect(kTime, 0), 0u);
+    rig.clock.advance(CloudCollector::kMargin);
+    EXPECT_EQ(collect(kTime, 0), 0u);  // missed twice, and not for long enough
+  }
   EXPECT_EQ(collect(kTime, 0), 0u);  // the first look that misses it
   rig.clock.advance(CloudCollector::kMargin / 2);
   EXPECT_EQ(collect(kTime, 0), 0u);
@@ -94,8 +106,13 @@ TEST_F(CollectorTest, TheOnlyCopyStaysForTheWholeTimeAndIsNeverMissedByOneLook) 
 }
 
 TEST_F(CollectorTest, WhatAMarkerNamesStaysWhereverItLies) {
-  const ContentHash hash = lose("a", "words");
   ASSERT_TRUE(fs::create_directories(path(".Trash-1000/files/deep")));
+  // Many, since they are found in no order.
+  for (char name = 'c'; name < 'k'; ++name) {
+    lose("a", std::string("words of ") + name);
+    fs::rename(elsewhere(), path(std::string(".Trash-1000/files/deep/.") + name + ".skein"));
+  }
+  const ContentHash hash = lose("a", "words");
   fs::rename(elsewhere(), path(".Trash-1000/files/deep/.b.skein"));
   for (int look = 0; look < 3; ++look) {
     rig.clock.advance(kTime);
@@ -176,14 +193,17 @@ TEST_F(CollectorTest, WhatIsBeingUploadedOrDownloadedWaitsOrIsWaitedFor) {
   }
   // Whoever comes while they go finds them gone, and brings them again.
   std::thread other;
-  Event begun;
+  std::atomic<bool> hasHeld{false};
   rig.files.before = [&](FileStep step, std::string_view) {
     if (step != FileStep::Unlink || other.joinable()) return;
     other = std::thread([&] {
-      begun.set();
+      const auto hold = rig.contents->hold({hash, 3});
+      hasHeld = true;
       upload("b", "one", documentNumber(4));
     });
-    EXPECT_TRUE(begun.wait());
+    const auto until = std::chrono::steady_clock::now() + 100ms;
+    while (!hasHeld && std::chrono::steady_clock::now() < until) std::this_thread::yield();
+    EXPECT_FALSE(hasHeld) << "it did not wait for what is being collected";
   };
   EXPECT_EQ(collect(0s, 0), 1u);
   other.join();

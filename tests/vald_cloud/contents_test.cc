@@ -1,5 +1,6 @@
 // The cloud's two halves: contents by hash, and the records that refer to them.
 #include <fcntl.h>
+#include <unistd.h>
 
 #include <fstream>
 
@@ -90,8 +91,15 @@ TEST_F(ContentsTest, SpoiledContentsAreFoundAndLeftoversGoAtTheOpening) {
 
   std::ofstream(rig.top / "cloud/incoming/17") << "half";
   rig.contents.reset();
-  ASSERT_TRUE(CloudContents::open((rig.top / "cloud").string(), rig.files));
+  const auto cloud = rig.top / "cloud";
+  std::filesystem::permissions(cloud, std::filesystem::perms::all);
+  ASSERT_TRUE(CloudContents::open(cloud.string(), rig.files));
   EXPECT_TRUE(incomingIsEmpty());
+  EXPECT_EQ(std::filesystem::status(cloud).permissions(), std::filesystem::perms::owner_all);
+  // A key of somebody else's, who could forge markers with it.
+  if (geteuid() != 0) return;
+  ASSERT_EQ(chown((cloud / "key").c_str(), 12345, 12345), 0);
+  EXPECT_FALSE(CloudContents::open(cloud.string(), rig.files));
 }
 
 TEST_F(ContentsTest, ARecordKeepsItsPlaceAndCountsItsRevisions) {
@@ -128,6 +136,22 @@ TEST_F(ContentsTest, ARecordKeepsItsPlaceAndCountsItsRevisions) {
   EXPECT_EQ(rig.records->recordsInZone({kDocumentsZone, "somebody"})->size(), 0u);
   EXPECT_EQ(rig.records->records({documentNumber(5), document})->size(), 1u);
   EXPECT_FALSE(*rig.records->stamp(documentNumber(5)));
+}
+
+TEST_F(ContentsTest, WhatFailsHalfWayIsNotRecorded) {
+  const auto database = CloudDatabase::open(folder.path() / "half", {"CREATE TABLE one(x)"});
+  ASSERT_TRUE(database);
+  const auto insert = [&](const char* after) {
+    return (*database)->transact([&] {
+      EXPECT_EQ(brief((*database)->execute("INSERT INTO one VALUES(1)")), "none");
+      return (*database)->execute(after);
+    });
+  };
+  EXPECT_NE(insert("nonsense"), nullptr);
+  EXPECT_EQ(brief(insert("SELECT 1")), "none");
+  const auto count = (*database)->prepare("SELECT COUNT(*) FROM one");
+  ASSERT_TRUE(count->step());
+  EXPECT_EQ(count->integer(0), 1);
 }
 
 TEST_F(ContentsTest, RecordsOfANewerProgramAreRefused) {

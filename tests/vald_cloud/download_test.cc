@@ -133,6 +133,20 @@ TEST_F(DownloadTest, CancelledAtEveryPieceItEitherCameOrDidNot) {
     EXPECT_TRUE(rig.records->unfinishedWork()->empty());
   }
   EXPECT_EQ(rig.names(), std::vector<std::string>{"1"});
+
+  // Once it has its name it is there, whoever cancels then.
+  ASSERT_EQ(brief(rig.evict(documentNumber(1), path)), "none");
+  Answer answer;
+  const auto executor = std::make_shared<ManualExecutor>();
+  Downloader downloader(rig.places(), rig.conditions, rig.clock, executor);
+  const auto ticket = downloader.download(request(1, path, answer));
+  rig.files.before = [&](FileStep step, std::string_view) {
+    if (step == FileStep::Unlink) ticket->cancel();
+  };
+  executor->runAll();
+  rig.files.before = nullptr;
+  EXPECT_EQ(answer.error, "none");
+  EXPECT_EQ(answer.times, 1);
 }
 
 TEST_F(DownloadTest, ACloudThatFailsLeavesTheMarkerAlone) {
@@ -149,6 +163,16 @@ TEST_F(DownloadTest, ACloudThatFailsLeavesTheMarkerAlone) {
     EXPECT_EQ(rig.names(), std::vector<std::string>{".1.skein"});
     rig.conditions.change([](Settings& settings) { settings = {}; });
   }
+  // Another marker takes the place of the one that it began with.
+  const auto marker = rig.top / "drive/.1.skein";
+  DownloadTransfer replaced(rig.places(), rig.conditions, rig.clock, documentNumber(1), path, false,
+                            [&](std::uint64_t bytes, std::uint64_t) {
+                              if (bytes != kSize) return;
+                              std::filesystem::copy_file(marker, rig.top / "drive/new");
+                              std::filesystem::rename(rig.top / "drive/new", marker);
+                            });
+  EXPECT_EQ(brief(replaced.run()), "NSCocoaErrorDomain 4");
+  EXPECT_EQ(rig.names(), std::vector<std::string>{".1.skein"});
   // Removed, or moved, while it comes.
   DownloadTransfer transfer(rig.places(), rig.conditions, rig.clock, documentNumber(1), path, false,
                             [&](std::uint64_t bytes, std::uint64_t) {
@@ -185,6 +209,18 @@ TEST_F(DownloadTest, WhoAsksForTheSameDocumentIsAnsweredByTheSameDownload) {
   EXPECT_EQ(third.error, "none");
   EXPECT_EQ(second.times, 1);
   EXPECT_EQ(came, kSize);
+
+  // A marker that was copied is another one's download.
+  ASSERT_EQ(brief(rig.evict(documentNumber(1), path)), "none");
+  std::filesystem::copy_file(rig.top / "drive/.1.skein", rig.top / "drive/.2.skein");
+  Answer one;
+  Answer copy;
+  downloader.download(request(1, path, one));
+  Downloader::Request ofCopy = request(1, (rig.top / "drive/2").string(), copy);
+  ofCopy.isCopy = true;
+  downloader.download(std::move(ofCopy));
+  executor->runAll();
+  EXPECT_EQ(rig.names(), (std::vector<std::string>{"1", "2"}));
 }
 
 TEST_F(DownloadTest, NoMoreThanTheLimitAtATimeAndTheOthersInTheirTurn) {

@@ -143,11 +143,21 @@ TEST_F(EvictionTest, WhatIsNotSafeStaysWithTheReason) {
   EXPECT_EQ(refusal(path), code(EvictionRefusal::ChangedSinceUpload));
   ASSERT_TRUE(std::holds_alternative<UploadDone>(rig.upload(kDocument, path)));
 
-  // A program that runs with its owner's rights: no marker gives them back.
-  ASSERT_EQ(chmod(path.c_str(), 04755), 0);
-  ASSERT_TRUE(std::holds_alternative<UploadDone>(rig.upload(kDocument, path)));
-  EXPECT_EQ(refusal(path), code(EvictionRefusal::NotADocument));
+  // A program that runs with its owner's or its group's rights: no marker gives them back.
+  for (const mode_t mode : {04755, 02755}) {
+    ASSERT_EQ(chmod(path.c_str(), mode), 0);
+    ASSERT_TRUE(std::holds_alternative<UploadDone>(rig.upload(kDocument, path)));
+    EXPECT_EQ(refusal(path), code(EvictionRefusal::NotADocument));
+  }
   ASSERT_EQ(chmod(path.c_str(), 0644), 0);
+
+  // Too large to be compared while somebody waits.
+  const std::string large = rig.write("large", "");
+  std::filesystem::resize_file(large, 129 << 20);
+  ASSERT_TRUE(std::holds_alternative<UploadDone>(rig.upload(documentNumber(8), large)));
+  setTags(large, "red");
+  EXPECT_TRUE(rig.evict(documentNumber(8), large));
+  std::filesystem::remove(large);
 
   std::filesystem::create_directory(rig.top / "drive/folder");
   std::filesystem::create_symlink(path, rig.top / "drive/link");
@@ -184,7 +194,7 @@ TEST_F(EvictionTest, TheCloudsCopyIsVerifiedAndMendedBeforeTheFileGoes) {
 
   // The file is no longer what was uploaded, and what was uploaded is lost: it stays.
   spoil();
-  std::ofstream(path) << "other words";
+  std::ofstream(path) << "other words!";
   EXPECT_EQ(refusal(path), code(EvictionRefusal::NotUploaded));
 }
 
@@ -326,6 +336,56 @@ TEST_F(EvictionTest, AWriterThatOpensJustBeforeTheFileGoesKeepsIt) {
   EXPECT_EQ(rig.names(), std::vector<std::string>{"a"});
 }
 
+TEST_F(EvictionTest, WhatHappensToTheFileWhileItGoesKeepsIt) {
+  const std::string path = uploaded("a", "the document");
+  const auto changed = [&] {
+    const NSErrorPtr error = rig.evict(kDocument, path);
+    rig.files.before = nullptr;
+    EXPECT_FALSE(std::filesystem::exists(rig.top / "drive/.a.skein"));
+    EXPECT_EQ(contentsOf(path).size(), 12u);
+    return error != nullptr &&
+           error->code() == static_cast<std::int64_t>(EvictionRefusal::ChangedSinceUpload);
+  };
+  const auto isThere = [&](const char* name) {
+    return std::filesystem::exists(rig.top / "drive" / name);
+  };
+  // Tags, which the marker would not have.
+  rig.files.before = [&](FileStep step, std::string_view) {
+    if (step == FileStep::Sync && isThere(".a.skein-new")) setTags(path, "late");
+  };
+  EXPECT_TRUE(changed());
+  // A date, once it is set aside.
+  rig.files.before = [&](FileStep step, std::string_view) {
+    const timespec times[2] = {{1, 0}, {1, 0}};
+    if (step != FileStep::Sync || !isThere(".a.skein-old")) return;
+    EXPECT_EQ(utimensat(AT_FDCWD, (rig.top / "drive/.a.skein-old").c_str(), times, 0), 0);
+  };
+  EXPECT_TRUE(changed());
+  ASSERT_TRUE(std::holds_alternative<UploadDone>(rig.upload(kDocument, path)));
+  // Another file takes its name.
+  rig.files.before = [&](FileStep step, std::string_view name) {
+    if (step != FileStep::Rename || name != "a" || isThere("b")) return;
+    std::filesystem::rename(path, rig.top / "drive/b");
+    rig.write("a", "the d0cument");
+  };
+  EXPECT_TRUE(changed());
+  EXPECT_EQ(contentsOf(path), "the d0cument");
+  EXPECT_EQ(contentsOf((rig.top / "drive/b").string()), "the document");
+  std::filesystem::remove(rig.top / "drive/b");
+
+  // It is uploaded again before it is looked at: those contents were not verified.
+  ASSERT_TRUE(std::holds_alternative<UploadDone>(rig.upload(kDocument, path)));
+  CloudPlaces places = rig.places();
+  places.coordinate = [&](const std::string&) {
+    rig.write("a", "third words!");
+    EXPECT_TRUE(std::holds_alternative<UploadDone>(rig.upload(kDocument, path)));
+    return Outcome<std::shared_ptr<void>>(std::shared_ptr<void>());
+  };
+  const NSErrorPtr error = Eviction(places).evict({kDocument, path, "text/plain"});
+  ASSERT_TRUE(error);
+  EXPECT_EQ(error->code(), static_cast<std::int64_t>(EvictionRefusal::ChangedSinceUpload));
+}
+
 TEST_F(EvictionTest, RecoveryComparesContentsAndFindsTheMovedFolder) {
   const std::string path = uploaded("a", "the document");
   const auto date = std::filesystem::last_write_time(path);
@@ -350,14 +410,29 @@ TEST_F(EvictionTest, RecoveryComparesContentsAndFindsTheMovedFolder) {
   ASSERT_EQ(brief(recoverUnfinishedWork(rig.places())), "none");
   EXPECT_EQ(rig.names(), std::vector<std::string>{});
 
-  // There is a marker that is not believed: the file comes back, and stays.
+  // There is a marker that is not believed: the file comes back, and both stay.
+  EvictionMarker forged;
+  forged.document = documentNumber(77);
+  forged.contents = {hash, 12};
+  for (const std::string& text : {std::string("no marker"), forged.asText()}) {
+    rig.write(".a.skein-old", "the document");
+    rig.write(".a.skein", text);
+    note((rig.top / "drive").string());
+    ASSERT_EQ(brief(recoverUnfinishedWork(rig.places())), "none");
+    EXPECT_EQ(contentsOf(path), "the document");
+    EXPECT_TRUE(std::filesystem::remove(rig.top / "drive/.a.skein"));
+    std::filesystem::remove(path);
+  }
+
+  // The marker was moved away, and the cloud's contents are spoiled: the file is the only copy.
+  const auto object = rig.top / "cloud/objects" / hash.asString().substr(0, 2) / hash.asString();
+  std::filesystem::permissions(object, std::filesystem::perms::owner_all);
+  std::ofstream(object) << "the docum3nt";
   rig.write(".a.skein-old", "the document");
-  rig.write(".a.skein", "no marker");
   note((rig.top / "drive").string());
   ASSERT_EQ(brief(recoverUnfinishedWork(rig.places())), "none");
   EXPECT_EQ(contentsOf(path), "the document");
   std::filesystem::remove(path);
-  std::filesystem::remove(rig.top / "drive/.a.skein");
 
   // The folder was renamed since, and another has its name.
   std::filesystem::create_directory(rig.top / "drive/f");
@@ -461,11 +536,13 @@ TEST_F(EvictionTest, AWriterThatCameAtTheLastMomentKeepsTheFile) {
   EXPECT_EQ(contentsOf(path), "the document, and more");
 
   // And when the name is taken, too, both stay.
+  // One place that cannot be recovered keeps none of the others from it.
   rig.write(".a.skein-old", "third");
+  ASSERT_TRUE(rig.records->beginWork({0, "/elsewhere/a", 0, {}}));
   ASSERT_TRUE(rig.records->beginWork({0, path, 0, {}}));
-  ASSERT_EQ(brief(recoverUnfinishedWork(rig.places())), "none");
+  EXPECT_NE(recoverUnfinishedWork(rig.places()), nullptr);
   EXPECT_EQ(rig.names(), (std::vector<std::string>{"a", "a 2"}));
-  EXPECT_EQ(rig.records->unfinishedWork()->size(), 0u);
+  EXPECT_EQ(rig.records->unfinishedWork()->size(), 1u);
 }
 
 TEST(EvictionMarkerTest, WhatIsNoMarkerIsNotTakenForOne) {
@@ -476,6 +553,9 @@ TEST(EvictionMarkerTest, WhatIsNoMarkerIsNotTakenForOne) {
   std::string later = text;
   later.insert(later.find("end\n"), "colour green\n");
   EXPECT_TRUE(EvictionMarker::parse(later));
+  std::string special = text;
+  special.replace(special.find("mode 600"), 8, "mode 4755");
+  EXPECT_EQ(EvictionMarker::parse(special)->mode, 0755u);
   EXPECT_FALSE(EvictionMarker::parse(""));
   EXPECT_FALSE(EvictionMarker::parse(text + "more"));
   for (std::size_t cut = 0; cut < text.size(); ++cut) {

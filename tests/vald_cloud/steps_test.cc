@@ -6,6 +6,7 @@
 #include <filesystem>
 #include <functional>
 
+#include "linux/vald/cloud/CloudRecovery.h"
 #include "tests/vald_cloud/CloudRig.h"
 #include "tests/vald_cloud/DiskWaits.h"
 
@@ -92,6 +93,21 @@ TEST_F(StepsTest, ADownloadIsOnTheDiskBeforeItsMarkerGoes) {
             (Steps{"journal begin drive/a", "commit", "create file .a.skein-part",
                    "sync drive/.a.skein-part", "sync drive/.a.skein-part", "rename .a.skein-part",
                    "sync drive", "unlink .a.skein", "sync drive", "journal end drive/a"}));
+}
+
+TEST_F(StepsTest, TheKeyOfANewCloudIsOnTheDiskBeforeItSealsAnything) {
+  EXPECT_EQ(stepsOf([&] { CloudContents::open((rig.top / "new").string(), rig.files); }),
+            (Steps{"make folder objects", "make folder incoming", "create file key",
+                   "sync new/incoming/key", "rename key", "sync new"}));
+}
+
+TEST_F(StepsTest, WhatIsRecoveredIsOnTheDiskBeforeItsNoteEnds) {
+  rig.write(".a.skein-old", "late words");
+  StorePlace place;
+  ASSERT_EQ(brief(rig.roots.locate(path, place)), "none");
+  ASSERT_TRUE(rig.places().beginWork(place, {}));
+  EXPECT_EQ(stepsOf([&] { EXPECT_EQ(brief(recoverUnfinishedWork(rig.places())), "none"); }),
+            (Steps{"rename .a.skein-old", "sync drive", "journal end drive/a"}));
 }
 
 TEST_F(StepsTest, WhatIsCollectedIsLetGoOfBeforeItGoes) {

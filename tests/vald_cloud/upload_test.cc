@@ -79,6 +79,10 @@ TEST_F(UploadTest, ADocumentGoesUpWhenItHasSettled) {
   ASSERT_TRUE(std::holds_alternative<UploadTooEarly>(result));
   EXPECT_LE(std::get<UploadTooEarly>(result).wait, std::chrono::hours(1));
   EXPECT_GT(std::get<UploadTooEarly>(result).wait, std::chrono::minutes(50));
+  // The clock was put back: what lies far ahead changed long ago.
+  rig.clock.advance(-std::chrono::hours(5));
+  EXPECT_TRUE(std::holds_alternative<UploadDone>(
+      attemptUpload(rig.uploads(), kOne, path, std::chrono::hours(1), cancellation)));
 }
 
 TEST_F(UploadTest, AChangeDuringTheUploadBeginsItAnew) {
@@ -177,6 +181,7 @@ TEST_F(UploadTest, AFullCloudIsTheDocumentsOwnFailure) {
   uploader->documentDidChange(kTwo, rig.write("small", "TEN BYTES!"));
   pass(seconds(2));
   EXPECT_EQ(cloudHas(kTwo), "TEN BYTES!");
+  EXPECT_EQ(rig.records->usedBytes(), 10u);
   rig.conditions.change([](auto& settings) { settings.quota = 100; });
   uploader->retry();
   executor->runAll();
@@ -199,6 +204,15 @@ TEST_F(UploadTest, FailuresOfTheCloudAreKeptAndARemovedDocumentIsForgotten) {
   EXPECT_EQ(state(kOne), "unknown");
   EXPECT_EQ(cloudHas(kOne), "nothing");
   whileUploading = nullptr;
+  // Removed when nothing stops the upload any more: the record that it writes goes, too.
+  rig.files.before = [&](FileStep step, std::string_view) {
+    if (step == FileStep::Rename) uploader->documentWasRemoved(kOne);
+  };
+  uploader->documentDidChange(kOne, rig.write("a", "other text"));
+  pass(seconds(2));
+  rig.files.before = nullptr;
+  EXPECT_EQ(state(kOne), "unknown");
+  EXPECT_EQ(cloudHas(kOne), "nothing");
   uploader->documentDidChange(kTwo, path + "-missing");
   pass(seconds(2));
   EXPECT_EQ(state(kTwo), "failed 4");

@@ -49,6 +49,22 @@ TEST(Coordinator, OverlappingPathsFollowEachOtherInOrder) {
   EXPECT_EQ(served.get_future().wait_for(std::chrono::seconds(30)), std::future_status::ready);
   waiter.join();
   EXPECT_EQ(coordinator.claim({"/s"}, now, other), nullptr);
+  other.release();
+
+  // Who waits behind one that gives up is served then, and not at its own deadline.
+  ASSERT_EQ(coordinator.claim({"/s/folder/a"}, later, held), nullptr);
+  std::thread impatient([&] {
+    FileCoordinator::Claim own;
+    EXPECT_NE(coordinator.claim({"/s"}, Clock::now() + std::chrono::seconds(1), own), nullptr);
+  });
+  EXPECT_TRUE(becomesTrue([&] {
+    const bool isFree = coordinator.claim({"/s/z"}, now, other) == nullptr;
+    if (isFree) other.release();
+    return !isFree;
+  }));
+  EXPECT_EQ(coordinator.claim({"/s/z"}, later, other), nullptr);
+  EXPECT_LT(Clock::now(), later - std::chrono::seconds(30));
+  impatient.join();
 }
 
 TEST(Operations, OfManyThreadsOnOneTreeLoseNothing) {

@@ -126,6 +126,10 @@ TEST(Operations, NeverFollowALinkOutOfTheStore) {
   std::filesystem::create_directory_symlink(drive.outside, drive.at("out"));
   EXPECT_NE(files.remove(drive.at("out/secret"), kRequest).error, nullptr);
   EXPECT_NE(files.createFolder(drive.at("out"), "x", kRequest).error, nullptr);
+  // Nor one that stays in it: the item is where its folder is.
+  drive.makeFolder("folder");
+  std::filesystem::create_directory_symlink("folder", drive.at("in"));
+  EXPECT_NE(files.createFolder(drive.at("in"), "x", kRequest).error, nullptr);
   EXPECT_NE(files.rename(drive.at("x/../../outside/secret"), "x", kRequest).error, nullptr);
   EXPECT_NE(files.setTags(drive.at("out/secret"), {"t"}).error, nullptr);
   EXPECT_EQ(files.remove(drive.at("out"), kRequest).error, nullptr);
