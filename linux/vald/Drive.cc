@@ -64,6 +64,13 @@ std::unique_ptr<Drive> Drive::open(DriveOptions options, StoreListener& listener
         return Cloud::open(options.cloud, *drive->_operations, log, problem);
       });
   if (!drive->_cloud) return nullptr;
+  for (const OperationEntry& entry : drive->_operations->recovered()) {
+    if (entry.isCopied() && entry.kind != OperationKind::Import &&
+        entry.state == OperationState::Done) {
+      options.store.copies.emplace_back(documentPath(nullptr, entry.path),
+                                        documentPath(nullptr, entry.destination));
+    }
+  }
   drive->_store = FolderStore::openFolder(std::move(options.store), *drive, log, error);
   if (!drive->_store) return nullptr;
 

@@ -1,4 +1,5 @@
 // What a crash left: finished where the change was made, undone where it was not.
+#include <set>
 #include <system_error>
 
 #include "linux/vald/files/FileErrors.h"
@@ -18,9 +19,11 @@ NSErrorPtr FileOperations::recover() {
   NSErrorPtr error;
   std::vector<OperationEntry> open = _journal->openEntries(&error);
   if (error) return error;
+  std::set<std::string> wanted;
   for (OperationEntry& entry : open) {
     const std::optional<OperationState> state = recoverEntry(entry);
     if (!state) {
+      wanted.insert(nameOfPath(entry.aside));
       VL_ERROR(_log, "[ERROR] can't finish to %@ %@ now; the next start tries again",
                operationName(entry.kind), printable(entry.path));
       continue;
@@ -32,7 +35,7 @@ NSErrorPtr FileOperations::recover() {
               *state == OperationState::Done ? "finished" : "undone");
     _recovered.push_back(std::move(entry));
   }
-  if (const int failure = _staging.clear(_files)) {
+  if (const int failure = _staging.clear(_files, wanted)) {
     VL_ERROR(_log, "[ERROR] can't clear the staging folder: %@",
              std::generic_category().message(failure));
   }
@@ -49,12 +52,14 @@ std::optional<OperationState> FileOperations::recoverEntry(const OperationEntry&
     case OperationKind::Import: return recoverImport(entry);
     case OperationKind::Remove: return recoverRemoval(entry);
     case OperationKind::Trash: return recoverTrash(entry);
-    case OperationKind::PutBack: return recoverPutBack(entry);
+    case OperationKind::PutBack:
+      return entry.isCopied() ? recoverMoveAcross(entry) : recoverPutBack(entry);
     case OperationKind::CreateFolder:
     case OperationKind::MakeAlias:
       return exists(entry.destination) ? OperationState::Done : OperationState::Undone;
     case OperationKind::Rename:
     case OperationKind::Move:
+      if (entry.isCopied()) return recoverMoveAcross(entry);
       // One step: it was taken or not.
       return exists(entry.destination) && !exists(entry.path) ? OperationState::Done
                                                               : OperationState::Undone;
@@ -67,8 +72,7 @@ int FileOperations::finishLinking(const OperationEntry& entry) {
   DirectoryHandle folders[2];
   std::string names[2];
   struct stat found[2];
-  const bool isImport = entry.kind == OperationKind::Import;
-  const std::string* paths[2] = {isImport ? &entry.aside : &entry.path,
+  const std::string* paths[2] = {entry.isCopied() ? &entry.aside : &entry.path,
                                  entry.destination.empty() ? &entry.aside : &entry.destination};
   for (int at = 0; at < 2; ++at) {
     StagingPlace staged;

@@ -11,8 +11,6 @@ namespace skein::vald {
 
 namespace {
 
-constexpr unsigned kMostTakenNames = 1000;
-
 FileResult cancelledRemoval(const StorePlace& place, const std::string& name) {
   const bool isTaken = name != place.name;
   const std::string now = joinPath(place.folderPath(), name);
@@ -63,17 +61,23 @@ FileResult FileOperations::removeAside(const StorePlace& place, const FileReques
     return {{}, fileError(failure, "can't remove", path)};
   }
   if (failure != 0) return {{}, fileError(failure, "can't remove", path)};
-  std::string name;
+  const auto takeBack = [&](std::string& name) {
+    const int problem = putBack(aside->folder, name, place);
+    // A disk that refuses this may forget in a power cut that it is back; it is, all the same.
+    if (problem == 0) syncFolders(place.folder, &aside->folder);
+    return problem;
+  };
+  std::string name = aside->name;
   // Gone for good before the first part of it is deleted: a power cut shall not bring
   // half a tree back.
   failure = isAsked(request, aside->folder, aside->name) ? syncFolders(place.folder, &aside->folder)
                                                          : ESTALE;
   if (failure != 0) {
-    if (putBackRemoved(*aside, place, name) != 0) scope->leaveOpen();
+    if (takeBack(name) != 0) scope->leaveOpen();
     return {{}, fileError(failure, "can't remove", path)};
   }
   if (request.removed && !request.removed()) {
-    failure = putBackRemoved(*aside, place, name);
+    failure = takeBack(name);
     if (failure == 0) return cancelledRemoval(place, name);
     VL_ERROR(_log, "[ERROR] can't put %@ back (%@), so it is removed", path,
              std::generic_category().message(failure));
@@ -96,19 +100,6 @@ FileResult FileOperations::removeAside(const StorePlace& place, const FileReques
     rest();
   }
   return {};
-}
-
-int FileOperations::putBackRemoved(const StagingPlace& aside, const StorePlace& place,
-                                   std::string& name) {
-  int failure = EEXIST;
-  for (unsigned number = 1; failure == EEXIST && number <= kMostTakenNames; ++number) {
-    name = numberedName(place.name, number, ' ');
-    failure =
-        _files.renameWithoutReplacing(aside.folder.get(), aside.name, place.folder.get(), name);
-  }
-  // A disk that refuses this one may forget the put back in a power cut; it is made all the same.
-  if (failure == 0) syncFolders(place.folder, &aside.folder);
-  return failure;
 }
 
 }  // namespace skein::vald

@@ -54,6 +54,10 @@ NSErrorPtr Staging::place(const char* prefix, const StorePlace& beside, StagingP
   return nullptr;
 }
 
+std::string Staging::sourceName(const std::string& copyPath) {
+  return kRemovalPrefix + nameOfPath(copyPath).substr(sizeof kImportPrefix - 1);
+}
+
 void Staging::refuseOutside(const StorePlace& beside) {
   MutexLock lock(_mutex);
   _refused.insert(beside.root->path);
@@ -80,9 +84,10 @@ NSErrorPtr Staging::find(const std::string& path, const StoreRoots& roots,
   return nullptr;
 }
 
-int Staging::clear(FileLayer& files) const {
+int Staging::clear(FileLayer& files, const std::set<std::string>& wanted) const {
   int first = 0;
   const int failure = _folder.list([&](const std::string& name) {
+    if (wanted.contains(name)) return true;
     const int own = removeTree(files, _folder, name);
     if (first == 0) first = own;
     return true;

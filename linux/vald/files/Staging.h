@@ -30,14 +30,18 @@ class Staging {
 
   // `prefix`: kImportPrefix or kRemovalPrefix. `beside`: where the item goes or is.
   NSErrorPtr place(const char* prefix, const StorePlace& beside, StagingPlace& place);
+  // The name beside a moved item under which it waits, out of sight, to be deleted, when its copy
+  // is staged at `copyPath`, which place() gave.
+  static std::string sourceName(const std::string& copyPath);
   // The outside staging of this root turned out to be another volume to the system (as
   // with quotas by project): from now on in the folder itself.
   void refuseOutside(const StorePlace& beside);
 
   // Where `path`, one that place() gave in this or an earlier run, is now.
   NSErrorPtr find(const std::string& path, const StoreRoots& roots, StagingPlace& place) const;
-  // Deletes all that is outside: nobody is using it at start.
-  int clear(FileLayer& files) const;
+  // Deletes all that is outside but the names `wanted`, which entries that could not be ended
+  // have: nobody is using the rest at start.
+  int clear(FileLayer& files, const std::set<std::string>& wanted) const;
 
  private:
   std::string _path;
