@@ -405,57 +405,6 @@ TEST_F(Files, FoldersMovesAndAliasesGoWherePeopleExpect) {
   EXPECT_EQ(drive.run({"doctor"}).code, 0);
 }
 
-TEST_F(Files, AMoveToAnotherVolumeKeepsWhoItIsAndCanBeInterrupted) {
-  const fs::path data = fs::path(drive.state()).parent_path() / "data";
-  char volume[] = "/dev/shm/skein-data-XXXXXX";
-  struct stat own {};
-  struct stat other {};
-  if (mkdtemp(volume) == nullptr || ::stat(drive.store().c_str(), &own) != 0 ||
-      ::stat(volume, &other) != 0 || own.st_dev == other.st_dev) {
-    fs::remove(volume);
-    GTEST_SKIP() << "no second volume";
-  }
-  // Apps' folders are with the data.
-  fs::remove(data);
-  fs::create_directory_symlink(volume, data);
-  fs::create_directory(data / "applications");
-  std::ofstream(data / "applications/org.example.App.desktop")
-      << "[Desktop Entry]\nType=Application\nName=App\nX-Skein-Containers=org.example.App\n";
-  drive.write("/tree/sub/doc.txt", "doc");
-  drive.write("/tree/large", std::string(300'000'000, 'x'));
-  skein({"tag", "/tree/sub", "Red"});
-  const std::string document = id("/tree/sub/doc.txt");
-  const std::string folder = id("/tree/sub");
-
-  const auto isCopying = [&] {
-    std::error_code gone;
-    for (fs::recursive_directory_iterator at(volume, gone), end; at != end; at.increment(gone)) {
-      if (at->path().filename().string().starts_with(".skein-import-")) return true;
-    }
-    return false;
-  };
-  const auto move = drive.start({"mv", "/tree", "/App"});
-  ASSERT_TRUE(comesTrue(isCopying));
-  sendSignal(move->pid(), SIGINT);
-  EXPECT_EQ(move->finish(60s), 130) << move->errors;
-  EXPECT_NE(move->errors.find("interrupt"), std::string::npos) << move->errors;
-  EXPECT_FALSE(isCopying());
-  EXPECT_EQ(id("/tree/sub/doc.txt"), document);
-  EXPECT_TRUE(drive.list("/App").empty());
-
-  skein({"mv", "/tree", "/App"});
-  EXPECT_EQ(id("/App/tree/sub/doc.txt"), document);
-  EXPECT_EQ(id("/App/tree/sub"), folder);
-  EXPECT_EQ(skein({"cat", "/App/tree/sub/doc.txt"}), (Lines{"doc"}));
-  EXPECT_EQ(drive.list("/"), (Lines{"App"}));
-  EXPECT_TRUE(fs::is_empty(drive.store()));
-  skein({"mv", "/App/tree/sub/doc.txt", "/back.txt"});
-  EXPECT_EQ(id("/back.txt"), document);
-  EXPECT_EQ(drive.run({"doctor"}).code, 0);
-  drive.run({"stop"});
-  fs::remove_all(volume);
-}
-
 TEST_F(Files, TheTrashGivesBackWhatIsNamedClearly) {
   fs::create_directories(drive.store() + "/one");
   fs::create_directories(drive.store() + "/two");
