@@ -96,10 +96,9 @@ struct Forgotten {
   bool isThere = false;
 };
 
-NSErrorPtr find(const Invocation& invocation, const DriveTops& tops, Forgotten& drive) {
-  for (const NotedDrive& noted : notedDrives(tops.state)) {
-    if (noted.name != invocation.drive.store) continue;
-    drive = {noted.name, noted.path, noted.isThere};
+NSErrorPtr find(const Invocation& invocation, Forgotten& drive) {
+  if (const auto noted = invocation.drive.noted()) {
+    drive = {noted->name, noted->path, noted->isThere};
     return nullptr;
   }
   NSErrorPtr error;
@@ -132,7 +131,7 @@ int runForget(const Invocation& invocation, const ForgetOptions& options) {
   NSErrorPtr error;
   const DriveTops tops = DrivePaths::tops(&error);
   Forgotten drive;
-  if (!error) error = find(invocation, tops, drive);
+  if (!error) error = find(invocation, drive);
   if (error) return complainAbout(error);
   DrivePaths paths;
   paths.stateDirectory = tops.state + '/' + drive.name;

@@ -242,7 +242,8 @@ std::string isoDate(NSDate date) {
 }
 
 void complain(const std::string& text) {
-  const std::string line = "skein: " + (isatty(STDERR_FILENO) == 1 ? escaped(text) : text) + '\n';
+  // A log is shown on terminals, too.
+  const std::string line = "skein: " + escaped(text) + '\n';
   [[maybe_unused]] const ssize_t written = ::write(STDERR_FILENO, line.data(), line.size());
 }
 

@@ -56,7 +56,7 @@ std::optional<std::string> bytesOfHexadecimal(std::string_view digits);
 std::string localDate(const std::optional<NSDate>& date);
 std::string isoDate(NSDate date);
 
-// "skein: TEXT" on standard error, escaped when that is a terminal.
+// "skein: TEXT" on standard error, escaped.
 void complain(const std::string& text);
 // complain() about an error, and its exit code.
 int complainAbout(const NSErrorPtr& error);

@@ -49,7 +49,10 @@ std::optional<UploadConsent> askAbout(const std::string& path) {
 }  // namespace
 
 std::string DriveChoice::folder(NSErrorOut error) const {
-  if (!store.empty()) return store;
+  if (!store.empty()) {
+    const auto drive = noted();
+    return drive && drive->isThere ? drive->path : store;
+  }
   const char* home = std::getenv("HOME");
   std::string folder = std::string(home != nullptr ? home : "") + "/Skein";
   struct stat status {};
@@ -94,7 +97,26 @@ DrivePaths DriveChoice::paths(NSErrorOut error) const {
   return paths;
 }
 
+std::optional<NotedDrive> DriveChoice::noted() const {
+  if (store.empty() || store.find('/') != std::string::npos || isFolder(store)) return std::nullopt;
+  for (NotedDrive& drive : notedDrives(DrivePaths::tops(nullptr).state)) {
+    if (drive.name == store) return std::move(drive);
+  }
+  return std::nullopt;
+}
+
 DrivePaths DriveChoice::known(NSErrorOut error) const {
+  if (const auto drive = noted(); drive && !drive->isThere) {
+    DrivePaths paths;
+    paths.store = drive->path.empty() ? drive->name : drive->path;
+    paths.driveID = drive->name;
+    paths.stateDirectory = DrivePaths::tops(nullptr).state + '/' + drive->name;
+    paths.hostSocket = paths.stateDirectory + kHostSocketName;
+    paths.daemonSocket = paths.stateDirectory + kDaemonSocketName;
+    paths.hostLog = paths.stateDirectory + "/skein-host.log";
+    paths.daemonLog = paths.stateDirectory + "/vald.log";
+    return paths;
+  }
   const std::string path = folder(error);
   if (path.empty()) return {};
   if (DrivePaths::isKnown(path)) return DrivePaths::forStore(path, error);

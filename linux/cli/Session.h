@@ -10,6 +10,7 @@
 #include "base/Mutex.h"
 #include "base/ThreadPool.h"
 #include "linux/cli/Interruption.h"
+#include "linux/protocol/DriveIdentity.h"
 #include "linux/protocol/DrivePaths.h"
 #include "linux/protocol/HostClient.h"
 
@@ -17,14 +18,17 @@ namespace skein::cli {
 
 // The drive that a command is about: $SKEIN_STORE or --store, else ~/Skein.
 struct DriveChoice {
-  std::string store;  // as --store gave it; may be empty
+  std::string store;  // as --store gave it: a folder, or a drive's identity; may be empty
 
   // Opens the folder as a drive. The first time it says so, with what will be copied where;
   // on a terminal it asks before anything is made. Stores an error that says what to do when
   // there is no such folder, or the answer was no.
   DrivePaths paths(NSErrorOut error) const;
-  // Of a drive that was opened before; nothing is made. Stores an error when it was not.
+  // Of a drive that was opened before; nothing is made. Stores an error when it was not. Of a
+  // drive that is named by its identity, and whose folder is gone, only what its state holds.
   DrivePaths known(NSErrorOut error) const;
+  // The drive whose identity was given, as "skein drives" shows it; nil when it is none.
+  std::optional<NotedDrive> noted() const;
 
  private:
   std::string folder(NSErrorOut error) const;

@@ -82,6 +82,14 @@ DiskEntries::iterator markerOf(DiskEntries& onDisk, const std::string& name) {
   return isMarker ? first : onDisk.end();
 }
 
+// Whether it stands beside the present document that it is named after.
+bool isLeftMarker(const std::string& name, const NSFileProviderItems& items) {
+  return mayBeMarker(name) &&
+         std::any_of(items.begin(), items.end(), [&](const NSFileProviderItemPtr& item) {
+           return item->isDownloaded() && '.' + item->filename() + ".skein" == name;
+         });
+}
+
 std::string joined(const std::string& folder, const std::string& name) {
   return folder == "/" ? folder + name : folder + '/' + name;
 }
@@ -409,7 +417,10 @@ class StoreCheck::Work final : public std::enable_shared_from_this<Work> {
       }
       if (useOfReservedName(name) != nullptr) continue;  // vald leaves it out, too
       differences.push_back({HostDifference::Kind::MissingInListing, joined(folder.drivePath, name),
-                             "on disk, but not listed"});
+                             isLeftMarker(name, look->items)
+                                 ? "the marker of an older version: the document was written anew "
+                                   "while it was evicted; evict the document, or remove this file"
+                                 : "on disk, but not listed"});
     }
     if (!differences.empty()) {
       settle(look, std::move(differences));

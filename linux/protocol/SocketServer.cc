@@ -40,14 +40,18 @@ class Address {
     if (isOwn()) unlink(_path.c_str());
   }
 
-  // Becomes readable when something in the socket's folder comes or goes.
+  // Becomes readable when something in the socket's folder comes or goes, or a folder above it,
+  // as far as those can be watched, moves.
   FileDescriptor watch() const {
+    constexpr std::uint32_t kItself = IN_DELETE_SELF | IN_MOVE_SELF | IN_ONLYDIR;
     FileDescriptor watch(inotify_init1(IN_CLOEXEC | IN_NONBLOCK));
-    const std::string folder = _path.substr(0, _path.rfind('/') + 1);
+    std::string folder = _path.substr(0, _path.rfind('/'));
     if (watch && inotify_add_watch(watch.get(), folder.c_str(),
-                                   IN_CREATE | IN_DELETE | IN_MOVE | IN_DELETE_SELF | IN_MOVE_SELF |
-                                       IN_ONLYDIR) < 0) {
+                                   IN_CREATE | IN_DELETE | IN_MOVE | kItself) < 0) {
       watch.reset();
+    }
+    while (watch && (folder.resize(folder.rfind('/')), !folder.empty())) {
+      inotify_add_watch(watch.get(), folder.c_str(), kItself);
     }
     return watch;
   }

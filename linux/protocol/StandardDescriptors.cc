@@ -9,9 +9,11 @@ namespace skein {
 
 void openStandardDescriptors() {
   for (const int standard : {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO}) {
-    // The lowest free number is the one that is closed: those below it are open by now.
+    // The lowest free number is the one that is closed: those below it are open by now. What it
+    // is for goes on to fail.
+    const int refused = standard == STDIN_FILENO ? O_WRONLY : O_RDONLY;
     if (fcntl(standard, F_GETFD) < 0) [[maybe_unused]]
-      const int opened = open("/dev/null", O_RDWR);
+      const int opened = open("/dev/null", refused);
   }
 }
 

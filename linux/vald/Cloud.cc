@@ -53,7 +53,8 @@ Cloud::Cloud(Options options, FileOperations& operations, Log& log)
 std::unique_ptr<Cloud> Cloud::open(Options options, FileOperations& operations, Log& log,
                                    NSErrorOut error) {
   std::unique_ptr<Cloud> cloud(new Cloud(std::move(options), operations, log));
-  auto contents = CloudContents::open(cloud->_options.folder, operations.layer());
+  auto contents =
+      CloudContents::open(cloud->_options.folder, operations.layer(), cloud->_options.drives);
   if (!contents) {
     error.store(contents.error());
     return nullptr;
@@ -88,12 +89,16 @@ std::unique_ptr<Cloud> Cloud::open(Options options, FileOperations& operations, 
 Cloud::~Cloud() { stop(); }
 
 CloudPlaces Cloud::places() {
-  return {_operations.roots(), _operations.layer(), *_contents, *_records,
+  return {_operations.roots(),
+          _operations.layer(),
+          *_contents,
+          *_records,
           [&operations = _operations](const std::string& path) -> Outcome<std::shared_ptr<void>> {
             std::shared_ptr<void> held;
             if (NSErrorPtr error = operations.coordinate(path, held)) return error;
             return held;
-          }};
+          },
+          _options.trashes};
 }
 
 bool Cloud::probeSharing() {

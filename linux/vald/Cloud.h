@@ -27,8 +27,10 @@ class Cloud final : public LocalCloud {
     // it runs. Empty: yes.
     std::function<bool()> mayUpload = {};
     bool allowsConditions = false;
-    std::string desktopThumbnails;  // the desktop's cache of them; empty: none are made
-    std::size_t downloads = 4;      // at a time
+    std::string desktopThumbnails;     // the desktop's cache of them; empty: none are made
+    std::string drives;                // holds the folders of all drives, see CloudContents
+    std::vector<std::string> trashes;  // the desktop's own, where markers of the drive may lie
+    std::size_t downloads = 4;         // at a time
     Uploader::Options uploads;
   };
   // Null with an error. `operations` and `log` outlive it.

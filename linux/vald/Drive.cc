@@ -1,5 +1,8 @@
 #include "linux/vald/Drive.h"
 
+#include <sys/stat.h>
+
+#include <cerrno>
 #include <cstring>
 #include <utility>
 
@@ -71,8 +74,20 @@ std::unique_ptr<Drive> Drive::open(DriveOptions options, StoreListener& listener
                                         documentPath(nullptr, entry.destination));
     }
   }
-  drive->_store = FolderStore::openFolder(std::move(options.store), *drive, log, error);
-  if (!drive->_store) return nullptr;
+  // The index shares a disk with the journal, and has no room of its own kept.
+  options.store.makeRoom = [&journal = drive->_operations->journal(),
+                            folder = options.stateDirectory] {
+    struct stat status {};
+    return stat(folder.c_str(), &status) == 0 && journal.makeRoom(status.st_dev);
+  };
+  NSErrorPtr problem;
+  do {
+    drive->_store = FolderStore::openFolder(options.store, *drive, log, &problem);
+  } while (!drive->_store && problem->code() == ENOSPC && options.store.makeRoom());
+  if (!drive->_store) {
+    error.store(std::move(problem));
+    return nullptr;
+  }
 
   drive->_files = std::make_unique<Files>(
       FilesParts{*drive->_store, *drive->_operations, drive->_cloud->places(),

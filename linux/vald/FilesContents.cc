@@ -97,7 +97,10 @@ void Files::setPinned(NSURLPtr url, bool pinned, Reply<NSErrorPtr> reply) {
       return answered(fileErrorWithWords(NSFileWriteNoPermissionError, EINVAL,
                                          "only a document can be pinned", url->path()));
     }
-    answered(_parts.places.records.setPinned(subject.item->fileObjectID(), pinned));
+    NSErrorPtr error = _parts.places.records.setPinned(subject.item->fileObjectID(), pinned);
+    // It is found again as this document when the index is lost.
+    if (!error && pinned && writeHint(subject)) _parts.store.lookAtPaths({subject.place.path});
+    answered(std::move(error));
   });
 }
 

@@ -103,7 +103,8 @@ std::unique_ptr<FolderStore> FolderStore::openFolder(StoreOptions options, Store
   markIndexOpen(*database);
   if (database->failed()) {
     error.store(vl_errorWithPOSIXCode(
-        EIO, "The index " + options.databasePath + " cannot be used: " + database->message()));
+        indexLacksRoom(*database) ? ENOSPC : EIO,
+        "The index " + options.databasePath + " cannot be used: " + database->message()));
     return nullptr;
   }
   auto store = std::unique_ptr<FolderStore>(new FolderStore(options, *drive, *journalID));

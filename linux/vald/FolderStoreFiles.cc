@@ -93,15 +93,21 @@ NSErrorPtr FolderStore::changeDetails(VLFileObjectID id, std::function<void(Item
       if (details == found->details) return nullptr;
     }
   }
-  auto isChanged = std::make_shared<bool>(false);
-  const bool isDone = _writer->perform([this, id, change = std::move(change), isChanged] {
-    *isChanged = _writer->changeDetails(id, change);
+  struct Ended {
+    bool isChanged = false;
+    std::string failure;
+    bool lacksRoom = false;
+  };
+  auto outcome = std::make_shared<Ended>();
+  // Why it failed is asked at once: the writer may be trying again when this goes on.
+  const bool isDone = _writer->perform([this, id, change = std::move(change), outcome] {
+    *outcome = {_writer->changeDetails(id, change), _writer->failure(), _writer->lacksRoom()};
   });
   if (!isDone) return vl_errorWithPOSIXCode(ETIMEDOUT, "The index could not be written in time.");
-  if (*isChanged) return nullptr;
-  const std::string failure = _writer->failure();
-  if (failure.empty()) return noSuchFile("There is no item " + id.asString() + ".");
-  return vl_errorWithPOSIXCode(EIO, "Nothing was changed, since " + failure + ".");
+  if (outcome->isChanged) return nullptr;
+  if (outcome->failure.empty()) return noSuchFile("There is no item " + id.asString() + ".");
+  return vl_errorWithPOSIXCode(outcome->lacksRoom ? ENOSPC : EIO,
+                               "Nothing was changed, since " + outcome->failure + ".");
 }
 
 ItemDetails FolderStore::details(VLFileObjectID id) {

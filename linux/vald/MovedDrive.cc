@@ -6,8 +6,7 @@
 
 #include <cerrno>
 #include <climits>
-#include <filesystem>
-#include <fstream>
+#include <cstdio>
 #include <memory>
 
 #include "linux/protocol/FileDescriptor.h"
@@ -81,13 +80,13 @@ NSErrorPtr followMovedDrive(const std::string& stateDirectory, const std::string
     if (error) return error;
   }
   const std::string partial = note + ".new";
-  std::ofstream file(partial, std::ios::binary | std::ios::trunc);
-  file << store;
-  file.close();
-  std::error_code failure;
-  if (file) std::filesystem::rename(partial, note, failure);
-  if (!file || failure) return fileError(failure ? failure.value() : EIO, "can't write", note);
-  return nullptr;
+  FileDescriptor file(
+      open(partial.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_NOFOLLOW | O_CLOEXEC, 0600));
+  errno = file ? ENOSPC : errno;
+  const bool isWritten =
+      file && write(file.get(), store.data(), store.size()) == static_cast<ssize_t>(store.size()) &&
+      fchmod(file.get(), 0600) == 0 && rename(partial.c_str(), note.c_str()) == 0;
+  return isWritten ? nullptr : fileError(errno, "can't write", note);
 }
 
 }  // namespace skein::vald

@@ -339,6 +339,12 @@ void StoreWriter::fail() {
     VL_CRIT(_log, "[CRIT] %@", failure);
   }
   note(std::move(failure));
+  {
+    MutexLock lock(_mutex);
+    _lacksRoom = code == SQLITE_FULL;
+  }
+  // Then it is tried again at once.
+  if (code == SQLITE_FULL && _options.makeRoom && _options.makeRoom()) _lastTick -= kTick;
 }
 
 void StoreWriter::note(std::string failure) {
@@ -395,6 +401,11 @@ void StoreWriter::status(LocalDaemonStatus& status) {
 bool StoreWriter::isUnwatched(FolderKey folder) const {
   MutexLock lock(_mutex);
   return _unwatched.contains(folder);
+}
+
+bool StoreWriter::lacksRoom() const {
+  MutexLock lock(_mutex);
+  return _lacksRoom;
 }
 
 std::string StoreWriter::failure() const {

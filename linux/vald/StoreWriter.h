@@ -93,6 +93,8 @@ class StoreWriter {
   bool isUnwatched(FolderKey folder) const SKEIN_EXCLUDES(_mutex);
   // Why the index cannot be used; empty while it can.
   std::string failure() const SKEIN_EXCLUDES(_mutex);
+  // Whether that is since the disk is full.
+  bool lacksRoom() const SKEIN_EXCLUDES(_mutex);
   Watcher& watcher() { return _watcher; }
   // Whether the attributes of what the first scan found are still being read.
   bool isReadingAttributes() const { return _isReadingAttributes.load(); }
@@ -213,6 +215,7 @@ class StoreWriter {
   bool _ended SKEIN_GUARDED_BY(_mutex) = false;
   std::unordered_set<FolderKey> _unwatched SKEIN_GUARDED_BY(_mutex);
   std::string _failure SKEIN_GUARDED_BY(_mutex);
+  bool _lacksRoom SKEIN_GUARDED_BY(_mutex) = false;
   LocalDaemonStatus _status SKEIN_GUARDED_BY(_mutex);
   std::atomic<std::uint64_t> _rank{0};
   std::atomic<std::uint64_t> _oldestRank{0};

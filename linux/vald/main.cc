@@ -1,5 +1,6 @@
 // vald: the daemon of one drive.
 #include <sys/resource.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <atomic>
@@ -18,6 +19,7 @@
 
 #include "linux/desktop/DesktopEntries.h"
 #include "linux/protocol/DaemonServer.h"
+#include "linux/protocol/Deadlines.h"
 #include "linux/protocol/DrivePaths.h"
 #include "linux/protocol/LeftOutNote.h"
 #include "linux/protocol/LogFile.h"
@@ -36,6 +38,7 @@
 #include "linux/vald/DriveListener.h"
 #include "linux/vald/EventSubscribers.h"
 #include "linux/vald/FaultInjector.h"
+#include "linux/vald/FolderLock.h"
 #include "linux/vald/ItemUpdateSenders.h"
 #include "linux/vald/MovedDrive.h"
 #include "linux/vald/Store.h"
@@ -53,6 +56,10 @@ namespace {
 constexpr std::size_t kWorkers = 4;
 constexpr std::chrono::milliseconds kQuietApplications{300};
 constexpr std::chrono::milliseconds kPatienceWithPredecessor{3000};
+// One whose state was moved away is about to end. Two of these are over before whoever starts this
+// process has waited for too long.
+constexpr std::chrono::milliseconds kPatienceWithOtherState{1200};
+static_assert(2 * kPatienceWithOtherState < deadlines::kProgramStart);
 // What clients have to read what was answered last.
 constexpr std::chrono::milliseconds kLastReply{200};
 
@@ -93,6 +100,23 @@ std::vector<std::string> ownFoldersOf(const DrivePaths& paths) {
     folders.push_back(std::move(thumbnails));
   }
   return folders;
+}
+
+// Where a file manager puts what it trashes from the drive: into the user's own trash, or that of
+// the drive's volume. The trashes within the drive are the drive's.
+std::vector<std::string> desktopTrashes(const DrivePaths& paths) {
+  const std::string data = parentOfPath(parentOfPath(parentOfPath(paths.cloudDirectory)));
+  std::string volume = paths.store;
+  struct stat drive {};
+  struct stat above {};
+  if (stat(volume.c_str(), &drive) == 0) {
+    while (!volume.empty() && stat((volume + "/..").c_str(), &above) == 0 &&
+           above.st_dev == drive.st_dev) {
+      volume = parentOfPath(volume);
+    }
+  }
+  const std::string user = std::to_string(geteuid());
+  return {joinPath(data, "Trash"), volume + "/.Trash-" + user, volume + "/.Trash/" + user};
 }
 
 // Anew when the database is damaged, which may show only when it is read.
@@ -166,6 +190,8 @@ int serve(const DrivePaths& paths, Background& background, Log& log) {
   };
   cloud.allowsConditions = mayFail;
   cloud.desktopThumbnails = DesktopThumbnails::userFolder();
+  cloud.drives = parentOfPath(parentOfPath(paths.cloudDirectory));
+  cloud.trashes = desktopTrashes(paths);
   FileLayer layer;
   SharedItems sharedItems;
   SharingListener sharingListener(sharedItems, listener);
@@ -278,7 +304,13 @@ int run(const std::vector<std::string>& arguments) {
       UploadPolicy::fromEnvironment().uploads != LocalCloudStatus::Uploads::Off) {
     setUploadConsent(paths.stateDirectory, UploadConsent::Given);
   }
-  const auto log = LogFile::open({paths.daemonLog, line->foreground}, &error);
+  // The lock above is the state's. What is served may be reached by another state, too. Taken by
+  // the process that goes on, since the system names who holds them.
+  FolderLock cloudLock;
+  FolderLock driveLock;
+  error = cloudLock.take(paths.cloudDirectory, kPatienceWithOtherState);
+  if (!error) error = driveLock.take(paths.store, kPatienceWithOtherState);
+  const auto log = error ? nullptr : LogFile::open({paths.daemonLog, line->foreground}, &error);
   if (!log) {
     background.failed(error->localizedDescription());
     return kExitFailure;

@@ -7,6 +7,7 @@
 #include "linux/protocol/UnixSocket.h"
 #include "linux/vald/ClosableExecutor.h"
 #include "linux/vald/CommandLine.h"
+#include "linux/vald/FolderLock.h"
 #include "tests/vald/TestDaemon.h"
 
 namespace skein::vald {
@@ -39,6 +40,22 @@ TEST(RunLock, IsHeldByOneUntilItGoes) {
             RunLock::Outcome::Failed);
   ASSERT_TRUE(error);
   EXPECT_NE(error->localizedDescription().find("/link"), std::string::npos);
+}
+
+TEST(FolderLock, IsHeldByOneWhateverTheFolderIsCalled) {
+  const TemporaryFolder folder;
+  const std::string name = folder.path + "/a";
+  std::filesystem::create_directory(name);
+  std::optional<FolderLock> first(std::in_place);
+  ASSERT_FALSE(first->take(name, kNoPatience));
+  std::filesystem::rename(name, folder.path + "/b");
+  const NSErrorPtr refusal = FolderLock().take(folder.path + "/b", kNoPatience);
+  ASSERT_TRUE(refusal);
+  EXPECT_NE(refusal->localizedDescription().find("kill " + std::to_string(getpid())),
+            std::string::npos)
+      << refusal->localizedDescription();
+  first.reset();
+  EXPECT_FALSE(FolderLock().take(folder.path + "/b", kNoPatience));
 }
 
 TEST(CommandLine, SaysWhatMakesNoSense) {

@@ -85,10 +85,11 @@ TemporaryFolder::~TemporaryFolder() {
   std::filesystem::remove_all(_path, ignored);
 }
 
-CloudRig::CloudRig(std::filesystem::path where) : top(std::move(where)) {
+CloudRig::CloudRig(std::filesystem::path where, const std::filesystem::path& drives)
+    : top(std::move(where)) {
   std::filesystem::create_directories(top / "drive");
   EXPECT_EQ(brief(roots.set({(top / "drive").string()})), "none");
-  auto openContents = CloudContents::open((top / "cloud").string(), files);
+  auto openContents = CloudContents::open((top / "cloud").string(), files, drives.string());
   EXPECT_TRUE(openContents);
   contents = std::move(*openContents);
   auto openRecords = CloudRecords::open((top / "cloud/records").string());
@@ -109,10 +110,15 @@ bool CloudRig::hasObject(const ContentHash& hash) const {
 }
 
 CloudPlaces CloudRig::places() {
-  return {roots, files, *contents, *records, [this](const std::string&) {
+  return {roots,
+          files,
+          *contents,
+          *records,
+          [this](const std::string&) {
             ++coordinated;
             return Outcome<std::shared_ptr<void>>(std::shared_ptr<void>());
-          }};
+          },
+          trashes};
 }
 
 UploadServices CloudRig::uploads() {

@@ -63,7 +63,8 @@ class TemporaryFolder {
 
 // What one process has open of a cloud. `top`/drive is the store, `top`/cloud the cloud.
 struct CloudRig {
-  explicit CloudRig(std::filesystem::path top);
+  // `drives`: where the other drives of the user are, each with its "cloud"; empty: nowhere.
+  explicit CloudRig(std::filesystem::path top, const std::filesystem::path& drives = {});
 
   CloudPlaces places();
   UploadServices uploads();
@@ -88,6 +89,7 @@ struct CloudRig {
   CloudConditions conditions;
   ManualClock clock;
   std::atomic<int> coordinated{0};
+  std::vector<std::string> trashes;
 };
 
 std::string contentsOf(const std::string& path);

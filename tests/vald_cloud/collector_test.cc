@@ -107,6 +107,22 @@ TEST_F(CollectorTest, WhatAMarkerNamesStaysWhereverItLies) {
   EXPECT_TRUE(rig.hasObject(hash));
 }
 
+TEST_F(CollectorTest, WhatAMarkerInTheDesktopsTrashNamesStays) {
+  const ContentHash hash = lose("a", "words");
+  rig.trashes = {(rig.top / "Trash").string(), (rig.top / "none").string()};
+  ASSERT_TRUE(fs::create_directories(rig.top / "Trash/files"));
+  fs::rename(elsewhere(), rig.top / "Trash/files/.a.skein");
+  for (int look = 0; look < 3; ++look) {
+    rig.clock.advance(kTime);
+    EXPECT_EQ(collect(0s, 0), 0u);
+  }
+  EXPECT_TRUE(rig.hasObject(hash));
+  fs::remove_all(rig.top / "Trash");
+  EXPECT_EQ(collect(0s, 0), 0u);
+  rig.clock.advance(CloudCollector::kMargin);
+  EXPECT_EQ(collect(0s, 0), 1u);
+}
+
 TEST_F(CollectorTest, WhereSomethingCannotBeReadNothingIsCollected) {
   upload("a", "one");
   upload("a", "two");

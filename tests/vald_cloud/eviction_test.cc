@@ -130,7 +130,7 @@ TEST_F(EvictionTest, WhatIsNotSafeStaysWithTheReason) {
   std::filesystem::remove(second);
   ASSERT_TRUE(std::holds_alternative<UploadDone>(rig.upload(kDocument, path)));
 
-  for (const char* name : {".a.skein", ".a.skein-new", ".a.skein-old", ".a.skein-part"}) {
+  for (const char* name : {".a.skein", ".a.skein-new", ".a.skein-part"}) {
     const std::string other = rig.write(name, "somebody's own");
     EXPECT_EQ(refusal(path), code(EvictionRefusal::MarkerNameTaken)) << name;
     EXPECT_EQ(contentsOf(other), "somebody's own");
@@ -376,6 +376,64 @@ TEST_F(EvictionTest, RecoveryComparesContentsAndFindsTheMovedFolder) {
   note((rig.top / "drive").string());
   EXPECT_EQ(brief(rig.download(kDocument, other)), "none");
   EXPECT_EQ(contentsOf(other), "words, more");
+}
+
+TEST_F(EvictionTest, WhatAnotherDriveOfTheUserEvictedCanBeFetchedAndStays) {
+  const std::filesystem::path drives = folder.path() / "drives";
+  auto original = std::make_unique<CloudRig>(drives / "A");
+  CloudRig copy(drives / "B", drives);
+  const std::string path = original->write("a", "the document");
+  ASSERT_TRUE(std::holds_alternative<UploadDone>(original->upload(kDocument, path)));
+  ASSERT_EQ(brief(original->evict(kDocument, path)), "none");
+  const auto hash = (*original->records->record(kDocument))->contents.hash;
+  for (const char* name : {".a.skein", ".b.skein"}) {
+    std::filesystem::copy_file(drives / "A/drive/.a.skein", drives / "B/drive" / name);
+  }
+  EXPECT_EQ(brief(copy.download(kDocument, (drives / "B/drive/a").string())), "none");
+  EXPECT_EQ(contentsOf((drives / "B/drive/a").string()), "the document");
+  EXPECT_FALSE(*copy.records->stamp(kDocument));
+
+  // A look at the drive takes over what its markers name, and the other drive may go.
+  std::filesystem::remove(copy.top / "cloud/objects" / hash.asString().substr(0, 2) /
+                          hash.asString());
+  ASSERT_TRUE(copy.collect(std::chrono::hours(1), 1000));
+  original.reset();
+  std::filesystem::remove_all(drives / "A");
+  EXPECT_TRUE(copy.hasObject(hash));
+  copy.contents.reset();
+  auto again = CloudContents::open((copy.top / "cloud").string(), copy.files, drives.string());
+  ASSERT_TRUE(again);
+  copy.contents = std::move(*again);
+  EXPECT_EQ(brief(copy.download(kDocument, (drives / "B/drive/b").string())), "none");
+  EXPECT_EQ(contentsOf((drives / "B/drive/b").string()), "the document");
+
+  // Only what its cloud stands beside this one.
+  ASSERT_EQ(brief(rig.evict(kDocument, uploaded("a", "others"))), "none");
+  std::filesystem::copy_file(rig.top / "drive/.a.skein", drives / "B/drive/.c.skein");
+  EXPECT_EQ(brief(copy.download(kDocument, (drives / "B/drive/c").string())),
+            "NSCocoaErrorDomain 259");
+}
+
+TEST_F(EvictionTest, AFileSetAsideThatNoNoteTellsOfComesOut) {
+  // Somebody's own, or one whose note is lost: it is in the way of neither.
+  const std::string path = uploaded("a", "the document");
+  rig.write(".a.skein-old", "others");
+  ASSERT_EQ(brief(rig.evict(kDocument, path)), "none");
+  EXPECT_EQ(rig.names(), (std::vector<std::string>{".a.skein", "a 2"}));
+  EXPECT_EQ(contentsOf(path + " 2"), "others");
+  rig.write(".a.skein-old", "more");
+  EXPECT_EQ(brief(rig.download(kDocument, path)), "none");
+  EXPECT_EQ(rig.names(), (std::vector<std::string>{"a", "a 2", "a 3"}));
+  EXPECT_EQ(contentsOf(path), "the document");
+  EXPECT_EQ(contentsOf(path + " 3"), "more");
+
+  // What the marker stands for is the document.
+  ASSERT_TRUE(std::holds_alternative<UploadDone>(rig.upload(kDocument, path)));
+  ASSERT_EQ(brief(rig.evict(kDocument, path)), "none");
+  rig.write(".a.skein-old", "the document");
+  EXPECT_EQ(brief(rig.download(kDocument, path)), "none");
+  EXPECT_EQ(rig.names(), (std::vector<std::string>{"a", "a 2", "a 3"}));
+  EXPECT_EQ(contentsOf(path), "the document");
 }
 
 TEST_F(EvictionTest, AMarkerThatWasCopiedLeavesTheDocumentsStampAlone) {

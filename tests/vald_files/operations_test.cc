@@ -532,10 +532,56 @@ bool onASmallVolume(const std::function<void(TestDrive&)>& body) {
   return WEXITSTATUS(status) != 77;
 }
 
+TEST(Removal, ThatWasCutOffBeforeItsAnswerIsTakenBack) {
+  TestDrive drive;
+  const auto removeAndEndIn = [&](const std::function<void(FileRequest&)>& endIn) {
+    drive.operations.reset();  // a database must not be open across a fork
+    const pid_t child = ::fork();
+    if (child == 0) {
+      FileRequest request = kRequest;
+      endIn(request);
+      drive.open().remove(drive.at("folder/tree"), request);
+      ::_exit(1);
+    }
+    int status = 0;
+    EXPECT_EQ(::waitpid(child, &status, 0), child);
+    EXPECT_EQ(WEXITSTATUS(status), 0);
+  };
+  const auto whileTheStoreLooks = [](FileRequest& request) {
+    request.removed = []() -> bool { ::_exit(0); };
+  };
+  drive.write("folder/tree/a", "a");
+  removeAndEndIn(whileTheStoreLooks);
+  EXPECT_FALSE(drive.exists("folder/tree"));
+  EXPECT_EQ(drive.open().recovered().front().state, OperationState::Undone);
+  EXPECT_TRUE(drive.exists("folder/tree/a"));
+
+  // Its name, or its folder, may have gone meanwhile.
+  removeAndEndIn(whileTheStoreLooks);
+  drive.write("folder/tree", "another");
+  EXPECT_EQ(drive.open().recovered().front().destination, drive.at("folder/tree 2"));
+  EXPECT_TRUE(drive.exists("folder/tree 2/a"));
+  std::filesystem::rename(drive.at("folder/tree 2"), drive.at("kept"));
+  std::filesystem::remove(drive.at("folder/tree"));
+  std::filesystem::rename(drive.at("kept"), drive.at("folder/tree"));
+  removeAndEndIn(whileTheStoreLooks);
+  std::filesystem::remove(drive.at("folder"));
+  drive.open();
+  EXPECT_TRUE(drive.exists("tree/a"));
+
+  // What was answered is not taken back.
+  drive.write("folder/tree/a", "a");
+  removeAndEndIn([](FileRequest& request) { request.deleteLater = [](Task) { ::_exit(0); }; });
+  EXPECT_EQ(drive.open().recovered().front().state, OperationState::Done);
+  EXPECT_FALSE(drive.exists("folder/tree"));
+  EXPECT_TRUE(std::filesystem::is_empty(drive.state + "/staging"));
+}
+
 TEST(Removal, WorksOnAFullDisk) {
   const bool isMounted = onASmallVolume([](TestDrive& drive) {
     FileOperations& files = drive.open();
     drive.write("folder/a", std::string(100'000, 'a'));
+    drive.write("letter", "words");
     // Until nothing fits any more, and the journal has used what it had at hand.
     std::ofstream fill(drive.at("fill"), std::ios::binary);
     while (fill << std::string(4096, 'f') << std::flush) {
@@ -546,6 +592,10 @@ TEST(Removal, WorksOnAFullDisk) {
       full = files.createFolder(drive.store, "folder-" + std::to_string(i), kRequest).error;
     }
     EXPECT_EQ(codeOf(full), NSFileWriteOutOfSpaceError);
+    // The trash is made for it, and its note.
+    const FileResult trashed = files.trash(drive.at("letter"), kRequest);
+    EXPECT_EQ(trashed.error, nullptr) << wordsOf(trashed.error);
+    EXPECT_FALSE(drive.exists("letter"));
     const FileResult removed = files.remove(drive.at("folder"), kRequest);
     EXPECT_EQ(removed.error, nullptr) << wordsOf(removed.error);
     EXPECT_FALSE(drive.exists("folder"));

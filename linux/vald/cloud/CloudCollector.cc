@@ -39,8 +39,12 @@ Outcome<CloudCollector::Result> CloudCollector::collect(std::chrono::nanoseconds
                                                         const Cancellation& cancellation) {
   const NSDate now = _clock.date();
   std::vector<ContentHash> named;
-  NSErrorPtr error = walkMarkers(_places.roots, cancellation,
-                                 [&](const std::string&, const EvictionMarker& marker) {
+  NSErrorPtr error = walkMarkers(_places.roots, _places.trashes, cancellation,
+                                 [&](const std::string& path, const EvictionMarker& marker) {
+                                   // What another drive's cloud alone has is kept here as well.
+                                   if (_places.refusalOf(marker, path) == nullptr) {
+                                     _places.contents.hold(marker.contents);
+                                   }
                                    named.push_back(marker.contents.hash);
                                    return NSErrorPtr();
                                  });

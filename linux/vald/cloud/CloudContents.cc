@@ -46,33 +46,51 @@ int entries(int folder, std::vector<std::string>& names) {
   return code;
 }
 
+constexpr std::size_t kKeySize = 32;
+constexpr char kKeyName[] = "key";
+constexpr char kOtherKeysName[] = "keys";
+constexpr std::size_t kMostOtherKeys = 1000;
+
+// At most `most` keys of a file of this user's own; none when there is no such file. 0 or an errno.
+int readKeys(int top, const char* name, std::size_t most, std::string& keys) {
+  keys.clear();
+  const FileDescriptor file(openat(top, name, O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
+  if (!file) return errno == ENOENT ? 0 : errno;
+  struct stat status {};
+  if (fstat(file.get(), &status) != 0) return errno;
+  if (!S_ISREG(status.st_mode) || status.st_uid != geteuid()) return EACCES;
+  keys.resize(most * kKeySize);
+  const ssize_t got = pread(file.get(), keys.data(), keys.size(), 0);
+  if (got < 0) return errno;
+  keys.resize(static_cast<std::size_t>(got) / kKeySize * kKeySize);
+  return 0;
+}
+
+// 0 or an errno.
+int writeKeys(FileLayer& files, int top, int incoming, const char* name, const std::string& keys) {
+  FileDescriptor fresh;
+  int code = files.createFile(incoming, name, 0600, fresh);
+  if (code == 0) code = files.write(fresh.get(), keys);
+  if (code == 0) code = files.sync(fresh.get());
+  if (code == 0) code = files.renameOver(incoming, name, top, name);
+  return code;
+}
+
 // The key that markers are sealed with; made when there is none, or only a part of one.
 Outcome<std::string> openKey(FileLayer& files, int top, int incoming, const std::string& folder) {
-  constexpr std::size_t kKeySize = 32;
-  constexpr char kName[] = "key";
-  const std::string path = joinPath(folder, kName);
-  std::string key(kKeySize, '\0');
-  const FileDescriptor file(openat(top, kName, O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
-  if (!file && errno != ENOENT) return fileError(errno, "can't open the cloud's key", path);
-  if (file) {
-    struct stat status {};
-    if (fstat(file.get(), &status) != 0) return fileError(errno, "can't read", path);
-    if (!S_ISREG(status.st_mode) || status.st_uid != geteuid()) {
-      return fileError(EACCES, "the cloud's key must be a file of this user's own:", path);
-    }
-    const ssize_t got = pread(file.get(), key.data(), key.size(), 0);
-    if (got < 0) return fileError(errno, "can't read", path);
-    if (static_cast<std::size_t>(got) == key.size()) return key;
+  const std::string path = joinPath(folder, kKeyName);
+  std::string key;
+  if (const int code = readKeys(top, kKeyName, 1, key)) {
+    return fileError(code, "can't read the cloud's key, a file of this user's own,", path);
   }
+  if (key.size() == kKeySize) return key;
+  key.resize(kKeySize);
   if (getrandom(key.data(), key.size(), 0) != static_cast<ssize_t>(key.size())) {
     return fileError(errno, "can't make the cloud's key", path);
   }
-  FileDescriptor fresh;
-  int code = files.createFile(incoming, kName, 0600, fresh);
-  if (code == 0) code = files.write(fresh.get(), key);
-  if (code == 0) code = files.sync(fresh.get());
-  if (code == 0) code = files.renameOver(incoming, kName, top, kName);
-  if (code != 0) return fileError(code, "can't make the cloud's key", path);
+  if (const int code = writeKeys(files, top, incoming, kKeyName, key)) {
+    return fileError(code, "can't make the cloud's key", path);
+  }
   return key;
 }
 
@@ -92,7 +110,8 @@ CloudContents::Hold::~Hold() {
 }
 
 Outcome<std::unique_ptr<CloudContents>> CloudContents::open(const std::string& folder,
-                                                            FileLayer& files) {
+                                                            FileLayer& files,
+                                                            const std::string& drives) {
   std::error_code failure;
   std::filesystem::create_directories(folder, failure);
   if (failure) return fileError(failure.value(), "can't make the cloud's folder", folder);
@@ -122,8 +141,91 @@ Outcome<std::unique_ptr<CloudContents>> CloudContents::open(const std::string& f
   auto key = openKey(files, top.get(), incoming.get(), folder);
   if (!key) return key.error();
   if (const int code = files.sync(top.get())) return fileError(code, "can't make durable", folder);
-  return std::unique_ptr<CloudContents>(
-      new CloudContents(folder, files, std::move(objects), std::move(incoming), std::move(*key)));
+  std::string others;
+  if (const int code = readKeys(top.get(), kOtherKeysName, kMostOtherKeys, others)) {
+    return fileError(code, "can't read", joinPath(folder, kOtherKeysName));
+  }
+  std::unique_ptr<CloudContents> cloud(new CloudContents(folder, drives, files, std::move(objects),
+                                                         std::move(incoming), std::move(*key)));
+  MutexLock lock(cloud->_mutex);
+  for (std::size_t at = 0; at < others.size(); at += kKeySize) {
+    cloud->_otherKeys.push_back(others.substr(at, kKeySize));
+  }
+  lock.unlock();
+  return cloud;
+}
+
+void CloudContents::eachOther(const std::function<bool(const FileDescriptor&)>& each) const {
+  const FileDescriptor drives(
+      ::open(_drives.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+  std::vector<std::string> names;
+  struct stat own {};
+  if (!drives || entries(drives.get(), names) != 0 || fstat(_objects.get(), &own) != 0) return;
+  for (const std::string& name : names) {
+    const FileDescriptor drive = openFolder(drives.get(), name.c_str());
+    const FileDescriptor cloud = drive ? openFolder(drive.get(), "cloud") : FileDescriptor();
+    struct stat status {};
+    if (!cloud || fstat(cloud.get(), &status) != 0 || status.st_uid != geteuid()) continue;
+    struct stat objects {};
+    const bool isOwn = fstatat(cloud.get(), "objects", &objects, AT_SYMLINK_NOFOLLOW) == 0 &&
+                       objects.st_dev == own.st_dev && objects.st_ino == own.st_ino;
+    if (!isOwn && each(cloud)) return;
+  }
+}
+
+bool CloudContents::isSeal(const ContentHash& seal, std::string_view text) {
+  if (keyedHash(_key, text) == seal) return true;
+  MutexLock lock(_mutex);
+  for (const std::string& key : _otherKeys) {
+    if (keyedHash(key, text) == seal) return true;
+  }
+  bool isOthers = false;
+  std::string key;
+  eachOther([&](const FileDescriptor& cloud) {
+    isOthers = readKeys(cloud.get(), kKeyName, 1, key) == 0 && key.size() == kKeySize &&
+               keyedHash(key, text) == seal;
+    return isOthers;
+  });
+  // With the other drive its key may go. One that cannot be kept is looked for again.
+  if (isOthers && keep(key) == nullptr) _otherKeys.push_back(key);
+  return isOthers;
+}
+
+NSErrorPtr CloudContents::keep(const std::string& key) {
+  if (_otherKeys.size() >= kMostOtherKeys) return fileError(ENOSPC, "can't keep", kOtherKeysName);
+  std::string keys;
+  for (const std::string& known : _otherKeys) keys += known;
+  const FileDescriptor top(::open(_folder.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  int code =
+      top ? writeKeys(_files, top.get(), _incoming.get(), kOtherKeysName, keys + key) : errno;
+  if (code == 0) code = _files.sync(top.get());
+  return code == 0 ? nullptr : fileError(code, "can't keep", joinPath(_folder, kOtherKeysName));
+}
+
+void CloudContents::takeOver(const HashedContents& contents) {
+  const std::string object = contents.hash.asString();
+  eachOther([&](const FileDescriptor& cloud) {
+    const FileDescriptor file(openat(cloud.get(), ("objects/" + pathOf(object)).c_str(),
+                                     O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
+    struct stat status {};
+    if (!file || fstat(file.get(), &status) != 0 || !S_ISREG(status.st_mode) ||
+        status.st_uid != geteuid() || static_cast<std::uint64_t>(status.st_size) != contents.size) {
+      return false;
+    }
+    std::string incoming;
+    {
+      MutexLock lock(_mutex);
+      incoming = std::to_string(_nextIncoming++);
+    }
+    if (_files.link(file.get(), _incoming.get(), incoming) == 0) {
+      if (settle(incoming, file.get(), contents) == nullptr) return true;
+      _files.unlink(_incoming.get(), incoming);
+      return false;
+    }
+    LocalRead read;
+    const auto added = add(file.get(), objectPath(object), read);
+    return added && added->contents.hash == contents.hash;
+  });
 }
 
 Outcome<CloudContents::Added> CloudContents::add(int file, const std::string& name,
@@ -192,6 +294,7 @@ bool CloudContents::contains(const HashedContents& contents) const {
 
 std::optional<CloudContents::Hold> CloudContents::hold(const HashedContents& contents) {
   Hold hold = takeHold(contents.hash);
+  if (!contains(contents) && !_drives.empty()) takeOver(contents);
   if (!contains(contents)) return std::nullopt;
   return hold;
 }

@@ -25,6 +25,12 @@ namespace skein::vald {
 //   objects/ab/ab12…   one file per contents, never changed once it stands there
 //   incoming/          what is still being written; emptied when the folder is opened
 //   key                32 bytes by chance, which markers are sealed with
+//   keys               those of other drives of this user, as documents were copied from there
+//
+// A drive that was copied, or came back from a backup without its identity, has evicted documents
+// whose contents only the other drive's cloud has. Their markers carry that cloud's seal; its key
+// is taken over, and their contents get a second name here (or are copied, from another volume).
+// So what either drive's cloud lets go of stays with the other.
 //
 // Contents appear by atomic rename when they are durable. Any thread; calls block.
 class CloudContents {
@@ -51,19 +57,24 @@ class CloudContents {
   };
 
   // Makes the folder (and what is missing above it) when it does not stand, for its owner
-  // alone. One CloudContents per folder; `files` outlives it.
-  static Outcome<std::unique_ptr<CloudContents>> open(const std::string& folder, FileLayer& files);
+  // alone. One CloudContents per folder; `files` outlives it. `drives`: holds the folders of all
+  // of the user's drives, in each its "cloud"; empty: there are no others.
+  static Outcome<std::unique_ptr<CloudContents>> open(const std::string& folder, FileLayer& files,
+                                                      const std::string& drives = {});
 
   // Takes in a copy of `file`, from its start; shares its blocks where the file system can.
   // `name` is for errors. Contents that are there already are verified, and replaced when they
   // are damaged.
   Outcome<Added> add(int file, const std::string& name, StreamObserver& observer)
       SKEIN_EXCLUDES(_mutex);
-  // Holds contents that are there with this size; an empty optional when they are not.
+  // Holds contents that are there with this size, perhaps only in another drive's cloud until now;
+  // an empty optional when they are not.
   std::optional<Hold> hold(const HashedContents& contents) SKEIN_EXCLUDES(_mutex);
 
   // The seal of a marker's text; only this cloud makes the same.
   ContentHash seal(std::string_view text) const { return keyedHash(_key, text); }
+  // Whether it was made by this cloud, or by that of another drive of this user's.
+  bool isSeal(const ContentHash& seal, std::string_view text) SKEIN_EXCLUDES(_mutex);
 
   // For reading; NSCocoaErrorDomain 4 when there are no such contents.
   Outcome<FileDescriptor> read(const ContentHash& hash) const;
@@ -95,13 +106,20 @@ class CloudContents {
       SKEIN_EXCLUDES(_mutex);
 
  private:
-  CloudContents(std::string folder, FileLayer& files, FileDescriptor objects,
+  CloudContents(std::string folder, std::string drives, FileLayer& files, FileDescriptor objects,
                 FileDescriptor incoming, std::string key)
       : _folder(std::move(folder)),
+        _drives(std::move(drives)),
         _files(files),
         _objects(std::move(objects)),
         _incoming(std::move(incoming)),
         _key(std::move(key)) {}
+
+  // Calls `each` with the folder of every other cloud until it answers true.
+  void eachOther(const std::function<bool(const FileDescriptor&)>& each) const;
+  // Takes the contents over from another cloud, if one has them. They are held.
+  void takeOver(const HashedContents& contents) SKEIN_EXCLUDES(_mutex);
+  NSErrorPtr keep(const std::string& key) SKEIN_REQUIRES(_mutex);
 
   // Waits while the contents are being collected.
   Hold takeHold(const ContentHash& hash) SKEIN_EXCLUDES(_mutex);
@@ -118,6 +136,7 @@ class CloudContents {
   NSErrorPtr settle(const std::string& incoming, int file, const HashedContents& contents);
 
   const std::string _folder;
+  const std::string _drives;
   FileLayer& _files;
   const FileDescriptor _objects;
   const FileDescriptor _incoming;
@@ -125,6 +144,7 @@ class CloudContents {
 
   Mutex _mutex;
   CondVar _collected;
+  std::vector<std::string> _otherKeys SKEIN_GUARDED_BY(_mutex);
   std::uint64_t _nextIncoming SKEIN_GUARDED_BY(_mutex) = 0;
   std::map<ContentHash, std::uint64_t> _holds SKEIN_GUARDED_BY(_mutex);
   std::set<ContentHash> _collecting SKEIN_GUARDED_BY(_mutex);

@@ -2,9 +2,11 @@
 
 #include <sqlite3.h>
 
+#include <cerrno>
 #include <string>
 
 #include "linux/vald/files/DatabaseFile.h"
+#include "linux/vald/files/FileErrors.h"
 #include "vellum/VLErrors.h"
 
 namespace skein::vald {
@@ -13,7 +15,14 @@ namespace {
 // The domain of SQLite's own codes, which say more than any POSIX code would.
 constexpr char kDatabaseErrorDomain[] = "SkeinDatabaseErrorDomain";
 
+// What is written when something is removed or given up; a few of these are enough.
+constexpr off_t kReserve = off_t{512} << 10;
+constexpr off_t kReservedPart = off_t{128} << 10;
+
 NSErrorPtr databaseError(sqlite3* database) {
+  if (sqlite3_errcode(database) == SQLITE_FULL) {
+    return fileError(ENOSPC, "can't write", sqlite3_db_filename(database, "main"));
+  }
   return NSError::errorWithDomain(
       kDatabaseErrorDomain, sqlite3_extended_errcode(database),
       {{NSLocalizedDescriptionKey,
@@ -95,12 +104,15 @@ Outcome<std::unique_ptr<CloudDatabase>> CloudDatabase::open(
   const int code =
       sqlite3_open_v2(path.c_str(), &handle,
                       SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE | SQLITE_OPEN_NOFOLLOW, nullptr);
-  std::unique_ptr<CloudDatabase> database(new CloudDatabase(handle));
+  std::unique_ptr<CloudDatabase> database(new CloudDatabase(handle, path));
   if (code != SQLITE_OK) return databaseError(handle);
   sqlite3_busy_timeout(handle, 5000);
-  if (NSErrorPtr error = database->execute("PRAGMA journal_mode=WAL; PRAGMA synchronous=FULL;")) {
-    return error;
-  }
+  // Nobody else reads it, and what several would share takes room on the disk when it is opened.
+  NSErrorPtr failed = database->withReserve([&] {
+    return database->execute(
+        "PRAGMA locking_mode=EXCLUSIVE; PRAGMA journal_mode=WAL; PRAGMA synchronous=FULL;");
+  });
+  if (failed != nullptr) return failed;
   const auto version = database->prepare("PRAGMA user_version");
   if (!version->step()) return version->error();
   const auto seen = version->integer(0);
@@ -113,15 +125,18 @@ Outcome<std::unique_ptr<CloudDatabase>> CloudDatabase::open(
           "The cloud's records in " + path + " were made by a newer version of this program."}});
   }
   for (auto step = seen; step < newest; ++step) {
-    NSErrorPtr error = database->transact([&] {
+    NSErrorPtr error = database->transactWithReserve([&] {
       const std::string next = "PRAGMA user_version=" + std::to_string(step + 1);
-      NSErrorPtr failed = database->execute(schemas.begin()[step]);
-      return failed != nullptr ? failed : database->execute(next.c_str());
+      NSErrorPtr refused = database->execute(schemas.begin()[step]);
+      return refused != nullptr ? refused : database->execute(next.c_str());
     });
     if (error != nullptr) return error;
   }
   return database;
 }
+
+CloudDatabase::CloudDatabase(sqlite3* database, const std::string& path)
+    : _database(database), _reserve(path + "-reserve", kReserve, kReservedPart) {}
 
 CloudDatabase::~CloudDatabase() { sqlite3_close(_database); }
 
@@ -130,11 +145,27 @@ std::unique_ptr<CloudStatement> CloudDatabase::prepare(std::string_view sql) {
 }
 
 NSErrorPtr CloudDatabase::transact(const std::function<NSErrorPtr()>& body) {
+  if (!_usesReserve) _reserve.take();
   if (NSErrorPtr error = execute("BEGIN IMMEDIATE")) return error;
   NSErrorPtr error = body();
   if (error == nullptr) error = execute("COMMIT");
   if (error != nullptr) execute("ROLLBACK");
   return error;
+}
+
+NSErrorPtr CloudDatabase::withReserve(const std::function<NSErrorPtr()>& body) {
+  // What is given up here is not taken again at once.
+  _usesReserve = true;
+  NSErrorPtr error = body();
+  while (error != nullptr && error->code() == NSFileWriteOutOfSpaceError && _reserve.giveUp()) {
+    error = body();
+  }
+  _usesReserve = false;
+  return error;
+}
+
+NSErrorPtr CloudDatabase::transactWithReserve(const std::function<NSErrorPtr()>& body) {
+  return withReserve([&] { return transact(body); });
 }
 
 NSErrorPtr CloudDatabase::withoutWaiting(const std::function<NSErrorPtr()>& body) {

@@ -9,6 +9,7 @@
 #include <string_view>
 
 #include "linux/vald/cloud/Outcome.h"
+#include "linux/vald/files/DiskReserve.h"
 
 struct sqlite3;
 struct sqlite3_stmt;
@@ -55,7 +56,7 @@ class CloudStatement {
   NSErrorPtr _error;
 };
 
-// One connection to an SQLite file: WAL, durable at each commit. One thread at a time.
+// The one connection to an SQLite file: WAL, durable at each commit. One thread at a time.
 class CloudDatabase {
  public:
   // `schemas` are the steps from one version to the next; those that the file has not seen
@@ -67,6 +68,9 @@ class CloudDatabase {
   std::unique_ptr<CloudStatement> prepare(std::string_view sql);
   // Runs `body` and commits, or undoes all of it when it answers an error.
   NSErrorPtr transact(const std::function<NSErrorPtr()>& body);
+  // The same with the room that is kept for this beside the database (`DATABASE-reserve`), where
+  // the disk has no other: for what lets go of something.
+  NSErrorPtr transactWithReserve(const std::function<NSErrorPtr()>& body);
   NSErrorPtr execute(const char* sql);
   // Runs `body` without waiting for the disk: what it commits is durable with the next
   // commit that is. For what is found again when a power cut loses it.
@@ -74,9 +78,12 @@ class CloudDatabase {
   std::int64_t lastInsertedRow() const;
 
  private:
-  explicit CloudDatabase(sqlite3* database) : _database(database) {}
+  CloudDatabase(sqlite3* database, const std::string& path);
+  NSErrorPtr withReserve(const std::function<NSErrorPtr()>& body);
 
   sqlite3* const _database;
+  DiskReserve _reserve;
+  bool _usesReserve = false;
 };
 
 }  // namespace skein::vald

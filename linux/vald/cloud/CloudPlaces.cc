@@ -28,7 +28,7 @@ NSErrorPtr CloudPlaces::endWork(const CloudRecords::Work& work) const {
 }
 
 NSErrorPtr CloudPlaces::refusalOf(const EvictionMarker& marker, const std::string& path) const {
-  if (marker.seal && contents.seal(marker.sealed) == *marker.seal) return nullptr;
+  if (marker.seal && contents.isSeal(*marker.seal, marker.sealed)) return nullptr;
   const auto record = records.record(marker.document);
   if (!record) return record.error();
   // Also one whose seal was made with a key that is lost: refused, the only way to its contents

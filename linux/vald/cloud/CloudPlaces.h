@@ -5,6 +5,7 @@
 #include <functional>
 #include <memory>
 #include <string>
+#include <vector>
 
 #include "linux/vald/cloud/CloudContents.h"
 #include "linux/vald/cloud/CloudRecords.h"
@@ -25,6 +26,8 @@ struct CloudPlaces {
   CloudContents& contents;
   CloudRecords& records;
   CoordinateWriting coordinate;
+  // Where else markers of the drive may lie, and come back from.
+  std::vector<std::string> trashes = {};
 
   // Notes that something is done at a document's place, for recovery; and that it is done.
   // What cannot be noted must not be begun; an end that is not noted costs a look at the
@@ -32,8 +35,8 @@ struct CloudPlaces {
   Outcome<CloudRecords::Work> beginWork(const StorePlace& place, const ContentHash& contents) const;
   NSErrorPtr endWork(const CloudRecords::Work& work) const;
 
-  // Null when the marker was made here: its seal is right, or its document has a record of
-  // these contents.
+  // Null when the marker was made here, or by another drive of this user: its seal is right, or its
+  // document has a record of these contents.
   NSErrorPtr refusalOf(const EvictionMarker& marker, const std::string& path) const;
 };
 

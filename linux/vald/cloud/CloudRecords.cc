@@ -189,15 +189,16 @@ NSErrorPtr CloudRecords::remove(VLFileObjectID document) {
   MutexLock lock(_mutex);
   const auto before = find(document);
   if (!before) return before.error();
-  NSErrorPtr error = _database->transact([&]() SKEIN_NO_THREAD_SAFETY_ANALYSIS -> NSErrorPtr {
-    for (const char* table : {"records", "stamps", "pins"}) {
-      const auto statement =
-          _database->prepare(std::string("DELETE FROM ") + table + " WHERE document = ?");
-      if (NSErrorPtr failed = statement->bind(1, key(document)).run()) return failed;
-    }
-    return *before ? noteUnreferenced((*before)->contents, std::chrono::system_clock::now())
-                   : nullptr;
-  });
+  NSErrorPtr error =
+      _database->transactWithReserve([&]() SKEIN_NO_THREAD_SAFETY_ANALYSIS -> NSErrorPtr {
+        for (const char* table : {"records", "stamps", "pins"}) {
+          const auto statement =
+              _database->prepare(std::string("DELETE FROM ") + table + " WHERE document = ?");
+          if (NSErrorPtr failed = statement->bind(1, key(document)).run()) return failed;
+        }
+        return *before ? noteUnreferenced((*before)->contents, std::chrono::system_clock::now())
+                       : nullptr;
+      });
   if (error == nullptr && *before && countsForQuota(**before)) {
     _usedBytes -= (*before)->contents.size;
   }
@@ -463,7 +464,8 @@ Outcome<bool> CloudRecords::isPinned(VLFileObjectID document) {
 
 Outcome<CloudRecords::Work> CloudRecords::beginWork(Work work) {
   MutexLock lock(_mutex);
-  NSErrorPtr error = _database->transact([&]() SKEIN_NO_THREAD_SAFETY_ANALYSIS {
+  // An eviction makes room.
+  NSErrorPtr error = _database->transactWithReserve([&]() SKEIN_NO_THREAD_SAFETY_ANALYSIS {
     NSErrorPtr failed = noteGivenUp(work.contents);
     if (failed != nullptr) return failed;
     return _database->prepare("INSERT INTO work(path, folder, hash) VALUES(?, ?, ?)")

@@ -28,10 +28,7 @@ class PlaceRecovery {
   NSErrorPtr run() {
     if (NSErrorPtr error = remove(_names.part)) return error;
     if (NSErrorPtr error = remove(_names.fresh)) return error;
-    auto marker = openMarker(_place.folder, _names.marker, _place.path());
-    if (marker && _places.refusalOf(marker->marker, _place.path()) == nullptr) {
-      _marker = marker->marker;
-    }
+    findMarker();
     // Without a marker there may still be a file to put back.
     if (_place.folder.exists(_names.aside)) {
       if (NSErrorPtr error = putBack()) return error;
@@ -43,11 +40,36 @@ class PlaceRecovery {
       }
     }
     // Also what a recovery before this one changed: the note of it ends next.
+    return sync();
+  }
+
+  // The file set aside that no note tells of.
+  NSErrorPtr bringOut() {
+    findMarker();
+    const auto same = isWhatTheMarkerStandsFor(_names.aside);
+    if (!same) return same.error();
+    NSErrorPtr error;
+    if (*same && !_place.folder.exists(_place.name)) {
+      error = putBack();
+    } else if (const int code = renameAside()) {
+      error = failed(code);
+    }
+    return error != nullptr ? error : sync();
+  }
+
+ private:
+  void findMarker() {
+    auto marker = openMarker(_place.folder, _names.marker, _place.path());
+    if (marker && _places.refusalOf(marker->marker, _place.path()) == nullptr) {
+      _marker = marker->marker;
+    }
+  }
+
+  NSErrorPtr sync() const {
     const int code = _places.files.sync(_place.folder.get());
     return code == 0 ? nullptr : failed(code);
   }
 
- private:
   NSErrorPtr failed(int code) const { return fileError(code, "can't recover", _place.path()); }
 
   NSErrorPtr remove(const std::string& name) {
@@ -110,13 +132,18 @@ class PlaceRecovery {
     return _places.contents.verify(*_noted, observer) == nullptr;
   }
 
-  NSErrorPtr putBackUnderAnotherName() {
+  // To the next name that is free. 0 or an errno.
+  int renameAside() {
     constexpr unsigned kMostTries = 1000;
     int code = EEXIST;
     for (unsigned number = 2; code == EEXIST && number < kMostTries; ++number) {
       code = rename(_names.aside, numberedName(_place.name, number, ' '));
     }
-    if (code != 0) return failed(code);
+    return code;
+  }
+
+  NSErrorPtr putBackUnderAnotherName() {
+    if (const int code = renameAside()) return failed(code);
     return _marker ? remove(_names.marker) : nullptr;
   }
 
@@ -186,7 +213,8 @@ NSErrorPtr recoverNoted(const CloudPlaces& places, const StorePlace& place) {
     if (NSErrorPtr error = recoverPlace(places, place, work.contents)) return error;
     if (NSErrorPtr error = places.endWork(work)) return error;
   }
-  return nullptr;
+  if (!place.folder.exists(MarkerNames(place.name).aside)) return nullptr;
+  return PlaceRecovery(places, place, std::nullopt).bringOut();
 }
 
 NSErrorPtr removeStaleMarker(const CloudPlaces& places, const StorePlace& place,

@@ -19,7 +19,9 @@ namespace skein::vald {
 NSErrorPtr recoverPlace(const CloudPlaces& places, const StorePlace& place,
                         const std::optional<ContentHash>& noted = std::nullopt);
 
-// The same, with what the notes say, if there are notes of the place; they end.
+// The same, with what the notes say, if there are notes of the place; they end. A file set aside
+// that no note tells of, since the notes were lost, becomes the document where its marker stands
+// for the same contents; else it gets another name, and the marker stays.
 NSErrorPtr recoverNoted(const CloudPlaces& places, const StorePlace& place);
 
 // Removes the marker beside a file that is a newer revision of the same document, and

@@ -76,7 +76,11 @@ NSErrorPtr DownloadTransfer::begin() {
   if (NSErrorPtr error = mendWhatWasLeft()) return error;
   for (const std::string* name : {&_names->part, &_names->fresh, &_names->aside}) {
     if (_place.folder.exists(*name)) {
-      return fileError(EEXIST, "can't download to", joinPath(_place.folderPath(), *name));
+      const std::string taken = joinPath(_place.folderPath(), *name);
+      return fileErrorWithWords(
+          NSFileWriteFileExistsError, EEXIST,
+          "\"" + printable(taken) + "\" is in the way of a download; rename it and try again",
+          taken);
     }
   }
   // From here on these names are this system's: recovery may remove what it finds there.
@@ -197,6 +201,9 @@ void DownloadTransfer::removeMarker(const FileDescriptor& part) {
   }
   struct stat status {};
   if (_isCopy || fstat(part.get(), &status) != 0) return;
+  // A document whose marker another drive made is none of this cloud's yet.
+  const auto record = _places.records.record(_document);
+  if (!record || !*record) return;
   // Without a stamp the document is looked at again, and found to be uploaded.
   _places.records.setStamp(_document, UploadStamp::of(status));
 }

@@ -4,6 +4,7 @@
 
 #include <functional>
 #include <string>
+#include <vector>
 
 #include "linux/vald/cloud/Cancellation.h"
 #include "linux/vald/cloud/EvictionMarker.h"
@@ -25,11 +26,12 @@ NSErrorPtr walkEntries(const StoreRoots& roots, Unreadable unreadable,
                        const Cancellation& cancellation, const EachEntry& each);
 
 // The same with every marker of this user's, and the path of the document that it stands for;
-// also with those that are not believed when somebody asks for their contents. Stops at what
+// also with those that are not believed when somebody asks for their contents. Looks through
+// `otherFolders`, absolute paths, as well, where they are there and this user's. Stops at what
 // cannot be read.
 using EachMarker =
     std::function<NSErrorPtr(const std::string& documentPath, const EvictionMarker& marker)>;
-NSErrorPtr walkMarkers(const StoreRoots& roots, const Cancellation& cancellation,
-                       const EachMarker& each);
+NSErrorPtr walkMarkers(const StoreRoots& roots, const std::vector<std::string>& otherFolders,
+                       const Cancellation& cancellation, const EachMarker& each);
 
 }  // namespace skein::vald

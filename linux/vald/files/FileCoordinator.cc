@@ -2,17 +2,16 @@
 
 #include <fcntl.h>
 #include <sys/file.h>
-#include <sys/sysmacros.h>
 
 #include <algorithm>
 #include <cerrno>
-#include <cstdio>
 #include <fstream>
 #include <thread>
 #include <utility>
 
 #include "linux/vald/files/FileErrors.h"
 #include "linux/vald/files/FileNames.h"
+#include "linux/vald/files/LockHolder.h"
 
 namespace skein::vald {
 namespace {
@@ -21,24 +20,8 @@ bool overlap(const std::string& a, const std::string& b) {
   return isAtOrBelow(a, b) || isAtOrBelow(b, a);
 }
 
-// The process that holds a lock on the file, by the system's own list; 0 when unknown,
-// as for locks that belong to no one process.
-long holderOf(const struct stat& file) {
-  char wanted[64];
-  std::snprintf(wanted, sizeof(wanted), "%02x:%02x:%llu", major(file.st_dev), minor(file.st_dev),
-                static_cast<unsigned long long>(file.st_ino));
-  std::ifstream locks("/proc/locks");
-  for (std::string line; std::getline(locks, line);) {
-    // "12: FLOCK  ADVISORY  WRITE 4711 fe:00:1234 0 EOF"; waiters have "->" in between.
-    if (line.find("->") != std::string::npos || line.find(wanted) == std::string::npos) continue;
-    long holder = 0;
-    if (std::sscanf(line.c_str(), "%*s %*s %*s %*s %ld", &holder) == 1 && holder > 0) return holder;
-  }
-  return 0;
-}
-
 std::string wordsForHolder(const struct stat& file) {
-  const long holder = holderOf(file);
+  const pid_t holder = lockHolderOf(file);
   if (holder == 0) return "another program";
   std::string name;
   std::ifstream("/proc/" + std::to_string(holder) + "/comm") >> name;

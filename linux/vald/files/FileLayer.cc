@@ -42,6 +42,7 @@ std::string_view fileStepName(FileStep step) {
     case FileStep::RemoveFolder: return "remove folder";
     case FileStep::Sync: return "sync";
     case FileStep::JournalBegin: return "journal begin";
+    case FileStep::JournalMark: return "journal mark";
     case FileStep::JournalEnd: return "journal end";
   }
   return "unknown";
@@ -127,6 +128,13 @@ int FileLayer::setTimes(int at, const std::string& name, const timespec times[2]
 int FileLayer::makeLink(const std::string& target, int at, const std::string& name) {
   if (const int fault = beforeStep(FileStep::MakeLink, name)) return fault;
   return result([&] { return ::symlinkat(target.c_str(), at, name.c_str()); });
+}
+
+int FileLayer::link(int file, int at, const std::string& name) {
+  if (const int fault = beforeStep(FileStep::Link, name)) return fault;
+  return ::linkat(AT_FDCWD, descriptorPath(file).c_str(), at, name.c_str(), AT_SYMLINK_FOLLOW) == 0
+             ? 0
+             : errno;
 }
 
 int FileLayer::renameWithoutReplacing(int at, const std::string& name, int newAt,

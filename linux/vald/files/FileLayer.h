@@ -31,6 +31,7 @@ enum class FileStep : std::uint8_t {
   RemoveFolder,
   Sync,
   JournalBegin,
+  JournalMark,
   JournalEnd,
 };
 std::string_view fileStepName(FileStep step);
@@ -64,6 +65,8 @@ class FileLayer {
   // By name, not followed; times are (access, modification). An empty name is `at` itself.
   int setTimes(int at, const std::string& name, const timespec times[2]);
   int makeLink(const std::string& target, int at, const std::string& name);
+  // Another name of an open file.
+  int link(int file, int at, const std::string& name);
   // Without replacing: EEXIST when `newName` is there. Where the file system cannot
   // promise that (EINVAL, ENOSYS), a file gets its new name as a second one before it loses
   // the old; a crash between leaves both. For a folder it looks first and then renames.

@@ -191,6 +191,9 @@ class FileOperations {
   void discardStaged(const StagingPlace& staged, OperationScope& scope);
   FileResult removeAside(const StorePlace& place, const FileRequest& request, bool& again);
 
+  // putBack() of what is aside, which waits for the disk. `name`: what it is called then.
+  int putBackRemoved(const StagingPlace& aside, const StorePlace& place, std::string& name);
+
   FileResult moveTo(const StorePlace& from, const std::string& folder, const std::string& name,
                     bool bounce, OperationKind kind, const FileRequest& request);
   // One try: `taken` when the name is.
@@ -210,6 +213,7 @@ class FileOperations {
   int readTrashInfo(const StorePlace& place, const TrashedPath& trashed,
                     std::optional<TrashInfo>& info) const;
   NSErrorPtr openTrash(const OpenRoot& root, DirectoryHandle& files, DirectoryHandle& info);
+  FileResult trashAt(const StorePlace& place, const FileRequest& request);
   NSErrorPtr trashAs(const StorePlace& place, const std::string& trashedName,
                      const DirectoryHandle& trashed, const DirectoryHandle& info,
                      const FileRequest& request, bool& taken);
@@ -217,11 +221,15 @@ class FileOperations {
   int removeTrashInfo(const StorePlace& trashed);
 
   // Finishes or undoes; nil leaves the entry open for the next start.
-  std::optional<OperationState> recoverEntry(const OperationEntry& entry);
+  std::optional<OperationState> recoverEntry(OperationEntry& entry);
   // 0 or an errno.
   int finishLinking(const OperationEntry& entry);
   std::optional<OperationState> recoverImport(const OperationEntry& entry);
-  std::optional<OperationState> recoverRemoval(const OperationEntry& entry);
+  // Sets the destination where it came back under another name.
+  std::optional<OperationState> recoverRemoval(OperationEntry& entry);
+  // Where what was removed from the path comes back to: there, or, when its folder is gone, in the
+  // nearest one above. False when no root of it is there.
+  bool placeToComeBack(const std::string& path, StorePlace& place) const;
   std::optional<OperationState> recoverTrash(const OperationEntry& entry);
   std::optional<OperationState> recoverPutBack(const OperationEntry& entry);
   std::optional<OperationState> recoverMoveAcross(const OperationEntry& entry);

@@ -1,4 +1,5 @@
-// What a crash left: finished where the change was made, undone where it was not.
+// What a crash left: finished where the change was made, undone where it was not, or where a
+// removal was not decided.
 #include <set>
 #include <system_error>
 
@@ -19,11 +20,11 @@ NSErrorPtr FileOperations::recover() {
   NSErrorPtr error;
   std::vector<OperationEntry> open = _journal->openEntries(&error);
   if (error) return error;
-  std::set<std::string> wanted;
+  std::set<std::string> stillNeeded;
   for (OperationEntry& entry : open) {
     const std::optional<OperationState> state = recoverEntry(entry);
     if (!state) {
-      wanted.insert(nameOfPath(entry.aside));
+      stillNeeded.insert(nameOfPath(entry.aside));
       VL_ERROR(_log, "[ERROR] can't finish to %@ %@ now; the next start tries again",
                operationName(entry.kind), printable(entry.path));
       continue;
@@ -35,14 +36,14 @@ NSErrorPtr FileOperations::recover() {
               *state == OperationState::Done ? "finished" : "undone");
     _recovered.push_back(std::move(entry));
   }
-  if (const int failure = _staging.clear(_files, wanted)) {
+  if (const int failure = _staging.clear(_files, stillNeeded)) {
     VL_ERROR(_log, "[ERROR] can't clear the staging folder: %@",
              std::generic_category().message(failure));
   }
   return nullptr;
 }
 
-std::optional<OperationState> FileOperations::recoverEntry(const OperationEntry& entry) {
+std::optional<OperationState> FileOperations::recoverEntry(OperationEntry& entry) {
   if (const int failure = finishLinking(entry)) {
     VL_ERROR(_log, "[ERROR] can't take the second name of %@ away: %@", printable(entry.path),
              std::generic_category().message(failure));
@@ -106,17 +107,36 @@ std::optional<OperationState> FileOperations::recoverImport(const OperationEntry
   return exists(entry.destination) ? OperationState::Done : OperationState::Undone;
 }
 
-std::optional<OperationState> FileOperations::recoverRemoval(const OperationEntry& entry) {
+std::optional<OperationState> FileOperations::recoverRemoval(OperationEntry& entry) {
   StagingPlace aside;
   NSErrorPtr error = _staging.find(entry.aside, _roots, aside);
   if (error && !gone(error)) return std::nullopt;
-  const bool begun = !error && aside.folder.exists(aside.name);
-  if (begun && removeTree(_files, aside.folder, aside.name) != 0) return std::nullopt;
+  const bool isAside = !error && aside.folder.exists(aside.name);
   StorePlace place;
+  if (entry.state == OperationState::Open) {
+    // Nobody was told that it is removed.
+    if (!isAside) return OperationState::Undone;
+    std::string name;
+    if (!placeToComeBack(entry.path, place) || putBackRemoved(aside, place, name) != 0) {
+      return std::nullopt;
+    }
+    entry.destination = joinPath(place.folderPath(), name);
+    return OperationState::Undone;
+  }
+  if (isAside && removeTree(_files, aside.folder, aside.name) != 0) return std::nullopt;
   // Its folder may be gone by now, and with it what could be left.
   if (_roots.locate(entry.path, place)) return OperationState::Done;
-  if (!begun && place.folder.exists(place.name)) return OperationState::Undone;
   return removeTrashInfo(place) == 0 ? std::optional(OperationState::Done) : std::nullopt;
+}
+
+bool FileOperations::placeToComeBack(const std::string& path, StorePlace& place) const {
+  const std::string name = nameOfPath(path);
+  for (std::string folder = parentOfPath(path); !folder.empty(); folder = parentOfPath(folder)) {
+    NSErrorPtr error = _roots.locate(joinPath(folder, name), place);
+    if (!error) return true;
+    if (!gone(error)) return false;
+  }
+  return false;
 }
 
 bool FileOperations::exists(const std::string& path) const {

@@ -61,28 +61,26 @@ FileResult FileOperations::removeAside(const StorePlace& place, const FileReques
     return {{}, fileError(failure, "can't remove", path)};
   }
   if (failure != 0) return {{}, fileError(failure, "can't remove", path)};
-  const auto takeBack = [&](std::string& name) {
-    const int problem = putBack(aside->folder, name, place);
-    // A disk that refuses this may forget in a power cut that it is back; it is, all the same.
-    if (problem == 0) syncFolders(place.folder, &aside->folder);
-    return problem;
-  };
-  std::string name = aside->name;
-  // Gone for good before the first part of it is deleted: a power cut shall not bring
+  std::string name;
+  // Aside for good before the first part of it is deleted: a power cut shall not bring
   // half a tree back.
   failure = isAsked(request, aside->folder, aside->name) ? syncFolders(place.folder, &aside->folder)
                                                          : ESTALE;
   if (failure != 0) {
-    if (takeBack(name) != 0) scope->leaveOpen();
+    if (putBackRemoved(*aside, place, name) != 0) scope->leaveOpen();
     return {{}, fileError(failure, "can't remove", path)};
   }
   if (request.removed && !request.removed()) {
-    failure = takeBack(name);
+    failure = putBackRemoved(*aside, place, name);
     if (failure == 0) return cancelledRemoval(place, name);
     VL_ERROR(_log, "[ERROR] can't put %@ back (%@), so it is removed", path,
              std::generic_category().message(failure));
   }
 
+  if (NSErrorPtr error = scope->decide()) {
+    if (putBackRemoved(*aside, place, name) != 0) scope->leaveOpen();
+    return {{}, error};
+  }
   // From here on it is removed; what cannot be deleted now is deleted at the next start.
   scope->leaveOpen();
   const int forgetting = removeTrashInfo(place);
@@ -100,6 +98,15 @@ FileResult FileOperations::removeAside(const StorePlace& place, const FileReques
     rest();
   }
   return {};
+}
+
+int FileOperations::putBackRemoved(const StagingPlace& aside, const StorePlace& place,
+                                   std::string& name) {
+  name = aside.name;
+  const int failure = putBack(aside.folder, name, place);
+  // A disk that refuses this may forget in a power cut that it is back; it is, all the same.
+  if (failure == 0) syncFolders(place.folder, &aside.folder);
+  return failure;
 }
 
 }  // namespace skein::vald

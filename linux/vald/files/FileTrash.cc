@@ -63,6 +63,18 @@ FileResult FileOperations::trash(const std::string& path, const FileRequest& req
             fileErrorWithWords(NSFileWriteNoPermissionError, EACCES,
                                "\"" + printable(path) + "\" is in the trash already", path)};
   }
+  FileResult result = trashAt(place, request);
+  // On a full disk the trash's note of it needs what is kept for the journal's.
+  struct stat folder {};
+  while (result.error && result.error->code() == NSFileWriteOutOfSpaceError &&
+         place.folder.status(folder) == 0 && place.folder.exists(place.name) &&
+         _journal->makeRoom(folder.st_dev)) {
+    result = trashAt(place, request);
+  }
+  return result;
+}
+
+FileResult FileOperations::trashAt(const StorePlace& place, const FileRequest& request) {
   DirectoryHandle files;
   DirectoryHandle info;
   if (NSErrorPtr error = openTrash(*place.root, files, info)) return {{}, error};
@@ -76,7 +88,8 @@ FileResult FileOperations::trash(const std::string& path, const FileRequest& req
     const std::string folder = joinPath(place.root->path, trashFolderName(::geteuid()));
     return {joinPath(joinPath(folder, "files"), name), nullptr};
   }
-  return {{}, fileError(EEXIST, "there are too many of the same name in the trash for", path)};
+  return {{},
+          fileError(EEXIST, "there are too many of the same name in the trash for", place.path())};
 }
 
 NSErrorPtr FileOperations::trashAs(const StorePlace& place, const std::string& name,

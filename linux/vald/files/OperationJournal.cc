@@ -17,7 +17,7 @@
 namespace skein::vald {
 namespace {
 
-constexpr int kVersion = 1;
+constexpr int kVersion = 2;
 constexpr char kTables[] = R"(
   CREATE TABLE IF NOT EXISTS operation(
     id INTEGER PRIMARY KEY AUTOINCREMENT, kind INTEGER NOT NULL, state INTEGER NOT NULL,
@@ -26,7 +26,8 @@ constexpr char kTables[] = R"(
   CREATE INDEX IF NOT EXISTS operationPath ON operation(path);
   CREATE INDEX IF NOT EXISTS operationDestination ON operation(destination);
   CREATE INDEX IF NOT EXISTS operationDocument ON operation(document) WHERE document <> '';
-  CREATE INDEX IF NOT EXISTS operationOpen ON operation(state) WHERE state = 0;
+  DROP INDEX IF EXISTS operationOpen;
+  CREATE INDEX IF NOT EXISTS operationUnended ON operation(state) WHERE state IN (0, 3);
 )";
 #define SKEIN_COLUMNS "kind, state, time, origin, document, path, destination, aside"
 constexpr char kInsert[] =
@@ -102,18 +103,12 @@ std::unique_ptr<OperationJournal> OperationJournal::open(const std::string& data
   sqlite3* database = nullptr;
   const int flags = SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE | SQLITE_OPEN_NOMUTEX;
   const int opened = sqlite3_open_v2(databasePath.c_str(), &database, flags, nullptr);
-  std::unique_ptr<OperationJournal> journal(new OperationJournal(database, retention, files));
+  std::unique_ptr<OperationJournal> journal(
+      new OperationJournal(database, databasePath, retention, files));
   if (opened != SQLITE_OK) return refuse(sqlite3_errmsg(database));
   sqlite3_busy_timeout(database, 5000);
 
   MutexLock lock(journal->_mutex);
-  const int flagsOfReserve = O_WRONLY | O_CREAT | O_NOFOLLOW | O_CLOEXEC;
-  journal->_reserve =
-      FileDescriptor(::open((databasePath + "-reserve").c_str(), flagsOfReserve, 0600));
-  struct stat reserve {};
-  if (journal->_reserve && ::fstat(journal->_reserve.get(), &reserve) == 0) {
-    journal->_reserved = reserve.st_size;
-  }
   int version = 0;
   // Nobody else reads it, so one lock, taken with the first access, stands for all.
   int code = journal->runWithRoom("PRAGMA locking_mode = EXCLUSIVE; PRAGMA journal_mode = WAL");
@@ -130,7 +125,10 @@ std::unique_ptr<OperationJournal> OperationJournal::open(const std::string& data
   }
   if (code == SQLITE_OK) code = journal->runWithRoom(kTables);
   if (code == SQLITE_OK && version != kVersion) {
-    code = journal->run("PRAGMA user_version = " + std::to_string(kVersion));
+    // Version 1 deleted what an open removal had set aside: it may be there in part.
+    const std::string removal = std::to_string(static_cast<int>(OperationKind::Remove));
+    code = journal->run("UPDATE operation SET state = 3 WHERE state = 0 AND kind = " + removal +
+                        "; PRAGMA user_version = " + std::to_string(kVersion));
   }
   if (code == SQLITE_OK) code = journal->prepare("BEGIN IMMEDIATE", journal->_beginTransaction);
   if (code == SQLITE_OK) code = journal->prepare("COMMIT", journal->_commit);
@@ -139,12 +137,16 @@ std::unique_ptr<OperationJournal> OperationJournal::open(const std::string& data
     code = journal->prepare("UPDATE operation SET state = ?1 WHERE id = ?2", journal->_setState);
   }
   if (code != SQLITE_OK) return refuse(sqlite3_errmsg(database));
-  journal->takeReserve();
+  journal->_reserve.take();
   return journal;
 }
 
-OperationJournal::OperationJournal(sqlite3* database, std::uint64_t retention, FileLayer& files)
-    : _files(files), _retention(retention), _database(database) {}
+OperationJournal::OperationJournal(sqlite3* database, const std::string& path,
+                                   std::uint64_t retention, FileLayer& files)
+    : _files(files),
+      _retention(retention),
+      _database(database),
+      _reserve(path + "-reserve", kReserve, kReservedPart) {}
 
 OperationJournal::~OperationJournal() {
   MutexLock lock(_mutex);
@@ -215,11 +217,11 @@ NSErrorPtr OperationJournal::begin(OperationEntry& entry) {
   }
   entry.when = std::chrono::time_point_cast<NSDate::duration>(std::chrono::system_clock::now());
   MutexLock lock(_mutex);
-  takeReserve();
+  const bool makesRoom = entry.kind == OperationKind::Remove || entry.kind == OperationKind::Trash;
+  // What was given up for these is theirs.
+  if (!makesRoom) _reserve.take();
   int code = writeBegin(entry);
-  while ((code & 0xff) == SQLITE_FULL && entry.kind == OperationKind::Remove && giveReserveUp()) {
-    code = writeBegin(entry);
-  }
+  while ((code & 0xff) == SQLITE_FULL && makesRoom && _reserve.giveUp()) code = writeBegin(entry);
   if (code != SQLITE_OK) return failure("can't write", code);
   _unwritten.clear();
   return nullptr;
@@ -234,7 +236,7 @@ int OperationJournal::writeBegin(OperationEntry& entry) {
   }
   if (code == SQLITE_OK) code = insert(entry);
   if (code == SQLITE_OK && entry.id % kPruneEvery == 0) {
-    code = run("DELETE FROM operation WHERE state <> 0 AND id <= " +
+    code = run("DELETE FROM operation WHERE state IN (1, 2) AND id <= " +
                std::to_string(entry.id - static_cast<std::int64_t>(_retention)));
   }
   if (code == SQLITE_OK) code = run(_commit);
@@ -242,26 +244,27 @@ int OperationJournal::writeBegin(OperationEntry& entry) {
   return code;
 }
 
-void OperationJournal::takeReserve() {
-  if (!_reserve || _reserved == kReserve) return;
-  if (::posix_fallocate(_reserve.get(), 0, kReserve) == 0) {
-    _reserved = kReserve;
-  } else {
-    // What was allocated of the rest is for others.
-    [[maybe_unused]] const int failure = ::ftruncate(_reserve.get(), _reserved);
-  }
-}
-
-bool OperationJournal::giveReserveUp() {
-  if (_reserved == 0) return false;
-  _reserved = std::max<off_t>(_reserved - kReservedPart, 0);
-  return ::ftruncate(_reserve.get(), _reserved) == 0;
+bool OperationJournal::makeRoom(dev_t disk) {
+  MutexLock lock(_mutex);
+  return _reserve.isOn(disk) && _reserve.giveUp();
 }
 
 int OperationJournal::runWithRoom(const std::string& sql) {
   int code = run(sql);
-  while ((code & 0xff) == SQLITE_FULL && giveReserveUp()) code = run(sql);
+  while ((code & 0xff) == SQLITE_FULL && _reserve.giveUp()) code = run(sql);
   return code;
+}
+
+NSErrorPtr OperationJournal::decide(std::int64_t id) {
+  if (const int fault = _files.step(FileStep::JournalMark, {})) {
+    return fileError(fault, "can't write", "the journal of operations");
+  }
+  MutexLock lock(_mutex);
+  const End decided{id, OperationState::Decided};
+  int code = setDurable(true);
+  if (code == SQLITE_OK) code = write(decided);
+  while ((code & 0xff) == SQLITE_FULL && _reserve.giveUp()) code = write(decided);
+  return code == SQLITE_OK ? nullptr : failure("can't write", code);
 }
 
 void OperationJournal::finish(End end) {
@@ -316,7 +319,7 @@ std::vector<OperationEntry> OperationJournal::select(const std::string& conditio
 }
 
 std::vector<OperationEntry> OperationJournal::openEntries(NSErrorOut error) {
-  return select("state = 0 ORDER BY id", {std::string_view()}, error);
+  return select("state IN (0, 3) ORDER BY id", {std::string_view()}, error);
 }
 
 std::vector<OperationEntry> OperationJournal::historyOfPath(const std::string& path,

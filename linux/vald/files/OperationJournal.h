@@ -1,5 +1,7 @@
 #pragma once
 
+#include <sys/types.h>
+
 #include <cstdint>
 #include <memory>
 #include <optional>
@@ -9,7 +11,7 @@
 #include <vector>
 
 #include "base/Mutex.h"
-#include "linux/protocol/FileDescriptor.h"
+#include "linux/vald/files/DiskReserve.h"
 #include "linux/vald/files/FileLayer.h"
 #include "platform/foundation/NSDate.h"
 #include "platform/foundation/NSError.h"
@@ -32,7 +34,8 @@ enum class OperationKind : std::uint8_t {
 // "import", "create folder", ...
 const char* operationName(OperationKind kind);
 
-enum class OperationState : std::uint8_t { Open = 0, Done = 1, Undone = 2 };
+// Decided: a removal that is yet to be finished, and not taken back any more.
+enum class OperationState : std::uint8_t { Open = 0, Done = 1, Undone = 2, Decided = 3 };
 
 // One operation on the store: what was asked, by whom, and what became of it.
 struct OperationEntry {
@@ -59,9 +62,9 @@ struct OperationEntry {
 // loses is found again by looking at the files. Ended entries stay as the provenance of
 // what went and moved, the newest `retention` of them.
 //
-// So that something can be removed from a full disk, room is kept for that beside the database
-// (`DATABASE-reserve`). A part of it is given up each time that the journal cannot be opened,
-// or a removal not be written, and taken again when there is room. Any thread.
+// So that something can be removed or trashed on a full disk, room is kept for that beside the
+// database (`DATABASE-reserve`). A part of it is given up each time that the journal cannot be
+// opened, or such an entry not be written, and taken again when there is room. Any thread.
 class OperationJournal {
  public:
   // Null with an error that names the cause. `files` outlives the journal.
@@ -72,8 +75,14 @@ class OperationJournal {
 
   // Sets the entry's id. An error: nothing was written and nothing may be changed.
   NSErrorPtr begin(OperationEntry& entry);
+  // From here on the removal is finished, whatever happens. On the disk when it answers null;
+  // after an error it is as before.
+  NSErrorPtr decide(std::int64_t id);
   // An end that cannot be written now is written with the next entry.
   void end(std::int64_t id, OperationState state);
+  // Gives a part of the reserve to what else has to be written on this disk; false when it is
+  // not the journal's, or nothing is left.
+  bool makeRoom(dev_t disk);
   // Forgets an entry that came to nothing before a second try.
   void discard(std::int64_t id);
 
@@ -88,7 +97,8 @@ class OperationJournal {
                                                 NSErrorOut error);
 
  private:
-  OperationJournal(sqlite3* database, std::uint64_t retention, FileLayer& files);
+  OperationJournal(sqlite3* database, const std::string& path, std::uint64_t retention,
+                   FileLayer& files);
 
   struct End {
     std::int64_t id;
@@ -106,9 +116,6 @@ class OperationJournal {
   int insert(OperationEntry& entry) SKEIN_REQUIRES(_mutex);
   // The entry as one transaction, with the ends that are not written yet. 0 or SQLite's code.
   int writeBegin(OperationEntry& entry) SKEIN_REQUIRES(_mutex);
-  void takeReserve() SKEIN_REQUIRES(_mutex);
-  // False when nothing is left of it.
-  bool giveReserveUp() SKEIN_REQUIRES(_mutex);
   // run(), with more room where that is what it lacks.
   int runWithRoom(const std::string& sql) SKEIN_REQUIRES(_mutex);
   NSErrorPtr failure(const char* doing, int code) SKEIN_REQUIRES(_mutex);
@@ -129,8 +136,7 @@ class OperationJournal {
   sqlite3_stmt* _setState SKEIN_GUARDED_BY(_mutex) = nullptr;
   bool _isDurable SKEIN_GUARDED_BY(_mutex) = true;  // SQLite's own beginning
   std::set<End> _unwritten SKEIN_GUARDED_BY(_mutex);
-  FileDescriptor _reserve SKEIN_GUARDED_BY(_mutex);
-  off_t _reserved SKEIN_GUARDED_BY(_mutex) = 0;  // bytes that the file has
+  DiskReserve _reserve SKEIN_GUARDED_BY(_mutex);
 };
 
 }  // namespace skein::vald

@@ -20,6 +20,8 @@ class OperationScope {
 
   // The entry is on the disk. An error: change nothing.
   NSErrorPtr begin();
+  // See OperationJournal.
+  NSErrorPtr decide() { return _journal.decide(_entry.id); }
   const OperationEntry& entry() const { return _entry; }
 
   void done() { _outcome = Outcome::Done; }

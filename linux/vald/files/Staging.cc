@@ -84,11 +84,10 @@ NSErrorPtr Staging::find(const std::string& path, const StoreRoots& roots,
   return nullptr;
 }
 
-int Staging::clear(FileLayer& files, const std::set<std::string>& wanted) const {
+int Staging::clear(FileLayer& files, const std::set<std::string>& kept) const {
   int first = 0;
   const int failure = _folder.list([&](const std::string& name) {
-    if (wanted.contains(name)) return true;
-    const int own = removeTree(files, _folder, name);
+    const int own = kept.contains(name) ? 0 : removeTree(files, _folder, name);
     if (first == 0) first = own;
     return true;
   });

@@ -39,9 +39,8 @@ class Staging {
 
   // Where `path`, one that place() gave in this or an earlier run, is now.
   NSErrorPtr find(const std::string& path, const StoreRoots& roots, StagingPlace& place) const;
-  // Deletes all that is outside but the names `wanted`, which entries that could not be ended
-  // have: nobody is using the rest at start.
-  int clear(FileLayer& files, const std::set<std::string>& wanted) const;
+  // At start: deletes all that is outside but these names.
+  int clear(FileLayer& files, const std::set<std::string>& kept) const;
 
  private:
   std::string _path;

@@ -155,6 +155,12 @@ void runDurably(SqliteDatabase& database, SqliteStatement& statement) {
 
 }  // namespace
 
+bool indexLacksRoom(SqliteDatabase& database) {
+  // What its connections share is a file as well.
+  return database.code() == SQLITE_FULL ||
+         sqlite3_extended_errcode(database.handle()) == SQLITE_IOERR_SHMSIZE;
+}
+
 bool setIndexFileAside(const std::string& path, const std::string& suffix) {
   bool moved = true;
   for (const char* part : kParts) {
@@ -227,7 +233,8 @@ std::unique_ptr<SqliteDatabase> openIndexFile(const std::string& path, Log& log,
     if (verdict == Verdict::Empty || failure == SQLITE_FULL || failure == SQLITE_BUSY ||
         failure == SQLITE_READONLY || failure == SQLITE_CANTOPEN || failure == SQLITE_IOERR) {
       error.store(
-          vl_errorWithPOSIXCode(EIO, "The index " + path + " could not be used: " + reason + "."));
+          vl_errorWithPOSIXCode(indexLacksRoom(*database) ? ENOSPC : EIO,
+                                "The index " + path + " could not be used: " + reason + "."));
       return nullptr;
     }
     setAside = true;

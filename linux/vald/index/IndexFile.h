@@ -28,6 +28,9 @@ namespace skein::vald {
 // which), never changed. Null when the folder cannot be written to.
 std::unique_ptr<SqliteDatabase> openIndexFile(const std::string& path, Log& log, NSErrorOut error);
 
+// Whether a statement failed since the index's disk is full. openIndexFile() answers ENOSPC then.
+bool indexLacksRoom(SqliteDatabase& database);
+
 // Notes that the index at `path` turned out to be damaged, so that the next start sets it
 // aside.
 void markIndexFileDamaged(const std::string& path);
