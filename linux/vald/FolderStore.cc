@@ -198,6 +198,7 @@ Page FolderStore::list(const FolderRow& folder, SortOrder order, std::uint64_t o
                             last.name, last.id.rawID()});
     }
   }
+  _writer->noteAsked();
   page.items.reserve(items.size());
   for (const FoundItem& item : items) {
     // Folders in the trash are none of all folders.
@@ -347,7 +348,10 @@ VLQueryItemPtr FolderStore::itemAtPath(const std::string& path, bool scanFirst, 
     }
     // A container is at its own path, not where it is shown.
     if (!found || found->row.containerID) break;
-    if (isLast) return found->item();
+    if (isLast) {
+      _writer->noteAsked();
+      return found->item();
+    }
     folder = std::move(below);
     start = end + 1;
   }

@@ -9,6 +9,7 @@ namespace skein::vald {
 namespace {
 
 constexpr int kMostTries = 25;
+constexpr auto kLongestGathering = std::chrono::milliseconds(100);
 constexpr std::size_t kAttributesAtOnce = 256;
 constexpr std::uint64_t kAttributesUnsaved = 16'384;
 
@@ -42,46 +43,76 @@ void StoreWriter::gather(FolderKey key, int descriptor, const DirtyFolder& chang
   _reconciler.addSelf(key);
 }
 
+bool StoreWriter::gatherFolders(DirtySet& dirty, DirtySet& gathered, DirtySet& unread) {
+  bool isProgress = false;
+  _disk.forget();
+  for (auto entry = dirty.folders.begin(); entry != dirty.folders.end();) {
+    const FolderKey key = entry->first;
+    const Folder* folder = _folders.find(key);
+    int descriptor = -1;
+    int error = 0;
+    // A folder that was not read yet will be. It may be on its way here, read before this
+    // change: then the change waits until the folder has arrived.
+    const bool isKnown = folder != nullptr && folder->row.scanned;
+    if (!isKnown && _scanner.pending() > 0) {
+      unread.folders[key].add(std::move(entry->second));
+      entry = dirty.folders.erase(entry);
+      continue;
+    }
+    const Look look = isKnown ? _disk.open(key, descriptor, error) : Look::RootLost;
+    if (look == Look::Gone) {
+      ++entry;
+      continue;
+    }
+    if (look == Look::Unreadable) noteUnreadable(key, error);
+    if (look == Look::Seen) gather(key, descriptor, entry->second);
+    isProgress = true;
+    gathered.folders[key].add(std::move(entry->second));
+    entry = dirty.folders.erase(entry);
+  }
+  return isProgress;
+}
+
 void StoreWriter::reconcile(DirtySet& dirty) {
   begin();
-  const bool concernsTrash =
-      std::any_of(dirty.folders.begin(), dirty.folders.end(), [&](const auto& changed) {
-        return _folders.roots().contains(changed.first) &&
-               (changed.second.whole ||
-                std::any_of(changed.second.names.begin(), changed.second.names.end(),
-                            [](const std::string& name) { return name.starts_with(".Trash-"); }));
-      });
+  const auto checkTrashesOf = [&](const DirtySet& changed) {
+    const bool concernsTrash =
+        std::any_of(changed.folders.begin(), changed.folders.end(), [&](const auto& folder) {
+          const auto& names = folder.second.names;
+          return _folders.roots().contains(folder.first) &&
+                 (folder.second.whole ||
+                  std::any_of(names.begin(), names.end(),
+                              [](const std::string& name) { return name.starts_with(".Trash-"); }));
+        });
+    if (concernsTrash) checkTrashes(true);
+  };
   // Before anything is decided: what is missing may be in a trash that was made for it.
-  if (concernsTrash) checkTrashes(true);
+  checkTrashesOf(dirty);
   DirtySet unread;
+  DirtySet gathered;
+  const auto start = std::chrono::steady_clock::now();
   // A folder whose way changed in this very batch is found once its own change is decided.
-  for (bool isProgress = true; isProgress && !dirty.folders.empty();) {
+  for (bool isProgress = true; isProgress && !dirty.folders.empty(); gathered.folders.clear()) {
     isProgress = false;
-    _disk.forget();
-    for (auto entry = dirty.folders.begin(); entry != dirty.folders.end();) {
-      const FolderKey key = entry->first;
-      const Folder* folder = _folders.find(key);
-      int descriptor = -1;
-      int error = 0;
-      // A folder that was not read yet will be. It may be on its way here, read before this
-      // change: then the change waits until the folder has arrived.
-      const bool isKnown = folder != nullptr && folder->row.scanned;
-      if (!isKnown && _scanner.pending() > 0) {
-        unread.folders.insert(std::move(*entry));
-        entry = dirty.folders.erase(entry);
-        continue;
+    for (int look = 0;; ++look) {
+      _reconciler.beginGathering();
+      isProgress = gatherFolders(dirty, gathered, unread) || isProgress;
+      // What was renamed before a name was looked at may have been told after that.
+      if (!_reconciler.mayBeSave()) break;
+      _watcher.drain();
+      if (!_watcher.dirtySince()) break;
+      if (look == kMostLooks || std::chrono::steady_clock::now() - start > kLongestGathering) {
+        _reconciler.noteThatItGoesOn();
+        break;
       }
-      const Look look = isKnown ? _disk.open(key, descriptor, error) : Look::RootLost;
-      if (look == Look::Gone) {
-        ++entry;
-        continue;
+      DirtySet more = _watcher.take();
+      _reconciler.gatherAgain();
+      noteLosses(more);
+      checkTrashesOf(more);
+      for (DirtySet* part : {&more, &gathered}) {
+        for (auto& [key, changes] : part->folders) dirty.folders[key].add(std::move(changes));
       }
-      if (look == Look::Unreadable) noteUnreadable(key, error);
-      if (look == Look::Seen) {
-        gather(key, descriptor, entry->second);
-      }
-      isProgress = true;
-      entry = dirty.folders.erase(entry);
+      gathered.folders.clear();
     }
     _reconciler.decide(false);
     afterDecisions();
@@ -93,11 +124,7 @@ void StoreWriter::reconcile(DirtySet& dirty) {
     dirty.folders.clear();
   }
   for (DirtySet* left : {&dirty, &unread}) {
-    for (auto& [key, changes] : left->folders) {
-      DirtyFolder& later = _later.folders[key];
-      later.whole = later.whole || changes.whole;
-      later.names.merge(changes.names);
-    }
+    for (auto& [key, changes] : left->folders) _later.folders[key].add(std::move(changes));
   }
   commit();
 }

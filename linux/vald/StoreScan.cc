@@ -503,11 +503,15 @@ Look StoreWriter::lookAtNames(const std::vector<Place>& places) {
   };
   // Where another file has the name now, the watcher may tell where the old one is, without which
   // that looks like a save: all of it is decided together.
-  if (lookAtAll()) {
+  for (int look = 0; lookAtAll(); ++look) {
     _watcher.drain();
+    if (look > 0 && !_watcher.dirtySince()) break;
+    if (look == kMostLooks) {
+      _reconciler.noteThatItGoesOn();
+      break;
+    }
     reconcileDirt(_watcher.take());
     begin();
-    lookAtAll();
   }
   Look look = Look::Gone;
   for (std::size_t at = 0; at < places.size(); ++at) {

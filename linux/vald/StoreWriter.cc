@@ -217,14 +217,17 @@ void StoreWriter::takeDirt() {
   if (!isDue && _later.empty()) return;
   DirtySet dirty = _watcher.take();
   for (auto& [folder, names] : std::exchange(_later, {}).folders) {
-    DirtyFolder& entry = dirty.folders[folder];
-    entry.whole = entry.whole || names.whole;
-    entry.names.merge(names.names);
+    dirty.folders[folder].add(std::move(names));
   }
   reconcileDirt(std::move(dirty));
 }
 
 void StoreWriter::reconcileDirt(DirtySet dirty) {
+  noteLosses(dirty);
+  reconcile(dirty);
+}
+
+void StoreWriter::noteLosses(const DirtySet& dirty) {
   if (dirty.rootMoved) checkRoots();
   if (dirty.overflow) {
     VL_NOTICE(_log,
@@ -232,7 +235,6 @@ void StoreWriter::reconcileDirt(DirtySet dirty) {
               "as a whole");
     startRound(LocalDaemonStatus::Scan::Rescanning);
   }
-  reconcile(dirty);
 }
 
 void StoreWriter::answerSettled() {

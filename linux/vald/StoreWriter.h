@@ -87,6 +87,8 @@ class StoreWriter {
   bool setSetting(const std::string& key, const std::optional<std::string>& value);
 
   // Any thread.
+  // Somebody is told of documents that he asked for by path, or by listing a folder.
+  void noteAsked() { _reconciler.noteAsked(); }
   void status(LocalDaemonStatus& status) SKEIN_EXCLUDES(_mutex);
   std::uint64_t rank() const { return _rank.load(); }
   std::uint64_t oldestRank() const { return _oldestRank.load(); }
@@ -134,9 +136,15 @@ class StoreWriter {
   void accept(FolderKey folder, const FolderSnapshot& snapshot, bool inRound, bool isOld);
   void loadFolder(FolderKey folder, const FolderSnapshot& snapshot);
   void endBulkLoad();
+  // How often names are looked at again, because the disk goes on, before they are decided.
+  static constexpr int kMostLooks = 10;
   // All that the watcher told of.
   void reconcileDirt(DirtySet dirty);
+  void noteLosses(const DirtySet& dirty);
   void reconcile(DirtySet& dirty);
+  // Gathers what changed in those of the folders that can be read, and moves them to `gathered`;
+  // those that have to wait for the scanner to `unread`. Whether there was one.
+  bool gatherFolders(DirtySet& dirty, DirtySet& gathered, DirtySet& unread);
   // What changed in one folder that is open.
   void gather(FolderKey folder, int descriptor, const DirtyFolder& changes);
   // A piece of the round over attributes that follows a first scan.

@@ -111,6 +111,23 @@ TEST_F(OldSnapshots, TellWhatIsStillSo) {
   EXPECT_EQ(namesIn(a), (std::vector<std::string>{"new", "saved"}));
 }
 
+// Two old documents change places twice: what is decided after the first and was seen before the
+// second must not take one's file for the other's save.
+TEST_F(OldSnapshots, OfNamesThatWentOnGiveNoFileToAnotherDocument) {
+  const ItemRow doc = row(a, "doc");
+  const ItemRow saved = row(a, "saved");
+  exchange("a/doc", "a/saved");
+  FileState state;
+  ASSERT_EQ(rig->disk.at(a, "doc", state), Look::Seen);
+  rig->reconciler.addName(a, "doc", state);
+  exchange("a/doc", "a/saved");
+  rig->reconciler.decide(false);
+  EXPECT_EQ(row(a, "doc").id, doc.id);
+  EXPECT_TRUE(row(a, "doc").state.key.names(doc.state.key));
+  EXPECT_EQ(row(a, "saved").id, saved.id);
+  EXPECT_TRUE(row(a, "saved").state.key.names(saved.state.key));
+}
+
 // Until its parent's change is seen nothing is known of what is in it.
 TEST_F(OldSnapshots, OfAFolderThatIsOnItsWayAreLeftForLater) {
   write("a/new");

@@ -2,6 +2,7 @@
 // and while vald was down.
 #include <unistd.h>
 
+#include <atomic>
 #include <functional>
 #include <thread>
 
@@ -153,6 +154,97 @@ TEST_F(StoreIdentity, OldDocumentsThatReplaceOrExchangeMove) {
   settle();
   EXPECT_EQ(id("a.txt"), c);
   EXPECT_EQ(store->itemWithID(*VLFileObjectID::fileObjectIDWithString(b), nullptr), nullptr);
+}
+
+// Somebody has their numbers, so it is no save: each number goes where its file goes.
+TEST_F(StoreIdentity, YoungDocumentsThatExchangeOrRotateMove) {
+  using Steps = std::vector<std::function<void()>>;
+  const std::vector<std::pair<Steps, std::string>> cases = {
+      {{[&] { exchange("a", "b"); }}, "bac"},
+      {{[&] { rename("a", "t"); }, [&] { rename("b", "a"); }, [&] { rename("t", "b"); }}, "bac"},
+      {{[&] { rename("a", "t"); }, [&] { rename("b", "a"); }, [&] { rename("c", "b"); },
+        [&] { rename("t", "c"); }},
+       "cab"},
+      {{[&] { link("a", "t"); }, [&] { remove("a"); }, [&] { rename("b", "a"); },
+        [&] { link("t", "b"); }, [&] { remove("t"); }},
+       "bac"},
+      // A backup's name says nothing when what takes the name is known.
+      {{[&] { rename("a", "a~"); }, [&] { rename("b", "a"); }, [&] { rename("a~", "b"); }}, "bac"},
+      {{[&] { rename("a", "a~"); }, [&] { rename("a~", "t"); }, [&] { rename("b", "a"); },
+        [&] { rename("t", "b"); }},
+       "bac"},
+  };
+  for (std::size_t number = 0; number < cases.size(); ++number) {
+    for (const bool isSeenStepByStep : {true, false}) {
+      TearDown();
+      SetUp();
+      open();
+      std::map<char, std::string> ids;
+      for (const char* name : {"a", "b", "c"}) {
+        write(name, name);
+        settle();
+        ids[*name] = id(name);
+      }
+      for (const auto& step : cases[number].first) {
+        step();
+        if (isSeenStepByStep) settle();
+      }
+      settle();
+      for (std::size_t at = 0; at < 3; ++at) {
+        EXPECT_EQ(id({cases[number].second[at]}), ids["abc"[at]])
+            << "case " << number << (isSeenStepByStep ? ", step by step: " : ": ") << "abc"[at];
+      }
+      EXPECT_EQ(listed().size(), 3U);
+    }
+  }
+}
+
+// Whatever is looked at in between, and whenever.
+TEST_F(StoreIdentity, NumbersFollowTheirFilesThroughRotationsWithoutPause) {
+  for (const bool areOld : {true, false}) {
+    TearDown();
+    SetUp();
+    const std::vector<std::string> names{"a", "b", "c"};
+    if (!areOld) open();
+    for (const std::string& name : names) write(name, name);
+    if (areOld) open();
+    settle();
+    std::map<std::string, std::string> ids;
+    for (const std::string& name : names) ids[name] = id(name);
+    std::atomic<bool> isDone = false;
+    std::thread rotating([&] {
+      for (int round = 0; round < 2000; ++round) {
+        ::rename(at("a").c_str(), at("t").c_str());
+        ::rename(at("b").c_str(), at("a").c_str());
+        ::rename(at("c").c_str(), at("b").c_str());
+        ::rename(at("t").c_str(), at("c").c_str());
+      }
+      isDone = true;
+    });
+    for (std::size_t turn = 0; !isDone; ++turn) store->lookAtPaths({at(names[turn % 3])});
+    rotating.join();
+    settle();
+    // 2000 rotations of three leave each two names back.
+    EXPECT_EQ(id("b"), ids["a"]) << areOld;
+    EXPECT_EQ(id("c"), ids["b"]) << areOld;
+    EXPECT_EQ(id("a"), ids["c"]) << areOld;
+    EXPECT_EQ(listed().size(), 3U);
+  }
+}
+
+TEST_F(StoreIdentity, ALinkOfAKnownDocumentOverAnotherIsANewOne) {
+  write("a.txt", "a");
+  write("b.txt", "b");
+  open();
+  const std::string a = id("a.txt");
+  const std::string b = id("b.txt");
+  link("b.txt", "link");
+  rename("link", "a.txt");
+  settle();
+  EXPECT_EQ(id("b.txt"), b);
+  EXPECT_NE(id("a.txt"), a);
+  EXPECT_NE(id("a.txt"), b);
+  EXPECT_EQ(store->itemWithID(*VLFileObjectID::fileObjectIDWithString(a), nullptr), nullptr);
 }
 
 TEST_F(StoreIdentity, ACopyAndASecondLinkAreNewDocuments) {

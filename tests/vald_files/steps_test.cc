@@ -96,13 +96,13 @@ TEST(Steps, OfEveryOperationAreAllThereAndInOrder) {
       {"remove",
        [](TestDrive& drive, FileOperations& files) { return files.remove(drive.at("a"), kPlain); },
        {"journal begin remove", "commit", "rename a", "sync store", "sync state/staging",
-        "unlink " + removed, "journal end"}},
+        "journal mark", "commit", "unlink " + removed, "journal end"}},
       {"remove a tree",
        [](TestDrive& drive, FileOperations& files) {
          return files.remove(drive.at("folder"), kPlain);
        },
        {"journal begin remove", "commit", "rename folder", "sync store", "sync state/staging",
-        "unlink b", "remove folder " + removed, "journal end"}},
+        "journal mark", "commit", "unlink b", "remove folder " + removed, "journal end"}},
       {"import",
        [](TestDrive& drive, FileOperations& files) {
          return files.importDocument(drive.outside + "/tree", drive.store, {}, kPlain);

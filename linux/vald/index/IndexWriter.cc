@@ -51,7 +51,7 @@ IndexWriter::IndexWriter(SqliteDatabase& database)
       _bury(database,
             "INSERT INTO tombstone(rank, id, kind, holder, parent, name, inode, generation, born, "
             "died) VALUES(?,?,?,?,?,?,?,?,?,?)"),
-      _tombstonesWithInode(database, "SELECT * FROM tombstone WHERE inode=? ORDER BY rank DESC"),
+      _tombstoneWithInode(database, "SELECT * FROM tombstone WHERE inode=? ORDER BY rank DESC"),
       _tombstoneAt(database,
                    "SELECT * FROM tombstone WHERE parent=? AND name=? AND died>=? AND kind=0 "
                    "ORDER BY rank DESC LIMIT 1"),
@@ -218,11 +218,16 @@ std::optional<ItemRow> IndexWriter::rowWithID(VLFileObjectID id) {
   return std::move(found.front());
 }
 
-std::vector<Tombstone> IndexWriter::tombstonesWithInode(std::uint64_t inode) {
-  std::vector<Tombstone> tombstones;
-  _tombstonesWithInode.start(inode);
-  while (_tombstonesWithInode.step()) tombstones.push_back(tombstoneFromRow(_tombstonesWithInode));
-  return tombstones;
+std::optional<Tombstone> IndexWriter::tombstoneWithInode(
+    std::uint64_t inode, const std::function<bool(const Tombstone&)>& fits) {
+  _tombstoneWithInode.start(inode);
+  while (_tombstoneWithInode.step()) {
+    Tombstone tombstone = tombstoneFromRow(_tombstoneWithInode);
+    if (!fits(tombstone)) continue;
+    _tombstoneWithInode.reset();
+    return tombstone;
+  }
+  return std::nullopt;
 }
 
 std::optional<Tombstone> IndexWriter::tombstoneAt(FolderKey folder, std::string_view name,

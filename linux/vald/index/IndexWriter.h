@@ -1,5 +1,6 @@
 #pragma once
 
+#include <functional>
 #include <optional>
 #include <string>
 #include <vector>
@@ -75,7 +76,9 @@ class IndexWriter {
   std::vector<ItemRow> rowsAfter(std::uint64_t rank, std::uint64_t until, std::size_t limit);
   std::optional<ItemRow> rowWithID(VLFileObjectID id);
 
-  std::vector<Tombstone> tombstonesWithInode(std::uint64_t inode);
+  // The latest with this inode that fits.
+  std::optional<Tombstone> tombstoneWithInode(std::uint64_t inode,
+                                              const std::function<bool(const Tombstone&)>& fits);
   // The latest that died at this place at `since` or after.
   std::optional<Tombstone> tombstoneAt(FolderKey folder, std::string_view name, std::int64_t since);
   void dropTombstone(std::uint64_t rank);
@@ -111,7 +114,7 @@ class IndexWriter {
   ItemCounts _counts;
 
   SqliteStatement _insert, _update, _erase, _children, _subfolders, _named, _withInode, _withID;
-  SqliteStatement _bury, _tombstonesWithInode, _tombstoneAt, _dropTombstone;
+  SqliteStatement _bury, _tombstoneWithInode, _tombstoneAt, _dropTombstone;
   SqliteStatement _putFolder, _eraseFolder, _setFlags, _details, _putDetails, _dropTag, _putTag;
 };
 

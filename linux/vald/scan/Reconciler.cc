@@ -9,6 +9,12 @@ namespace skein::vald {
 namespace {
 
 constexpr std::int64_t kYouth = 60'000;
+// More links of one file than this are not all looked at again for each decision.
+constexpr std::size_t kManyLinks = 8;
+
+bool isTemporaryFor(std::string_view name, std::string_view original) {
+  return isBackupNameOf(name, original) || (name.starts_with('.') && !original.starts_with('.'));
+}
 
 std::string departureKey(FolderKey folder, const std::string& name) {
   return std::to_string(folder) + '/' + name;
@@ -37,8 +43,10 @@ void Reconciler::forget() {
   _removedFolders.clear();
   _copiedFolders.clear();
   _deciding.clear();
-  _decidingByInode.clear();
+  _appearedByInode.clear();
+  _replacedByInode.clear();
   _departures.clear();
+  beginGathering();
 }
 
 // ---- gathering
@@ -102,6 +110,30 @@ bool Reconciler::isReplacement(FolderKey folder, const std::string& name, const 
   return _index.tombstoneAt(folder, name, _clock() - _grace).has_value();
 }
 
+void Reconciler::beginGathering() {
+  _appearedBefore = _appeared.size();
+  _replacedBefore = _replaced.size();
+  _vanishedBefore = _vanished.size();
+}
+
+bool Reconciler::mayBeSave() {
+  const std::int64_t since = _clock() - _grace;
+  return _replaced.size() > _replacedBefore ||
+         std::any_of(_appeared.begin() + static_cast<std::ptrdiff_t>(_appearedBefore),
+                     _appeared.end(), [&](const Difference& difference) {
+                       return _index
+                           .tombstoneAt(difference.place.folder, difference.place.name, since)
+                           .has_value();
+                     });
+}
+
+void Reconciler::gatherAgain() {
+  _appeared.resize(_appearedBefore);
+  _replaced.resize(_replacedBefore);
+  _vanished.erase(_vanished.begin() + static_cast<std::ptrdiff_t>(_vanishedBefore),
+                  _vanished.end());
+}
+
 bool Reconciler::differs(const ItemRow& row, const FileState& state) {
   return row.state.kind != state.kind || !row.state.key.names(state.key) ||
          (row.folder == kNoFolder && !row.state.looksLike(state));
@@ -130,21 +162,29 @@ void Reconciler::decide(bool inRound, const IsFollowed& isFollowed) {
   }
   refreshSelves(isFollowed);
   _disk.forget();
+  _goesOn = false;
 }
 
 void Reconciler::decideOnce(bool inRound) {
   _disk.forget();
+  _left.clear();
+  _youngLinks.clear();
   _deciding = std::exchange(_appeared, {});
-  _decidingByInode.clear();
-  for (std::size_t at = 0; at < _deciding.size(); ++at) {
-    _decidingByInode.emplace(_deciding[at].state.key.inode, at);
-  }
+  const auto replacements = std::exchange(_replaced, {});
+  const auto sortByInode = [](const std::vector<Difference>& differences, auto& byInode) {
+    byInode.clear();
+    for (const Difference& difference : differences) {
+      if (difference.state.kind != ItemKind::Document) continue;
+      byInode.emplace(difference.state.key.inode, &difference);
+    }
+  };
+  sortByInode(_deciding, _appearedByInode);
+  sortByInode(replacements, _replacedByInode);
   // Folders first: the ways to everything else lead through them.
   for (const Difference& difference : _deciding) {
     if (difference.state.kind == ItemKind::Folder) appeared(difference);
   }
   _disk.forget();
-  const auto replacements = std::exchange(_replaced, {});
   for (const Difference& difference : replacements) {
     if (inRound) {
       _replacedInRound.push_back(difference.place);
@@ -156,7 +196,8 @@ void Reconciler::decideOnce(bool inRound) {
     if (difference.state.kind != ItemKind::Folder) appeared(difference);
   }
   _deciding.clear();
-  _decidingByInode.clear();
+  _appearedByInode.clear();
+  _replacedByInode.clear();
   const auto losses = std::exchange(_vanished, {});
   for (const ItemRow& row : losses) {
     if (inRound) {
@@ -168,15 +209,21 @@ void Reconciler::decideOnce(bool inRound) {
 }
 
 const Reconciler::Difference* Reconciler::appearedDocument(const FileKey& file) const {
-  std::size_t first = _deciding.size();
-  const auto [begin, end] = _decidingByInode.equal_range(file.inode);
-  for (auto one = begin; one != end; ++one) {
-    const FileState& state = _deciding[one->second].state;
-    if (state.kind == ItemKind::Document && file.names(state.key)) {
-      first = std::min(first, one->second);
-    }
+  const auto found = _appearedByInode.find(file.inode);
+  return found != _appearedByInode.end() && file.names(found->second->state.key) ? found->second
+                                                                                 : nullptr;
+}
+
+bool Reconciler::hasReplacedAnother(const ItemRow& row) {
+  const auto found = _replacedByInode.find(row.state.key.inode);
+  if (found == _replacedByInode.end()) return false;
+  const auto& [place, state] = *found->second;
+  if (!row.state.key.names(state.key) || (place.folder == row.parent && place.name == row.name) ||
+      isBackupNameOf(place.name, row.name)) {
+    return false;
   }
-  return first < _deciding.size() ? &_deciding[first] : nullptr;
+  const std::optional<ItemRow> resident = rowAt(place);
+  return !resident || !isStandIn(*resident, row.name);
 }
 
 void Reconciler::endRound() {
@@ -222,12 +269,19 @@ void Reconciler::appeared(const Difference& difference) {
 
 void Reconciler::replaced(const Difference& difference) {
   const Place& place = difference.place;
-  const FileState& state = difference.state;
   std::optional<ItemRow> old = rowAt(place);
   if (!old) {
     appeared(difference);
     return;
   }
+  // The disk goes on meanwhile, and a number must not go to a file that has gone on.
+  FileState state;
+  const Look look = _disk.at(place.folder, place.name, state);
+  if (look == Look::Gone) {
+    _vanished.push_back(*old);
+    return;
+  }
+  if (look != Look::Seen) state = difference.state;
   if (old->state.kind == state.kind && old->state.key.names(state.key)) return;
   if (old->state.kind != ItemKind::Document || state.kind != ItemKind::Document) {
     // Folders and aliases are their inodes: the old one went, unless it turns up elsewhere.
@@ -240,43 +294,49 @@ void Reconciler::replaced(const Difference& difference) {
     return;
   }
 
-  // Where the old file went decides whether this was a save.
-  const Difference* const whereItWent = appearedDocument(old->state.key);
-  const bool livesElsewhere =
-      whereItWent != nullptr && !isBackupNameOf(whereItWent->place.name, place.name);
-  if (const std::optional<ItemRow> mover = moverTo(place, state)) {
+  const std::optional<ItemRow> mover = moverTo(place, state);
+  FileState there;
+  const Whereabouts where = mover ? whereabouts(*mover, there) : Whereabouts::Gone;
+  if (mover && where == Whereabouts::Displaced && old->state.key.names(there.key)) {
     const Place from{mover->parent, mover->name};
-    FileState there;
-    const Whereabouts where = whereabouts(*mover, there);
-    if (livesElsewhere) {
-      move(*old, whereItWent->place, whereItWent->state);
-      move(*mover, place, state);
-    } else if (where == Whereabouts::Displaced && old->state.key.names(there.key)) {
-      if (isYoung(*mover) || isYoung(*old)) {
-        retarget(*old, state);
-        retarget(*mover, there);
-      } else {
-        move(*old, from, there);
-        move(*mover, place, state);
-      }
-    } else if (isYoung(*mover)) {
-      retarget(*old, state);
+    if (isStandIn(*mover, place.name)) {
       _journal.bury(*mover, _now);
-      if (where == Whereabouts::Displaced) _appeared.push_back({from, there});
+      retarget(*old, state);
+      insertNew(from, there);
+    } else if (isStandIn(*old, from.name)) {
+      _journal.bury(*old, _now);
+      retarget(*mover, there);
+      insertNew(place, state);
     } else {
-      _vanished.push_back(*old);
-      recordDeparture(*mover, place);
+      move(*old, from, there);
       move(*mover, place, state);
     }
     return;
   }
 
-  if (livesElsewhere) {
+  // Where the old file went decides whether this was a save.
+  const Difference* const whereItWent = appearedDocument(old->state.key);
+  if (whereItWent != nullptr && !isBackupNameOf(whereItWent->place.name, place.name)) {
     move(*old, whereItWent->place, whereItWent->state);
-    insertNew(place, state);
+  } else if (!hasReplacedAnother(*old) && !isKnownAsAnother(place, state, {old, mover}) &&
+             (mover ? isStandIn(*mover, place.name) || (isYoung(*mover) && !_goesOn)
+                    : !wasAnother(state, place.name))) {
+    retarget(*old, state);
+    if (!mover) return;
+    _journal.bury(*mover, _now);
+    if (where == Whereabouts::Displaced) {
+      _appeared.push_back({{mover->parent, mover->name}, there});
+    }
     return;
+  } else {
+    _vanished.push_back(*old);
   }
-  retarget(*old, state);
+  if (mover) {
+    recordDeparture(*mover, place);
+    move(*mover, place, state);
+  } else if (!returned(place, state)) {
+    insertNew(place, state);
+  }
 }
 
 void Reconciler::vanished(const ItemRow& seen) {
@@ -291,18 +351,10 @@ void Reconciler::vanished(const ItemRow& seen) {
   const Whereabouts where = whereabouts(*row, there);
   if (where == Whereabouts::StillThere || where == Whereabouts::Unknown) return;
   if (row->state.kind == ItemKind::Document) {
-    for (const ItemRow& other : _index.rowsWithInode(row->state.key.inode)) {
-      if (other.id == row->id || other.state.kind != ItemKind::Document || !isYoung(other) ||
-          !other.state.key.names(row->state.key)) {
-        continue;
-      }
-      // The younger of the two links goes: the other is who it was. So it is when both came in
-      // the same millisecond: what stays is not renumbered without a reason.
-      if (row->seen >= other.seen) continue;
-      if (whereabouts(other, there) != Whereabouts::StillThere) continue;
-      _journal.bury(other, _now);
-      recordDeparture(*row, {other.parent, other.name});
-      move(*row, {other.parent, other.name}, there);
+    if (const auto other = youngLinkOf(*row, there)) {
+      _journal.bury(*other, _now);
+      recordDeparture(*row, {other->parent, other->name});
+      move(*row, {other->parent, other->name}, there);
       return;
     }
   }
@@ -343,6 +395,31 @@ void Reconciler::becomeCopy(ItemRow row, const Place& place, const FileState& st
     _copiedFolders.push_back(row.folder);
   }
   move(std::move(row), place, state);
+}
+
+// The youngest link to the document's file that is at its name and came after it; `there` is it.
+// When both came in the same millisecond, what stays is not renumbered without a reason.
+std::optional<ItemRow> Reconciler::youngLinkOf(const ItemRow& row, FileState& there) {
+  const auto [known, isNew] = _youngLinks.try_emplace(row.state.key.inode);
+  std::vector<YoungLink>& links = known->second;
+  if (isNew) {
+    for (const ItemRow& other : _index.rowsWithInode(row.state.key.inode)) {
+      if (other.state.kind == ItemKind::Document && isYoung(other)) {
+        links.push_back({other.seen, other.id});
+      }
+    }
+    std::stable_sort(links.begin(), links.end(),
+                     [](const YoungLink& a, const YoungLink& b) { return a.seen < b.seen; });
+  }
+  while (!links.empty() && links.back().seen > row.seen) {
+    std::optional<ItemRow> other = _index.rowWithID(links.back().id);
+    if (other && other->state.key.names(row.state.key) &&
+        whereabouts(*other, there) == Whereabouts::StillThere) {
+      return other;
+    }
+    links.pop_back();
+  }
+  return std::nullopt;
 }
 
 void Reconciler::buryTree(const ItemRow& row) {
@@ -386,6 +463,11 @@ bool Reconciler::isYoung(const ItemRow& row) const {
   return row.seen != 0 && _now - row.seen < kYouth;
 }
 
+bool Reconciler::isStandIn(const ItemRow& row, const std::string& name) const {
+  if (row.state.kind != ItemKind::Document || !isYoung(row)) return false;
+  return isTemporaryFor(row.name, name) || (row.seen > _asked && _now - row.seen < _grace);
+}
+
 std::optional<ItemRow> Reconciler::rowAt(const Place& place) {
   for (ItemRow& row : _index.rowsNamed(place.folder, place.name)) {
     if (row.containerID) continue;
@@ -408,23 +490,43 @@ Reconciler::Whereabouts Reconciler::whereabouts(const ItemRow& row, FileState& t
                                                                         : Whereabouts::Displaced;
 }
 
+Reconciler::Move Reconciler::moveTo(const Place& place, const FileState& state,
+                                    const ItemRow& row) {
+  if (row.state.kind != state.kind || !row.state.key.names(state.key) || row.containerID ||
+      (row.parent == place.folder && row.name == place.name)) {
+    return Move::DidNotLeave;
+  }
+  FileState there;
+  switch (whereabouts(row, there)) {
+    case Whereabouts::StillThere:
+    case Whereabouts::Unknown: return Move::DidNotLeave;
+    case Whereabouts::Gone: return Move::Moved;
+    case Whereabouts::Displaced: break;
+  }
+  return row.state.kind == ItemKind::Document && nameKeeps(row, there, place) ? Move::KeepsItsName
+                                                                              : Move::Moved;
+}
+
 // The known item whose file now stands at `place`, if it left its own name for it.
 std::optional<ItemRow> Reconciler::moverTo(const Place& place, const FileState& state) {
-  for (ItemRow& row : _index.rowsWithInode(state.key.inode)) {
-    if (row.state.kind != state.kind || !row.state.key.names(state.key) || row.containerID ||
-        (row.parent == place.folder && row.name == place.name)) {
-      continue;
+  auto left = _left.find(state.key.inode);
+  if (left == _left.end()) {
+    std::vector<ItemRow> rows = _index.rowsWithInode(state.key.inode);
+    if (rows.size() <= kManyLinks) {
+      for (ItemRow& row : rows) {
+        if (moveTo(place, state, row) == Move::Moved) return std::move(row);
+      }
+      return std::nullopt;
     }
-    FileState there;
-    switch (whereabouts(row, there)) {
-      case Whereabouts::StillThere:
-      case Whereabouts::Unknown: continue;
-      case Whereabouts::Gone: return std::move(row);
-      case Whereabouts::Displaced:
-        if (row.state.kind != ItemKind::Document || !nameKeeps(row, there, place)) {
-          return std::move(row);
-        }
-    }
+    left = _left.try_emplace(state.key.inode).first;
+    for (const ItemRow& row : rows) left->second.push_back(row.id);
+  }
+  std::list<VLFileObjectID>& ids = left->second;
+  for (auto id = ids.begin(); id != ids.end();) {
+    std::optional<ItemRow> row = _index.rowWithID(*id);
+    const Move found = row ? moveTo(place, state, *row) : Move::DidNotLeave;
+    if (found == Move::Moved) return row;
+    id = found == Move::DidNotLeave ? ids.erase(id) : std::next(id);
   }
   return std::nullopt;
 }
@@ -433,18 +535,33 @@ std::optional<ItemRow> Reconciler::moverTo(const Place& place, const FileState& 
 // `there`, stays with its name.
 bool Reconciler::nameKeeps(const ItemRow& row, const FileState& there, const Place& candidate) {
   for (const ItemRow& other : _index.rowsWithInode(there.key.inode)) {
-    if (other.id == row.id || other.state.kind != ItemKind::Document || isYoung(other) ||
-        !other.state.key.names(there.key)) {
+    if (other.id == row.id || isStandIn(other, row.name) ||
+        other.state.kind != ItemKind::Document || !other.state.key.names(there.key)) {
       continue;
     }
-    // An old document came to the name: then this one is where its file is.
+    // Another document came to the name: then this one is where its file is.
     FileState ignored;
     if (whereabouts(other, ignored) != Whereabouts::StillThere) return false;
   }
   if (isBackupNameOf(candidate.name, row.name)) return true;
   const std::optional<ItemRow> resident = rowAt(candidate);
   // An exchange of two names is settled as a whole, in replaced().
-  return resident && isYoung(*resident) && !resident->state.key.names(there.key);
+  return resident && isStandIn(*resident, row.name) && !resident->state.key.names(there.key);
+}
+
+// Whether the file at `place` is that of a document other than these, which does not give it up:
+// whether that is still at its name is not for the disk to say, which goes on.
+bool Reconciler::isKnownAsAnother(const Place& place, const FileState& state,
+                                  const std::vector<std::optional<ItemRow>>& these) {
+  if (_left.contains(state.key.inode)) return true;  // it has many links
+  const auto rows = _index.rowsWithInode(state.key.inode);
+  return std::any_of(rows.begin(), rows.end(), [&](const ItemRow& row) {
+    return row.state.kind == ItemKind::Document && row.state.key.names(state.key) &&
+           !row.containerID && !isStandIn(row, place.name) &&
+           std::none_of(these.begin(), these.end(),
+                        [&](const auto& other) { return other && other->id == row.id; }) &&
+           moveTo(place, state, row) != Move::KeepsItsName;
+  });
 }
 
 void Reconciler::recordDeparture(const ItemRow& row, const Place& to) {
@@ -456,13 +573,14 @@ void Reconciler::recordDeparture(const ItemRow& row, const Place& to) {
 // Gives the name's former document its number back, when it left within the grace window.
 bool Reconciler::handBack(const Place& place, const FileState& state,
                           const std::optional<ItemRow>& mover) {
-  if (mover && !isYoung(*mover)) return false;
+  if (mover && !isStandIn(*mover, place.name)) return false;
   const auto departure = _departures.find(departureKey(place.folder, place.name));
   if (departure != _departures.end()) {
     const VLFileObjectID id = departure->second.id;
     _departures.erase(departure);
     std::optional<ItemRow> row = _index.rowWithID(id);
-    if (row && !row->state.key.names(state.key)) {
+    if (row && !row->state.key.names(state.key) && isBackupNameOf(row->name, place.name) &&
+        !isKnownAsAnother(place, state, {row, mover})) {
       if (mover) _journal.bury(*mover, _now);
       const Place backup{row->parent, row->name};
       const FileState backupState = row->state;
@@ -479,12 +597,8 @@ bool Reconciler::handBack(const Place& place, const FileState& state,
     // Nor when its file turned up elsewhere: it was renamed.
     const Difference* const other = appearedDocument(tombstone->key);
     if (other != nullptr && !isBackupNameOf(other->place.name, place.name)) return false;
-    // The very file of another document that died comes back as that one.
-    for (const Tombstone& dead : _index.tombstonesWithInode(state.key.inode)) {
-      if (dead.id != tombstone->id && dead.kind == state.kind && dead.key.names(state.key)) {
-        return false;
-      }
-    }
+    // The very file of another document that lives, or that died and comes back, is that one's.
+    if (isKnownAsAnother(place, state, {mover}) || deadWith(state)) return false;
   }
   if (mover) _journal.bury(*mover, _now);
   _index.dropTombstone(tombstone->rank);
@@ -499,33 +613,45 @@ bool Reconciler::handBack(const Place& place, const FileState& state,
   return true;
 }
 
+// The latest item that died with this very file and did not come back.
+std::optional<Tombstone> Reconciler::deadWith(const FileState& state) {
+  return _index.tombstoneWithInode(state.key.inode, [&](const Tombstone& tombstone) {
+    return tombstone.kind == state.kind && tombstone.key.names(state.key) &&
+           !_index.rowWithID(tombstone.id) && _folders.folderWithID(tombstone.id) == kNoFolder;
+  });
+}
+
+// Whether the file that came to `name` was another document's until that died. What a save wrote
+// may have been seen to go before it was seen to come.
+bool Reconciler::wasAnother(const FileState& state, const std::string& name) {
+  const auto dead = deadWith(state);
+  return dead && !isTemporaryFor(dead->name, name);
+}
+
 bool Reconciler::returned(const Place& place, const FileState& state) {
-  for (const Tombstone& tombstone : _index.tombstonesWithInode(state.key.inode)) {
-    if (tombstone.kind != state.kind || !tombstone.key.names(state.key) ||
-        _index.rowWithID(tombstone.id) || _folders.folderWithID(tombstone.id) != kNoFolder) {
-      continue;
-    }
-    _index.dropTombstone(tombstone.rank);
-    ItemRow row;
-    row.parent = place.folder;
-    row.name = place.name;
-    row.id = tombstone.id;
-    row.state = state;
-    if (state.kind == ItemKind::Folder) {
-      FolderRow folder;
-      folder.id = row.id;
-      folder.parent = place.folder;
-      folder.name = place.name;
-      folder.key = state.key;
-      row.folder = _folders.add(std::move(folder));
-      _newFolders.push_back(row.folder);
-    }
-    _details.recall(row);
-    _details.refresh(row, true);
-    _journal.insert(row);
-    return true;
+  const auto tombstone = deadWith(state);
+  if (!tombstone) return false;
+  _index.dropTombstone(tombstone->rank);
+  ItemRow row;
+  row.parent = place.folder;
+  row.name = place.name;
+  row.id = tombstone->id;
+  row.state = state;
+  // One of several links is one that came later.
+  if (state.kind == ItemKind::Document && isKnownAsAnother(place, state, {})) row.seen = _now;
+  if (state.kind == ItemKind::Folder) {
+    FolderRow folder;
+    folder.id = row.id;
+    folder.parent = place.folder;
+    folder.name = place.name;
+    folder.key = state.key;
+    row.folder = _folders.add(std::move(folder));
+    _newFolders.push_back(row.folder);
   }
-  return false;
+  _details.recall(row);
+  _details.refresh(row, true);
+  _journal.insert(row);
+  return true;
 }
 
 VLFileObjectID Reconciler::newID(const FileState& state) {

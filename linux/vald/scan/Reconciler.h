@@ -6,17 +6,24 @@
 //  1. A known file at another name is the same document: it was renamed or moved.
 //  2. A name that now holds another file keeps its document when the old file is gone, or
 //     lives on only under a backup's or a temporary name (BackupNames), or under the name
-//     of a young document: it was saved. The backup gets a number of its own. When the old
+//     of a stand-in: it was saved. The backup gets a number of its own. When the old
 //     file lives on under any other name, it is the document, and the name's is new.
+//     A file that is known as another document's, as a hard link is, or was when that died,
+//     is no save: the name's document is gone, and no number goes to another document's file.
 //  3. A young document (it came within the last minute) that is renamed over another hands
 //     its file over and dies: the name keeps its document. An old document renamed over
 //     another moves, and the replaced one dies. Neither holds when the other's file lives on
 //     elsewhere (rule 2): then both moved.
-//  4. Two names that exchanged their files keep their documents when one of them is young;
-//     two old ones moved.
+//  4. Two names that exchanged their files: the documents moved, unless one of the two was a
+//     stand-in. A stand-in is the new file of a save that was seen before the save was done:
+//     a young document with a temporary or a hidden name, or one with any name that came
+//     within the grace window and after the last time that somebody looked a document up by its
+//     path or listed a folder (so nobody who asked has its number). It hands its file over and
+//     dies, and the old file that has its name now gets a number of its own.
 //  5. A document that vanished keeps its number for the grace window: what comes to its
 //     name within it takes the number up. The deletion is journalled at once all the same.
-//     So does a document that left its name for a backup's within the window.
+//     So does a document that left its name for a backup's within the window. A file that is
+//     known already takes it up only if it was a stand-in.
 //  6. Two hard links are two documents. When the first goes while the second is young, the
 //     number goes with it: that was a rename. When the second goes, the first stays.
 //  7. A file that comes back (its tombstone is still kept) takes its number up again.
@@ -29,8 +36,10 @@
 // Folders and aliases are their inodes: rules 1 and 7 hold for them, and nothing else.
 #pragma once
 
+#include <atomic>
 #include <chrono>
 #include <functional>
+#include <list>
 #include <string>
 #include <unordered_map>
 #include <unordered_set>
@@ -68,6 +77,17 @@ class Reconciler {
   void addName(FolderKey folder, const std::string& name, const std::optional<FileState>& state);
   // Whether the file at a name is another than the name's document has, or had until a moment ago.
   bool isReplacement(FolderKey folder, const std::string& name, const FileState& state);
+  // Marks the point that gatherAgain() returns to: it drops what was gathered since.
+  void beginGathering();
+  void gatherAgain();
+  // Whether something that was gathered since may be a save. Then all that happened up to now
+  // should be gathered before it is decided: a file that is not seen where it went seems gone.
+  bool mayBeSave();
+  // What was gathered is not all, since the disk goes on: for the next decision what is not seen
+  // may be anywhere, and only stand-ins hand their files over.
+  void noteThatItGoesOn() { _goesOn = true; }
+  // Somebody was told of documents that he asked for by path, or by listing. Any thread.
+  void noteAsked() { _asked = _clock(); }
   // The folder's own dates, or its count of children, may have changed.
   void addSelf(FolderKey folder) { _selves.insert(folder); }
 
@@ -115,6 +135,8 @@ class Reconciler {
   void decideOnce(bool inRound);
   // Of what appeared, the first document that is this file; null: none is.
   const Difference* appearedDocument(const FileKey& file) const;
+  // Whether the document's file has come to the name of another one, and not as its backup.
+  bool hasReplacedAnother(const ItemRow& row);
   // Whether the item's file is another, or looks otherwise. A folder's dates are its own matter.
   static bool differs(const ItemRow& row, const FileState& state);
   void compare(const ItemRow& row, const FileState& state);
@@ -125,6 +147,8 @@ class Reconciler {
 
   bool handBack(const Place& place, const FileState& state, const std::optional<ItemRow>& mover);
   bool returned(const Place& place, const FileState& state);
+  std::optional<Tombstone> deadWith(const FileState& state);
+  bool wasAnother(const FileState& state, const std::string& name);
   void insertNew(const Place& place, const FileState& state);
   void move(ItemRow row, const Place& place, const FileState& state);
   void retarget(ItemRow row, const FileState& state);
@@ -135,9 +159,17 @@ class Reconciler {
 
   std::optional<ItemRow> rowAt(const Place& place);
   std::optional<ItemRow> moverTo(const Place& place, const FileState& state);
+  // Whether the item, whose file this is, left its name for `place`; or why not.
+  enum class Move : std::uint8_t { Moved, KeepsItsName, DidNotLeave };
+  Move moveTo(const Place& place, const FileState& state, const ItemRow& row);
+  std::optional<ItemRow> youngLinkOf(const ItemRow& row, FileState& there);
+  bool isKnownAsAnother(const Place& place, const FileState& state,
+                        const std::vector<std::optional<ItemRow>>& these);
   Whereabouts whereabouts(const ItemRow& row, FileState& there);
   bool nameKeeps(const ItemRow& row, const FileState& there, const Place& candidate);
   bool isYoung(const ItemRow& row) const;
+  // Whether the document is the new file of a save of `name` (rule 4).
+  bool isStandIn(const ItemRow& row, const std::string& name) const;
   VLFileObjectID newID(const FileState& state);
 
   IndexWriter& _index;
@@ -150,8 +182,22 @@ class Reconciler {
 
   std::vector<Difference> _appeared;
   std::vector<Difference> _deciding;  // what appeared, of the decisions under way
-  std::unordered_multimap<std::uint64_t, std::size_t> _decidingByInode;  // indices of these
+  // The first document of each inode, of what appeared and of what was replaced.
+  std::unordered_map<std::uint64_t, const Difference*> _appearedByInode;
+  std::unordered_map<std::uint64_t, const Difference*> _replacedByInode;
   std::vector<Difference> _replaced;
+  // Of files with many links, those that were not at their names when the pass came to the file.
+  std::unordered_map<std::uint64_t, std::list<VLFileObjectID>> _left;
+  // Of files that vanished from a name, the young documents and when they came, youngest last.
+  struct YoungLink {
+    std::int64_t seen = 0;
+    VLFileObjectID id = VLFileObjectID::documentWithRawID(0);
+  };
+  std::unordered_map<std::uint64_t, std::vector<YoungLink>> _youngLinks;
+  std::size_t _appearedBefore = 0;  // what stood there before gathering began
+  std::size_t _replacedBefore = 0;
+  std::size_t _vanishedBefore = 0;
+  bool _goesOn = false;
   std::vector<ItemRow> _vanished;
   std::vector<ItemRow> _vanishedInRound;
   std::vector<Place> _replacedInRound;
@@ -163,6 +209,7 @@ class Reconciler {
   // Documents that left a name for a backup's, by folder and name.
   std::unordered_map<std::string, Departure> _departures;
   std::int64_t _now = 0;
+  std::atomic<std::int64_t> _asked{0};
 };
 
 }  // namespace skein::vald

@@ -21,6 +21,11 @@ namespace skein::vald {
 struct DirtyFolder {
   bool whole = false;
   std::unordered_set<std::string> names;
+
+  void add(DirtyFolder other) {
+    whole = whole || other.whole;
+    names.merge(other.names);
+  }
 };
 
 struct DirtySet {
