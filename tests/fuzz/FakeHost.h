@@ -23,6 +23,14 @@ struct NothingOf<std::shared_ptr<HostStream<Values...>>> {
   static std::shared_ptr<HostStream<Values...>> make() { return std::make_shared<Endless>(); }
 };
 template <>
+struct NothingOf<std::shared_ptr<HostTransfer>> {
+  struct Endless final : HostTransfer {
+    void next(Reply<HostTransferStep, NSErrorPtr> reply) override { reply({}, nullptr); }
+    void cancel() override {}
+  };
+  static std::shared_ptr<HostTransfer> make() { return std::make_shared<Endless>(); }
+};
+template <>
 struct NothingOf<std::shared_ptr<ServiceEndpoint>> {
   struct Closed final : ServiceEndpoint {
     void connect(Reply<std::shared_ptr<ServiceConnection>, NSErrorPtr> reply) override {
@@ -61,7 +69,9 @@ class FakeHost final : public HostService,
   void status(To<HostStatus> r) override { answerNothing(r); }
   void cloudStatus(To<LocalCloudStatus> r) override { answerNothing(r); }
   void setCloudConditions(LocalCloudConditions, Done r) override { answerNothing(r); }
-  void check(To<std::shared_ptr<HostCheck>> r) override { answerNothing(r); }
+  void setCloudKeeping(LocalCloudKeeping, Done r) override { answerNothing(r); }
+  void collectCloud(To<LocalCloudCollection> r) override { answerNothing(r); }
+  void check(bool, To<std::shared_ptr<HostCheck>> r) override { answerNothing(r); }
   void setDebugLog(bool, Done r) override { answerNothing(r); }
   HostFiles& files() override { return *this; }
   HostThumbnails& thumbnails() override { return *this; }
@@ -88,10 +98,12 @@ class FakeHost final : public HostService,
   void untrash(HostTarget, std::optional<HostTarget>, Origin, ItemReply r) override {
     answerNothing(r);
   }
-  void remove(HostTarget, Origin, Done r) override { answerNothing(r); }
+  void remove(HostTarget, Origin, To<std::shared_ptr<HostTransfer>> r) override {
+    answerNothing(r);
+  }
   void trashedItems(To<std::shared_ptr<HostTrash>> r) override { answerNothing(r); }
   void setTags(HostTarget, std::vector<std::string>, ItemReply r) override { answerNothing(r); }
-  void tagsInUse(To<std::vector<TagUse>> r) override { answerNothing(r); }
+  void tagsInUse(std::string, To<std::vector<TagUse>> r) override { answerNothing(r); }
   void setFavoriteRank(HostTarget, std::optional<std::int64_t>, ItemReply r) override {
     answerNothing(r);
   }
