@@ -3,6 +3,7 @@
 #include "linux/cli/ExitCodes.h"
 #include "linux/cli/ItemText.h"
 #include "linux/cli/Items.h"
+#include "linux/cli/Progress.h"
 
 namespace skein::cli {
 namespace {
@@ -78,40 +79,47 @@ class Mover {
       report.failed(_destination, error);
       return report.code();
     }
-    ItemOptions moved{{_options.items.begin(), _options.items.end() - 1}, _options.json};
-    return changeEach(moved, [&](const std::string& source, HostFiles::ItemReply reply) {
-      if (isFolder) {
-        _host.files().reparent(targetOf(source), targetOf(_destination), std::nullopt,
-                               originOf("mv"), std::move(reply));
+    const std::vector<std::string> moved(_options.items.begin(), _options.items.end() - 1);
+    Report report(_options.json);
+    return report.each(moved, [&](const std::string& source) {
+      const auto [item, problem] =
+          isFolder ? moveTo(source, _destination, std::nullopt) : moveToPath(source);
+      if (problem) {
+        report.failed(source, problem);
       } else {
-        moveToPath(source, std::move(reply));
+        report.done(source, item);
       }
     });
   }
 
  private:
-  void moveToPath(const std::string& source, HostFiles::ItemReply reply) {
+  ItemAnswer moveTo(const std::string& source, const std::string& folder,
+                    std::optional<std::string> name) {
+    const auto start = [&](auto reply) {
+      _host.files().reparent(targetOf(source), targetOf(folder), name, originOf("mv"),
+                             std::move(reply));
+    };
+    auto [transfer, error] = awaitOnce<std::shared_ptr<HostTransfer>>(start);
+    if (error) return {HostItem(), std::move(error)};
+    auto [end, problem] = followTransfer(transfer, source);
+    return {std::move(end.item), std::move(problem)};
+  }
+
+  ItemAnswer moveToPath(const std::string& source) {
     const auto place = placeOf(_destination);
-    if (!place) {
-      reply({}, noPathError(_destination));
-      return;
-    }
+    if (!place) return {HostItem(), noPathError(_destination)};
     const auto [item, error] = namedItem(_host, source);
-    if (error) {
-      reply({}, error);
-      return;
-    }
+    if (error) return {HostItem(), error};
     const auto from = placeOf(item.found.path.empty() ? source : item.found.path);
-    const HostTarget target = targetOf(source);
     // To rename an alias is to rename what it leads to, so an alias is moved to its new name.
     if (from && from->folder == place->folder && !item.isAlias) {
-      _host.files().rename(target, place->name, originOf("mv"), std::move(reply));
-      return;
+      const auto start = [&](auto reply) {
+        _host.files().rename(targetOf(source), place->name, originOf("mv"), std::move(reply));
+      };
+      return awaitOnce<HostItem>(start);
     }
     const bool keepsName = from && from->name == place->name;
-    _host.files().reparent(target, HostTarget::path(place->folder),
-                           keepsName ? std::nullopt : std::optional(place->name), originOf("mv"),
-                           std::move(reply));
+    return moveTo(source, place->folder, keepsName ? std::nullopt : std::optional(place->name));
   }
 
   HostService& _host;
@@ -198,11 +206,14 @@ void addPlaceCommands(CLI::App& app, Invocation& invocation) {
       ->required()
       ->expected(2, -1);
   mv->add_flag("--json", moves->json, "One JSON object per line");
-  runs(mv, invocation,
-       "Nothing is ever overwritten (exit code 6). An alias is moved itself.\n"
-       "Example: skein mv /draft.odt /Documents/letter.odt\n"
-       "         skein mv /a.jpg /b.jpg /Pictures",
-       moves, runMove);
+  runs(
+      mv, invocation,
+      "Nothing is ever overwritten (exit code 6). An alias is moved itself. To an app's folder on\n"
+      "another volume an item is copied, compared and then removed; Ctrl-C leaves it where it "
+      "was.\n"
+      "Example: skein mv /draft.odt /Documents/letter.odt\n"
+      "         skein mv /a.jpg /b.jpg /Pictures",
+      moves, runMove);
 
   auto alias = std::make_shared<AliasOptions>();
   auto* aliasCommand = app.add_subcommand("alias", "Make a reference to an item");

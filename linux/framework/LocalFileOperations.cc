@@ -14,6 +14,11 @@
 namespace skein {
 namespace {
 
+// Whoever asked may look at it, and cancel it.
+void followByRequest(std::shared_ptr<NSProgress> progress) {
+  if (const auto current = RequestProgressScope::current()) current->follow(std::move(progress));
+}
+
 bool isAtOrBelow(const std::string& path, const std::string& folder) {
   if (!path.starts_with(folder)) return false;
   return folder == "/" || path.size() == folder.size() || path[folder.size()] == '/';
@@ -28,10 +33,7 @@ void LocalFileOperations::fp_importUnderFolder(const NSURLPtr& url, const NSURLP
                                                VLURLHandler completionHandler) {
   callFiles(_access, std::move(completionHandler),
             [&](LocalFiles& files, const RequestOrigin& origin, auto reply) {
-              auto progress = files.importDocument(url, folder, std::nullopt, origin, reply);
-              if (const auto current = RequestProgressScope::current()) {
-                current->follow(std::move(progress));
-              }
+              followByRequest(files.importDocument(url, folder, std::nullopt, origin, reply));
             });
 }
 
@@ -57,7 +59,8 @@ void LocalFileOperations::fp_reparentUnderFolder_withNewName(const NSURLPtr& url
                                                              VLURLHandler completionHandler) {
   callFiles(_access, std::move(completionHandler),
             [&](LocalFiles& files, const RequestOrigin& origin, auto reply) {
-              files.move(url, folder, std::move(newName), /*bounce=*/false, origin, reply);
+              followByRequest(
+                  files.move(url, folder, std::move(newName), /*bounce=*/false, origin, reply));
             });
 }
 
@@ -67,7 +70,7 @@ void LocalFileOperations::fp_reparentUnderFolder_allowBouncing(const NSURLPtr& u
                                                                VLURLHandler completionHandler) {
   callFiles(_access, std::move(completionHandler),
             [&](LocalFiles& files, const RequestOrigin& origin, auto reply) {
-              files.move(url, folder, std::nullopt, allowBouncing, origin, reply);
+              followByRequest(files.move(url, folder, std::nullopt, allowBouncing, origin, reply));
             });
 }
 
@@ -75,10 +78,7 @@ void LocalFileOperations::fp_deleteWithCompletionHandler(
     const NSURLPtr& url, UniqueFunction<void(NSErrorPtr)> completionHandler) {
   callFiles(_access, std::move(completionHandler),
             [&](LocalFiles& files, const RequestOrigin& origin, auto reply) {
-              auto progress = files.remove(url, origin, reply);
-              if (const auto current = RequestProgressScope::current()) {
-                current->follow(std::move(progress));
-              }
+              followByRequest(files.remove(url, origin, reply));
             });
 }
 

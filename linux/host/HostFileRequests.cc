@@ -281,20 +281,34 @@ void HostFileRequests::rename(HostTarget target, std::string newName, RequestOri
 
 void HostFileRequests::reparent(HostTarget target, HostTarget parent,
                                 std::optional<std::string> newName, RequestOrigin origin,
-                                ItemReply reply) {
-  change(std::move(target), std::move(origin), std::move(reply),
-         [parent = std::move(parent), name = std::move(newName)](
-             const DriveRequests& drive, const NSFileProviderItemIdentifier& identifier,
-             ItemCompletion completion) {
-           NSErrorPtr error;
-           const auto folder = drive.resolve(parent, &error);
-           if (!folder) {
-             completion(nullptr, error);
-             return;
-           }
-           drive.extension().reparentItemWithIdentifier(identifier, *folder, name,
-                                                        std::move(completion));
-         });
+                                Reply<std::shared_ptr<HostTransfer>, NSErrorPtr> reply) {
+  _drive->withDrive<std::shared_ptr<HostTransfer>>(
+      std::move(reply),
+      [drive = _drive, target = std::move(target), parent = std::move(parent),
+       name = std::move(newName), origin = std::move(origin)](const TimedTransfer& timed) {
+        NSErrorPtr error;
+        const auto identifier = drive->resolve(target, &error);
+        std::optional<NSFileProviderItemIdentifier> folder;
+        if (identifier) folder = drive->resolve(parent, &error);
+        if (!folder) {
+          (*timed)(nullptr, error);
+          return;
+        }
+        const auto transfer = std::make_shared<Transfer>(drive->tools());
+        const auto progress = std::make_shared<RequestProgress>();
+        transfer->follow(progress);
+        const RequestOriginScope originScope(origin);
+        const RequestProgressScope progressScope(progress);
+        drive->extension().reparentItemWithIdentifier(
+            *identifier, *folder, name,
+            [drive, transfer](NSFileProviderItemPtr item, NSErrorPtr problem) {
+              const auto finish = [&](HostItem placed, NSErrorPtr reason) {
+                transfer->finish(std::move(placed), std::move(reason));
+              };
+              answerWith(*drive, finish, std::move(item), std::move(problem));
+            });
+        (*timed)(streamOf(transfer, [progress] { progress->cancel(); }), nullptr);
+      });
 }
 
 void HostFileRequests::trash(HostTarget target, RequestOrigin origin, ItemReply reply) {

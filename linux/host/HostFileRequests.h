@@ -29,7 +29,8 @@ class HostFileRequests final : public HostFiles {
   void rename(HostTarget target, std::string newName, RequestOrigin origin,
               ItemReply reply) override;
   void reparent(HostTarget target, HostTarget parent, std::optional<std::string> newName,
-                RequestOrigin origin, ItemReply reply) override;
+                RequestOrigin origin,
+                Reply<std::shared_ptr<HostTransfer>, NSErrorPtr> reply) override;
   void trash(HostTarget target, RequestOrigin origin, ItemReply reply) override;
   void untrash(HostTarget target, std::optional<HostTarget> parent, RequestOrigin origin,
                ItemReply reply) override;

@@ -17,6 +17,7 @@
 #include "linux/protocol/AnswerRoom.h"
 #include "linux/protocol/FileDescriptor.h"
 #include "linux/protocol/LeftOutNote.h"
+#include "linux/protocol/ReservedNames.h"
 #include "platform/fileprovider/NSFileProviderError.h"
 #include "vellum/VLQueryItem.h"
 
@@ -59,18 +60,8 @@ int readFolder(const std::string& path, DiskEntries& entries) {
   return 0;
 }
 
-// What is no document, and vald leaves out too: what was thrown away, and what is on its way
-// in or out.
-bool isNoDocument(const std::string& name) {
-  const bool isHidden = name.starts_with('.');
-  return name.starts_with(".Trash-") || name.starts_with(".skein-import-") ||
-         name.starts_with(".skein-removed-") ||
-         (isHidden && (name.ends_with(".skein-part") || name.ends_with(".skein-new") ||
-                       name.ends_with(".skein-old")));
-}
-
 bool isSetAside(const std::string& name) {
-  return name.starts_with('.') && name.ends_with(".skein-old");
+  return name.starts_with('.') && name.ends_with(kAsideSuffix);
 }
 
 // Whether vald is asked if it is a marker.
@@ -378,7 +369,7 @@ class StoreCheck::Work final : public std::enable_shared_from_this<Work> {
     for (const auto& [name, entry] : onDisk) {
       if (!entry.isFolder && mayBeMarker(name)) {
         look->markers.push_back(joined(folder.diskPath, name));
-      } else if (entry.isFolder && isNoDocument(name)) {
+      } else if (entry.isFolder && useOfReservedName(name) != nullptr) {
         look->unlisted.push_back(joined(folder.diskPath, name));
       }
     }
@@ -424,7 +415,7 @@ class StoreCheck::Work final : public std::enable_shared_from_this<Work> {
                                "a document that an interrupted eviction set aside; get or evict "
                                "the document, or rename this file to its name"});
       }
-      if (isNoDocument(name)) continue;
+      if (useOfReservedName(name) != nullptr) continue;  // vald leaves it out, too
       differences.push_back({HostDifference::Kind::MissingInListing, joined(folder.drivePath, name),
                              isLeftMarker(name, look->items)
                                  ? "the marker of an older version: the document was written anew "

@@ -93,10 +93,10 @@ kj::Promise<void> FilesObject::rename(RenameContext context) {
 
 kj::Promise<void> FilesObject::move(MoveContext context) {
   const auto params = context.getParams();
-  return answerURL(context, [&](auto reply) {
-    files().move(itemURLFromClient(params), urlFromClient(params.getFolder()),
-                 nameOf(params.hasNewName(), params.getNewName()), params.getBounce(),
-                 codec::text(params.getOrigin()), std::move(reply));
+  return startTransfer(context, [&](LocalFiles::URLReply reply) {
+    return files().move(itemURLFromClient(params), urlFromClient(params.getFolder()),
+                        nameOf(params.hasNewName(), params.getNewName()), params.getBounce(),
+                        codec::text(params.getOrigin()), std::move(reply));
   });
 }
 

@@ -103,9 +103,10 @@ class FilesProxy final : public LocalFiles {
         urlReply(std::move(reply)));
   }
 
-  void move(NSURLPtr url, NSURLPtr folder, std::optional<std::string> newName, bool bounce,
-            RequestOrigin origin, URLReply reply) override {
-    change(
+  std::shared_ptr<NSProgress> move(NSURLPtr url, NSURLPtr folder,
+                                   std::optional<std::string> newName, bool bounce,
+                                   RequestOrigin origin, URLReply reply) override {
+    return transfer(
         [=](wire::Files::Client& files) {
           auto request = files.moveRequest();
           setItemURL(request, url);
@@ -113,9 +114,11 @@ class FilesProxy final : public LocalFiles {
           if (newName) request.setNewName(codec::bytes(*newName));
           request.setBounce(bounce);
           request.setOrigin(codec::bytes(origin));
-          return request.send();
+          return request;
         },
-        urlReply(std::move(reply)));
+        [reply = std::move(reply)](TransferOutcome outcome) mutable {
+          reply(std::move(outcome.url), std::move(outcome.error));
+        });
   }
 
   std::shared_ptr<NSProgress> remove(NSURLPtr url, RequestOrigin origin,

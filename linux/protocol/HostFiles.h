@@ -57,8 +57,11 @@ class HostFiles {
                          RequestOrigin origin, ItemReply reply) = 0;
   virtual void rename(HostTarget target, std::string newName, RequestOrigin origin,
                       ItemReply reply) = 0;
+  // Between volumes it takes long; cancelling leaves the item where it was, unless it has just
+  // been moved.
   virtual void reparent(HostTarget target, HostTarget parent, std::optional<std::string> newName,
-                        RequestOrigin origin, ItemReply reply) = 0;
+                        RequestOrigin origin,
+                        Reply<std::shared_ptr<HostTransfer>, NSErrorPtr> reply) = 0;
   virtual void trash(HostTarget target, RequestOrigin origin, ItemReply reply) = 0;
   // Nil parent: where it was.
   virtual void untrash(HostTarget target, std::optional<HostTarget> parent, RequestOrigin origin,

@@ -170,7 +170,7 @@ kj::Promise<void> HostFilesObject::reparent(ReparentContext context) {
        name = std::move(name), origin = originOf(params)](HostFiles& files, auto reply) {
         files.reparent(target, parent, name, origin, std::move(reply));
       },
-      encodeItem);
+      encodeTransfer(_peer));
 }
 
 kj::Promise<void> HostFilesObject::trash(TrashContext context) {

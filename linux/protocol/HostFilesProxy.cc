@@ -147,8 +147,9 @@ class HostFilesProxy final : public HostFiles, private HostCalls<wire::HostFiles
   }
 
   void reparent(HostTarget target, HostTarget parent, std::optional<std::string> newName,
-                RequestOrigin origin, ItemReply reply) override {
-    callForItem(
+                RequestOrigin origin,
+                Reply<std::shared_ptr<HostTransfer>, NSErrorPtr> reply) override {
+    callForTransfer(
         [target = std::move(target), parent = std::move(parent), name = std::move(newName),
          origin = std::move(origin)](Wire& host) {
           auto request = host.reparentRequest();

@@ -74,9 +74,12 @@ class LocalFiles {
                          RequestOrigin origin, URLReply reply) = 0;
   virtual void rename(NSURLPtr url, std::string newName, RequestOrigin origin, URLReply reply) = 0;
   // A nil name keeps the name (out of the trash: gets the one it had). `bounce`: a name that
-  // is taken is tried again with a number.
-  virtual void move(NSURLPtr url, NSURLPtr folder, std::optional<std::string> newName, bool bounce,
-                    RequestOrigin origin, URLReply reply) = 0;
+  // is taken is tried again with a number. Between volumes it is a copy, compared, and a removal:
+  // the progress counts bytes then, and cancelling it leaves the item where it was; the reply is
+  // NSUserCancelledError unless it has just been moved.
+  virtual std::shared_ptr<NSProgress> move(NSURLPtr url, NSURLPtr folder,
+                                           std::optional<std::string> newName, bool bounce,
+                                           RequestOrigin origin, URLReply reply) = 0;
   // For good. Cancelling the progress puts the item back where it was, and the reply is
   // NSUserCancelledError, unless the answer is on its way: nothing is deleted before that.
   virtual std::shared_ptr<NSProgress> remove(NSURLPtr url, RequestOrigin origin,

@@ -18,8 +18,8 @@ interface Files {
   rename @3 (url :Data, newName :Data, origin :Data, item :Types.ObjectID)
       -> (url :Data, error :Types.Error);
   move @4 (url :Data, folder :Data, newName :Data, bounce :Bool, origin :Data,
-           item :Types.ObjectID)
-      -> (url :Data, error :Types.Error);
+           item :Types.ObjectID, observer :TransferObserver)
+      -> (transfer :Transfer, error :Types.Error);
   remove @5 (url :Data, origin :Data, observer :TransferObserver, item :Types.ObjectID)
       -> (transfer :Transfer, error :Types.Error);
   trash @6 (url :Data, origin :Data, item :Types.ObjectID)
@@ -52,7 +52,7 @@ interface Files {
       -> (entries :List(FileHistoryEntry), error :Types.Error);
 }
 
-# Bytes on their way, or a removal. vald's end: the client's last reference ends it, as
+# Bytes on their way, a move, or a removal. vald's end: the client's last reference ends it, as
 # cancel() does.
 interface Transfer {
   # When it has ended, however it did; the counts are the last ones.

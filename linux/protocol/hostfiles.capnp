@@ -27,7 +27,7 @@ interface HostFiles {
   rename @6 (target :Target, newName :Data, origin :Data)
       -> (item :HostItem, error :Types.Error);
   reparent @7 (target :Target, parent :Target, newName :Data, origin :Data)
-      -> (item :HostItem, error :Types.Error);
+      -> (transfer :HostTransfer, error :Types.Error);
   trash @8 (target :Target, origin :Data) -> (item :HostItem, error :Types.Error);
   untrash @9 (target :Target, parent :Target, origin :Data)
       -> (item :HostItem, error :Types.Error);

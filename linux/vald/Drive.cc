@@ -67,6 +67,13 @@ std::unique_ptr<Drive> Drive::open(DriveOptions options, StoreListener& listener
         return Cloud::open(options.cloud, *drive->_operations, log, problem);
       });
   if (!drive->_cloud) return nullptr;
+  for (const OperationEntry& entry : drive->_operations->recovered()) {
+    if (entry.isCopied() && entry.kind != OperationKind::Import &&
+        entry.state == OperationState::Done) {
+      options.store.copies.emplace_back(documentPath(nullptr, entry.path),
+                                        documentPath(nullptr, entry.destination));
+    }
+  }
   // The index shares a disk with the journal, and has no room of its own kept.
   options.store.makeRoom = [&journal = drive->_operations->journal(),
                             folder = options.stateDirectory] {

@@ -14,6 +14,17 @@ namespace {
 
 constexpr unsigned kMostBounces = 10'000;
 
+// Tells it how far a copy is, and the operation whether it was cancelled.
+FileProgressHandler tellingTo(std::shared_ptr<NSProgress> progress) {
+  return [progress = std::move(progress)](const FileProgress& state) {
+    if (state.totalItems != 0) {
+      progress->setTotalUnitCount(static_cast<std::int64_t>(state.totalBytes));
+      progress->setCompletedUnitCount(static_cast<std::int64_t>(state.doneBytes));
+    }
+    return !progress->isCancelled();
+  };
+}
+
 NSURLPtr urlOf(const std::string& path) {
   return path.empty() ? nullptr : NSURL::fileURLWithPath(path);
 }
@@ -104,11 +115,7 @@ std::shared_ptr<NSProgress> Files::importDocument(NSURLPtr source, NSURLPtr fold
     if (error) return answerError(answered, error);
     FileRequest request;
     request.origin = origin;
-    request.progress = [progress](const FileProgress& state) {
-      progress->setTotalUnitCount(static_cast<std::int64_t>(state.totalBytes));
-      progress->setCompletedUnitCount(static_cast<std::int64_t>(state.doneBytes));
-      return !progress->isCancelled();
-    };
+    request.progress = tellingTo(progress);
     answerResult(answered,
                  _parts.operations.importDocument(source->path(), folder->path(), name, request),
                  {});
@@ -177,12 +184,28 @@ void Files::answerMove(URLReply& reply, const Subject& subject, RequestOrigin or
                        const std::function<FileResult(const FileRequest&)>& move) {
   std::vector<std::string> places{subject.place.path};
   std::function<void()> waitForStore;
+  std::optional<StoreWriter::Copy> copy;
+  bool isTaken = false;
   FileRequest asked = request(subject, std::move(origin));
-  asked.moved = [&](const std::string& path) {
+  asked.leaves = [&](const std::string& path) {
+    if (copy) _parts.store.forgetCopy(*copy);  // it is tried again under another name
+    places.push_back(documentPath(nullptr, path));
+    copy = _parts.store.expectCopy(places.front(), places.back());
+  };
+  asked.moved = [&](const std::string& path, bool isCopy) {
+    if (isCopy) {
+      isTaken = copy && _parts.store.takeCopy(*copy);
+      return;
+    }
     places.push_back(documentPath(&_parts.operations.roots(), path));
     waitForStore = _parts.store.beginLookAtPaths(places);
   };
   const FileResult result = move(asked);
+  if (copy && !isTaken) {
+    _parts.store.forgetCopy(*copy);
+    _parts.store.lookAtPaths(places);
+  }
+  if (isTaken && !result.error) return reply(urlOf(places.back()), nullptr);
   if (waitForStore) {
     waitForStore();
     if (!result.error) return reply(urlOf(places.back()), nullptr);
@@ -208,19 +231,27 @@ void Files::rename(NSURLPtr url, std::string newName, RequestOrigin origin, URLR
   });
 }
 
-void Files::move(NSURLPtr url, NSURLPtr folder, std::optional<std::string> newName, bool bounce,
-                 RequestOrigin origin, URLReply reply) {
-  answer("url", folder ? url : nullptr, std::move(reply), [=, this](URLReply& answered) {
+std::shared_ptr<NSProgress> Files::move(NSURLPtr url, NSURLPtr folder,
+                                        std::optional<std::string> newName, bool bounce,
+                                        RequestOrigin origin, URLReply reply) {
+  auto progress = NSProgress::progressWithTotalUnitCount(0);
+  const auto moveNow = [=, this](URLReply& answered) {
     const Subject subject = subjectAt(url);
     if (subject.error) return answerError(answered, subject.error);
     if (NSErrorPtr error = willLeave(subject)) return answerError(answered, error);
-    answerMove(answered, subject, origin, [&](const FileRequest& asked) {
+    answerMove(answered, subject, origin, [&](FileRequest asked) {
+      asked.progress = tellingTo(progress);
       return subject.place.isEvicted()
                  ? moveEvicted(subject, folder->path(), newName, bounce, asked)
                  : _parts.operations.move(subject.place.path, folder->path(), newName, bounce,
                                           asked);
     });
+  };
+  answer("url", folder ? url : nullptr, std::move(reply), [=, this](URLReply& answered) {
+    if (!_parts.operations.crossesVolumes(url->path(), folder->path())) return moveNow(answered);
+    postAnswer(*_parts.importExecutor, std::move(answered), moveNow);
   });
+  return progress;
 }
 
 std::shared_ptr<NSProgress> Files::remove(NSURLPtr url, RequestOrigin origin,

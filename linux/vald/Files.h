@@ -57,8 +57,9 @@ class Files final : public LocalFiles {
   void makeAlias(NSURLPtr folder, std::string name, std::string target, RequestOrigin origin,
                  URLReply reply) override;
   void rename(NSURLPtr url, std::string newName, RequestOrigin origin, URLReply reply) override;
-  void move(NSURLPtr url, NSURLPtr folder, std::optional<std::string> newName, bool bounce,
-            RequestOrigin origin, URLReply reply) override;
+  std::shared_ptr<NSProgress> move(NSURLPtr url, NSURLPtr folder,
+                                   std::optional<std::string> newName, bool bounce,
+                                   RequestOrigin origin, URLReply reply) override;
   std::shared_ptr<NSProgress> remove(NSURLPtr url, RequestOrigin origin,
                                      Reply<NSErrorPtr> reply) override;
   void trash(NSURLPtr url, RequestOrigin origin, URLReply reply) override;

@@ -108,8 +108,12 @@ std::unique_ptr<FolderStore> FolderStore::openFolder(StoreOptions options, Store
     return nullptr;
   }
   auto store = std::unique_ptr<FolderStore>(new FolderStore(options, *drive, *journalID));
-  store->_writer =
-      std::make_unique<StoreWriter>(std::move(options), *drive, std::move(database), listener, log);
+  std::vector<StoreWriter::Copy> copies;
+  for (const auto& [from, to] : options.copies) {
+    if (auto copy = store->copyOf(from, to)) copies.push_back(std::move(*copy));
+  }
+  store->_writer = std::make_unique<StoreWriter>(std::move(options), *drive, std::move(database),
+                                                 std::move(copies), listener, log);
   // The roots stand in the index from here on.
   store->_writer->perform([] {});
   return store;

@@ -52,6 +52,13 @@ class FolderStore final : public Store {
   void lookAtPaths(const std::vector<std::string>& paths) { beginLookAtPaths(paths)(); }
   // The same; what is answered waits for it, and is called before the store goes.
   std::function<void()> beginLookAtPaths(const std::vector<std::string>& paths);
+  // An item is about to be moved by copying it: from now on until one of the two below, nothing
+  // that is seen at these absolute paths tells what became of it. Nil when the index does not know
+  // both folders yet.
+  std::optional<StoreWriter::Copy> expectCopy(const std::string& from, const std::string& to);
+  // It is the item from now on, with all that is in it. False: it is another one.
+  bool takeCopy(const StoreWriter::Copy& copy);
+  void forgetCopy(const StoreWriter::Copy& copy);
   // Looks at what happened up to now on disk in the path's folder and in all that are watched.
   // An item that moved is found where it is thereby.
   void catchUp(const std::string& path);
@@ -111,6 +118,7 @@ class FolderStore final : public Store {
                                      std::string& rest);
   // The folder that a path's item is in and its name; nil for roots and for what is not read.
   std::optional<StoreWriter::Place> placeOf(IndexReader& reader, const std::string& path);
+  std::optional<StoreWriter::Copy> copyOf(const std::string& from, const std::string& to);
   VLQueryItemPtr trashItem(IndexReader& reader, const FolderRow& trash);
   VLQueryItemPtr driveItem(const FolderRow& folder, NSErrorOut error);
   std::optional<std::string> pathOfFolder(IndexReader& reader, FolderKey folder);

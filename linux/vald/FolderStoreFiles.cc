@@ -35,6 +35,35 @@ std::function<void()> FolderStore::beginLookAtPaths(const std::vector<std::strin
   return [this, posted = std::move(posted)] { _writer->wait(posted); };
 }
 
+std::optional<StoreWriter::Copy> FolderStore::copyOf(const std::string& from,
+                                                     const std::string& to) {
+  auto reader = _readers.lease();
+  if (!reader) return std::nullopt;
+  auto here = placeOf(*reader.get(), from);
+  auto there = placeOf(*reader.get(), to);
+  if (!here || !there) return std::nullopt;
+  return StoreWriter::Copy{std::move(*here), std::move(*there)};
+}
+
+std::optional<StoreWriter::Copy> FolderStore::expectCopy(const std::string& from,
+                                                         const std::string& to) {
+  auto copy = copyOf(from, to);
+  if (copy) _writer->perform([this, copy] { _writer->expectCopy(*copy); });
+  return copy;
+}
+
+bool FolderStore::takeCopy(const StoreWriter::Copy& copy) {
+  const auto isTaken = std::make_shared<bool>(false);
+  // A tree takes as long as it takes.
+  return _writer->perform([this, copy, isTaken] { *isTaken = _writer->takeCopy(copy); },
+                          std::chrono::hours(1)) &&
+         *isTaken;
+}
+
+void FolderStore::forgetCopy(const StoreWriter::Copy& copy) {
+  _writer->perform([this, copy] { _writer->forgetCopy(copy); });
+}
+
 void FolderStore::catchUp(const std::string& path) {
   std::optional<StoreWriter::Place> place;
   if (auto reader = _readers.lease()) place = placeOf(*reader.get(), path);

@@ -32,6 +32,8 @@ struct StoreOptions {
   std::chrono::milliseconds graceWindow{2000};
   // How many changes the journal keeps before older tokens expire.
   std::uint64_t journalRetention = 200'000;
+  // Items that were moved by copying them while no store was open: absolute paths, from and to.
+  std::vector<std::pair<std::string, std::string>> copies;
   // Called when the index's disk is full: whether it has a little more room now. On the writer's
   // thread. Null: it never has.
   std::function<bool()> makeRoom = {};

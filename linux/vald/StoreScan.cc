@@ -82,6 +82,9 @@ void StoreWriter::load() {
   commit();
   setContainers(_options.containers);
   checkTrashes(false);
+  for (const Copy& copy : std::exchange(_copies, {})) {
+    if (!_isBulk) takeCopy(copy);
+  }
   const auto rankOf = [&](const char* name) {
     const auto text = _index.setting(name);
     return text ? parseNumber<std::uint64_t>(*text).value_or(0) : 0;
@@ -521,6 +524,41 @@ Look StoreWriter::lookAtNames(const std::vector<Place>& places) {
   afterDecisions();
   commit();
   return look;
+}
+
+bool StoreWriter::takeCopy(const Copy& copy) {
+  if (_isBulk) endBulkLoad();
+  if (!commit()) return false;
+  _disk.forget();
+  forgetCopy(copy);
+  FileState state;
+  if (_disk.at(copy.to.folder, copy.to.name, state) != Look::Seen) return false;
+  begin(Durability::Now);
+  const bool isTaken = _reconciler.takeCopy(copy.from, copy.to, state);
+  for (auto folders = _reconciler.takeCopiedFolders(); !folders.empty();
+       folders = _reconciler.takeCopiedFolders()) {
+    for (const FolderKey key : folders) {
+      // The watch is of the folder that it was.
+      _watcher.unwatch(key);
+      int descriptor = -1;
+      int error = 0;
+      if (!_folders.find(key)->row.scanned) {
+        enqueue({key});
+      } else if (_disk.open(key, descriptor, error) == Look::Seen) {
+        noteWatch(key, _watcher.watch(key, descriptor));
+        const FolderSnapshot snapshot = readFolder(descriptor, Detail::Full);
+        if (snapshot.look == Look::Seen) {
+          _reconciler.takeCopies(key, snapshot);
+          _reconciler.addFolder(key, snapshot);
+        } else {
+          noteUnreadable(key, snapshot.error);
+        }
+      }
+    }
+  }
+  _reconciler.decide(false, [this](FolderKey folder) { return _watcher.isWatched(folder); });
+  afterDecisions();
+  return commit() && isTaken;
 }
 
 void StoreWriter::tellAnew(VLFileObjectID id, bool withContents) {

@@ -36,8 +36,8 @@ struct StoreWriter::Waiter {
 };
 
 StoreWriter::StoreWriter(StoreOptions options, RootFolder drive,
-                         std::unique_ptr<SqliteDatabase> database, StoreListener& listener,
-                         Log& log)
+                         std::unique_ptr<SqliteDatabase> database, std::vector<Copy> copies,
+                         StoreListener& listener, Log& log)
     : _options(std::move(options)),
       _listener(listener),
       _log(log),
@@ -50,7 +50,8 @@ StoreWriter::StoreWriter(StoreOptions options, RootFolder drive,
       _details(_index, _disk),
       _reconciler(_index, _journal, _folders, _disk, _details, _options.graceWindow,
                   millisecondsNow),
-      _drive(std::move(drive)) {
+      _drive(std::move(drive)),
+      _copies(std::move(copies)) {
   _thread = std::thread([this] { run(); });
 }
 

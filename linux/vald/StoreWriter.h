@@ -37,9 +37,16 @@ struct UploadedFile {
 // them. Every later round over the store (at a restart, after lost events) compares.
 class StoreWriter {
  public:
-  // `drive`: the drive's folder as it was found. `listener` and `log` outlive this.
+  using Place = Reconciler::Place;
+  struct Copy {
+    Place from;
+    Place to;
+  };
+
+  // `drive`: the drive's folder as it was found. `copies`: of options.copies, where the index has
+  // their places. `listener` and `log` outlive this.
   StoreWriter(StoreOptions options, RootFolder drive, std::unique_ptr<SqliteDatabase> database,
-              StoreListener& listener, Log& log);
+              std::vector<Copy> copies, StoreListener& listener, Log& log);
   ~StoreWriter();
 
   struct Waiter;
@@ -59,15 +66,17 @@ class StoreWriter {
   Look lookAtFolder(FolderKey folder, int& error);
   Look lookAtName(FolderKey folder, const std::string& name);
   // Several names as one change: what went from one of them to another moved.
-  struct Place {
-    FolderKey folder = kNoFolder;
-    std::string name;
-  };
   Look lookAtNames(const std::vector<Place>& places);
   // Brings the index to what the disk did in the folder up to now: decides what the kernel has
   // told, and looks at the folder itself when it is not watched, or the round under way has yet
   // to come to it. As lookAtFolder.
   Look catchUp(FolderKey folder, int& error);
+  // An item is about to be moved by copying it: as of Reconciler::expectCopy(), with its end.
+  void expectCopy(const Copy& copy) { _reconciler.expectCopy(copy.from, copy.to); }
+  void forgetCopy(const Copy& copy) { _reconciler.forgetCopy(copy.from); }
+  // The item, with all that is in it, is where its copy is from now on. Durable. False when the
+  // index knows none, or it could not be written; then what is seen is decided like any change.
+  bool takeCopy(const Copy& copy);
   // False when there is no such item, or it could not be written. Durable.
   bool changeDetails(VLFileObjectID id, const std::function<void(ItemDetails&)>& change);
   // What the cloud has now; said of a file that looks otherwise by now, it is ignored.
@@ -173,6 +182,7 @@ class StoreWriter {
   Details _details;
   Reconciler _reconciler;
   RootFolder _drive;
+  std::vector<Copy> _copies;  // that were made before this began
   bool _isBulk = false;
   std::unordered_set<std::uint64_t> _bulkIDs;  // of aliases; folders are in the table
   Instant _bulkStart;

@@ -90,7 +90,8 @@ class FakeHost final : public HostService,
     answerNothing(r);
   }
   void rename(HostTarget, std::string, Origin, ItemReply r) override { answerNothing(r); }
-  void reparent(HostTarget, HostTarget, std::optional<std::string>, Origin, ItemReply r) override {
+  void reparent(HostTarget, HostTarget, std::optional<std::string>, Origin,
+                To<std::shared_ptr<HostTransfer>> r) override {
     answerNothing(r);
   }
   void trash(HostTarget, Origin, ItemReply r) override { answerNothing(r); }

@@ -171,6 +171,15 @@ class FileRequests : public testing::Test {
       if (problem) heard.push_back(textOf(problem));
     };
   }
+  // Follows the transfer to its end.
+  TransferReply endReply() {
+    return [this](std::shared_ptr<HostTransfer> made, const NSErrorPtr& problem) {
+      if (!made) return itemReply()({}, problem);
+      made->next([this, made](const HostTransferStep& step, const NSErrorPtr& error) {
+        itemReply()(step.item, error);
+      });
+    };
+  }
   std::shared_ptr<HostTransfer> startImport() {
     std::shared_ptr<HostTransfer> stream;
     files->importDocument("/home/new", HostTarget::path("/"), "me", transferReply(stream));
@@ -227,8 +236,8 @@ TEST_F(FileRequests, EachChangeIsTheExtensionsInItsOriginsName) {
   const HostTarget b = HostTarget::identifier("b");
   files->createDirectory("new", HostTarget::path("/"), "me", itemReply());
   files->rename(a, "c", "me", itemReply());
-  files->reparent(a, b, std::nullopt, "me", itemReply());
-  files->reparent(a, b, "c", "me", itemReply());
+  files->reparent(a, b, std::nullopt, "me", endReply());
+  files->reparent(a, b, "c", "me", endReply());
   files->trash(a, "me", itemReply());
   files->untrash(b, std::nullopt, "me", itemReply());
   files->untrash(b, a, "me", itemReply());
@@ -245,7 +254,8 @@ TEST_F(FileRequests, EachChangeIsTheExtensionsInItsOriginsName) {
 TEST_F(FileRequests, AnItemCountsWhateverErrorIsBesideItAndNothingIsAnError) {
   const HostTarget a = HostTarget::path("/a");
   extension->answered.second = cancelled();
-  files->reparent(a, a, std::nullopt, "", itemReply());
+  files->reparent(a, a, std::nullopt, "", endReply());
+  run();
   extension->answered = {};
   files->trash(a, "", itemReply());
   files->trash(HostTarget::path("/gone"), "", itemReply());

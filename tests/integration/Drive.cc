@@ -12,6 +12,7 @@
 
 #include <cerrno>
 #include <csignal>
+#include <cstdlib>
 #include <filesystem>
 #include <fstream>
 #include <stdexcept>
@@ -158,7 +159,7 @@ Drive::~Drive() {
       if (pid > 0) waitUntilGone(pid, std::chrono::seconds(5));
     }
   }
-  std::filesystem::remove_all(_folder);
+  if (std::getenv("SKEIN_KEEP") == nullptr) std::filesystem::remove_all(_folder);
 }
 
 void Drive::write(const std::string& path, const std::string& contents) const {

@@ -149,7 +149,7 @@ class Client {
         });
         break;
       case 5:
-        change([&](auto reply) {
+        follow([&](auto reply) {
           files.reparent(document, _tree.folder(_random), std::nullopt, _origin, std::move(reply));
         });
         break;

@@ -56,11 +56,13 @@ class FakeFiles final : public LocalFiles {
     note("rename", {path(what), newName, origin});
     reply(url, error);
   }
-  void move(NSURLPtr what, NSURLPtr folder, std::optional<std::string> newName, bool bounce,
-            RequestOrigin origin, URLReply reply) override {
+  std::shared_ptr<NSProgress> move(NSURLPtr what, NSURLPtr folder,
+                                   std::optional<std::string> newName, bool bounce,
+                                   RequestOrigin origin, URLReply reply) override {
     note("move",
          {path(what), path(folder), newName.value_or("nil"), bounce ? "bounce" : "plain", origin});
     reply(url, error);
+    return NSProgress::progressWithTotalUnitCount(0);
   }
   std::shared_ptr<NSProgress> remove(NSURLPtr what, RequestOrigin origin,
                                      Reply<NSErrorPtr> reply) override {

@@ -28,8 +28,10 @@ class DriveFixture : public ::testing::Test {
   void reopen();
   void settle();
 
-  // Paths are relative to the drive's folder.
-  std::string at(const std::string& path) const { return root + '/' + path; }
+  // Paths are relative to the drive's folder, or absolute in a container's.
+  std::string at(const std::string& path) const {
+    return path.starts_with('/') ? path : root + '/' + path;
+  }
   NSURLPtr url(const std::string& path) const;
   void write(const std::string& path, const std::string& text = "contents");
   std::string read(const std::string& path) const;
@@ -59,12 +61,15 @@ class DriveFixture : public ::testing::Test {
     }
     return future.get();
   }
-  // The path that an operation answers with, relative to the drive; "!" and the error's code.
+  // The path that an operation answers with, relative to the drive where it is in there; "!" and
+  // the error's code.
   template <class Request>
   std::string path(Request request) {
     const auto [found, error] = ask<NSURLPtr, NSErrorPtr>(request);
     if (error) return "!" + std::to_string(error->code());
-    return found ? found->path().substr(root.size() + 1) : "";
+    if (!found) return "";
+    return found->path().starts_with(root + '/') ? found->path().substr(root.size() + 1)
+                                                 : found->path();
   }
   // "" or "!" and the error's code.
   template <class Request>

@@ -60,6 +60,7 @@ class SharesRig : public testing::Test {
     store.reset();
     folders.reset();
     shares.reset();
+    records.reset();  // one connection at a time
   }
   void reopen() {
     close();

@@ -99,6 +99,8 @@ class TestDaemon {
     store.emplace(drive.path, senders, settings);
     accounts.emplace(*store, "somebody", log);
     containers.emplace(ContainerFolders{drive.path, state.path, {applications.path}}, log);
+    shares.reset();
+    shareRecords.reset();  // one connection at a time
     shareRecords = std::move(*ShareRecords::open(state.path + "/shares.sqlite"));
     shares = std::make_shared<Shares>(SharesParts{executor, *store, *shareRecords, sharedItems,
                                                   *accounts, *containers, log, drive.path});

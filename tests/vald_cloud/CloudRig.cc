@@ -85,11 +85,6 @@ TemporaryFolder::~TemporaryFolder() {
   std::filesystem::remove_all(_path, ignored);
 }
 
-int RecordingFileLayer::beforeStep(FileStep step, std::string_view name) {
-  if (before) before(step, name);
-  return FaultyFileLayer::beforeStep(step, name);
-}
-
 CloudRig::CloudRig(std::filesystem::path where, const std::filesystem::path& drives)
     : top(std::move(where)) {
   std::filesystem::create_directories(top / "drive");

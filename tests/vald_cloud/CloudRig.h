@@ -15,7 +15,7 @@
 #include "linux/vald/cloud/Downloader.h"
 #include "linux/vald/cloud/Eviction.h"
 #include "linux/vald/cloud/Uploader.h"
-#include "linux/vald/files/FaultyFileLayer.h"
+#include "tests/vald_files/RecordingFileLayer.h"
 
 namespace skein::vald {
 
@@ -59,15 +59,6 @@ class TemporaryFolder {
 
  private:
   std::filesystem::path _path;
-};
-
-// Tells of each step before it is taken: which, and of what.
-class RecordingFileLayer final : public FaultyFileLayer {
- public:
-  std::function<void(FileStep, std::string_view)> before;
-
- protected:
-  int beforeStep(FileStep step, std::string_view name) override;
 };
 
 // What one process has open of a cloud. `top`/drive is the store, `top`/cloud the cloud.

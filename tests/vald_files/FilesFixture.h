@@ -14,10 +14,10 @@
 #include <string>
 #include <vector>
 
-#include "linux/vald/files/FaultyFileLayer.h"
 #include "linux/vald/files/FileErrors.h"
 #include "linux/vald/files/FileNames.h"
 #include "linux/vald/files/FileOperations.h"
+#include "tests/vald_files/RecordingFileLayer.h"
 
 namespace skein::vald {
 
@@ -35,7 +35,8 @@ class TestDrive {
     store = top + "/store";
     outside = top + "/outside";
     state = stateBase.empty() ? top + "/state" : fresh(stateBase);
-    for (const std::string& folder : {store, outside, state}) {
+    container = otherVolume().empty() ? top + "/container" : fresh(otherVolume());
+    for (const std::string& folder : {store, outside, state, container}) {
       std::filesystem::create_directories(folder);
     }
   }
@@ -45,6 +46,7 @@ class TestDrive {
     operations.reset();
     std::filesystem::remove_all(top);
     std::filesystem::remove_all(state);
+    std::filesystem::remove_all(container);
   }
 
   // Where user attributes are more likely to be than in a temporary folder in memory.
@@ -52,12 +54,21 @@ class TestDrive {
     return ::getenv("TEST_TMPDIR") != nullptr ? ::testing::TempDir() : "/var/tmp";
   }
 
-  FileOperations& open() {
+  // A folder on another volume than base(); empty when there is none.
+  static std::string otherVolume() {
+    struct stat shared {};
+    struct stat own {};
+    if (::stat("/dev/shm", &shared) != 0 || ::access("/dev/shm", W_OK) != 0) return {};
+    return ::stat(base().c_str(), &own) == 0 && shared.st_dev != own.st_dev ? "/dev/shm" : "";
+  }
+
+  // lockDeadline: what an operation waits for others and for locks; tests of refusals wait little.
+  FileOperations& open(std::chrono::milliseconds lockDeadline = std::chrono::milliseconds(50)) {
     operations.reset();
     FileOperationsOptions options;
-    options.roots = {store};
+    options.roots = {store, container};
     options.stateDirectory = state;
-    options.lockDeadline = std::chrono::milliseconds(50);
+    options.lockDeadline = lockDeadline;
     NSErrorPtr error;
     operations = FileOperations::open(options, files, log, &error);
     EXPECT_TRUE(operations) << (error ? error->localizedDescription() : "");
@@ -96,11 +107,14 @@ class TestDrive {
     DirectoryHandle root;
     EXPECT_EQ(DirectoryHandle::openRoot(store, root), 0);
     look(root, {}, withStaging, all);
+    EXPECT_EQ(DirectoryHandle::openRoot(container, root), 0);
+    look(root, container, withStaging, all);
     return all;
   }
 
   std::string top, store, outside, state;
-  FaultyFileLayer files;
+  std::string container;  // another root, on the other volume where there is one
+  RecordingFileLayer files;
   QuietLog log;
   std::unique_ptr<FileOperations> operations;
 
@@ -111,11 +125,16 @@ class TestDrive {
     return std::filesystem::canonical(name).native();
   }
 
+  std::string absolute(const std::string& relative) const {
+    return relative.starts_with('/') ? relative : at(relative);
+  }
+
   // It tells of an item that is gone, so nobody sees it.
   bool isOrphanInfo(const std::string& relative) const {
     if (!relative.ends_with(".trashinfo")) return false;
     const std::string name = nameOfPath(relative).substr(0, nameOfPath(relative).size() - 10);
-    return !exists(joinPath(parentOfPath(parentOfPath(relative)), "files/" + name));
+    const std::string item = joinPath(parentOfPath(parentOfPath(relative)), "files/" + name);
+    return !std::filesystem::exists(std::filesystem::symlink_status(absolute(item)));
   }
 
   void look(const DirectoryHandle& folder, const std::string& below, bool withStaging,
@@ -123,12 +142,13 @@ class TestDrive {
     folder.list([&](const std::string& name) {
       const std::string relative = joinPath(below, name);
       if (!withStaging && (isStagingName(name) || isOrphanInfo(relative))) return true;
+
       struct stat status {};
       EXPECT_EQ(folder.status(name, status), 0);
       std::ostringstream text;
       text << std::oct << status.st_mode << ' ' << joinTags(readTags(folder, name, name).names);
       if (S_ISREG(status.st_mode)) {
-        std::string bytes = get(at(relative));
+        std::string bytes = get(absolute(relative));
         if (relative.ends_with(".trashinfo")) {
           bytes.resize(std::min(bytes.find("DeletionDate="), bytes.size()));
         } else {
@@ -138,7 +158,8 @@ class TestDrive {
       }
       std::string target;
       if (S_ISLNK(status.st_mode) && folder.readLink(name, target) == 0) text << ' ' << target;
-      all[relative] = text.str();
+      all[relative.starts_with('/') ? "container" + relative.substr(container.size()) : relative] =
+          text.str();
       if (!S_ISDIR(status.st_mode)) return true;
       DirectoryHandle inner;
       EXPECT_EQ(folder.openFolder(name, inner), 0);

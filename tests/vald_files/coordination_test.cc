@@ -69,7 +69,7 @@ TEST(Coordinator, OverlappingPathsFollowEachOtherInOrder) {
 
 TEST(Operations, OfManyThreadsOnOneTreeLoseNothing) {
   TestDrive drive;
-  FileOperations& files = drive.open();
+  FileOperations& files = drive.open(std::chrono::minutes(1));
   constexpr int kThreads = 4;
   constexpr int kRounds = 30;
   drive.makeFolder("a");

@@ -66,6 +66,19 @@ const std::vector<Operation> kOperations = {
      [](TestDrive& drive) {
        return drive.operations->move(trashFiles(drive) + "/gone", drive.store, {}, true, kRequest);
      }},
+    {"AcrossFile",
+     [](TestDrive& drive) {
+       return drive.operations->move(drive.at("a.txt"), drive.container, "A.txt", false, kRequest);
+     }},
+    {"AcrossTree",
+     [](TestDrive& drive) {
+       return drive.operations->move(drive.at("folder"), drive.container, {}, true, kRequest);
+     }},
+    {"AcrossOutOfTrash",
+     [](TestDrive& drive) {
+       return drive.operations->move(trashFiles(drive) + "/gone", drive.container, {}, false,
+                                     kRequest);
+     }},
     {"SetTags",
      [](TestDrive& drive) {
        const TagResult result = drive.operations->setTags(drive.at("a.txt"), {"new", "set"});
@@ -100,23 +113,13 @@ void furnish(TestDrive& drive, Setting setting) {
   ASSERT_EQ(::utimensat(AT_FDCWD, drive.at("gone").c_str(), times, 0), 0);
 }
 
-// Where the state is: beside the store, or on another volume, where staging has to be
-// in the store itself.
-std::string otherVolume() {
-  struct stat shared {};
-  struct stat temporary {};
-  if (::stat("/dev/shm", &shared) != 0 || ::access("/dev/shm", W_OK) != 0) return {};
-  if (::stat(TestDrive::base().c_str(), &temporary) != 0) return {};
-  return shared.st_dev != temporary.st_dev ? "/dev/shm" : "";
-}
-
 class Matrix : public ::testing::TestWithParam<std::tuple<std::size_t, Setting>> {
  protected:
   void SetUp() override {
-    if (setting() == Setting::StagedInStore) {
-      stateBase = otherVolume();
-      if (stateBase.empty()) GTEST_SKIP() << "no second volume to keep the state on";
-    }
+    if (setting() == Setting::StagedInStore) stateBase = TestDrive::otherVolume();
+    const bool needsTwo =
+        setting() == Setting::StagedInStore || operation().name.starts_with("Across");
+    if (needsTwo && TestDrive::otherVolume().empty()) GTEST_SKIP() << "no second volume";
     TestDrive drive(stateBase);
     furnish(drive, setting());
     before = drive.snapshot(true);

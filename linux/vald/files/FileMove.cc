@@ -17,6 +17,22 @@ NSErrorPtr refused(const std::string& words, const std::string& path) {
                             "can't move \"" + printable(path) + "\": " + words, path);
 }
 
+// Whether a rename cannot go from one to the other.
+bool isAcross(const StorePlace& from, const StorePlace& to) {
+  struct stat one {};
+  struct stat other {};
+  return from.folder.mountOf() != to.folder.mountOf() ||
+         (from.folder.status(one) == 0 && to.folder.status(other) == 0 &&
+          one.st_dev != other.st_dev);
+}
+
+bool isOnRootsVolume(const StorePlace& place) {
+  struct stat root {};
+  struct stat folder {};
+  return place.root->folder.status(root) == 0 && place.folder.status(folder) == 0 &&
+         root.st_dev == folder.st_dev;
+}
+
 bool isOneFile(const StorePlace& one, const StorePlace& other) {
   struct stat first {};
   struct stat second {};
@@ -44,12 +60,11 @@ NSErrorPtr FileOperations::refusalOfMove(const StorePlace& from, const std::stri
   if (const int failure = from.folder.status(from.name, status)) {
     return fileError(failure, "can't find", path);
   }
-  const std::uint64_t mount = from.folder.mountOf(from.name);
-  if (mount != to.folder.mountOf()) {
-    return refused(mount != from.folder.mountOf()
-                       ? "a volume is mounted there"
-                       : "the folder is on another volume; bring in a copy and remove this one",
-                   path);
+  if (from.folder.mountOf(from.name) != from.folder.mountOf()) {
+    return refused("a volume is mounted there", path);
+  }
+  if (isAcross(from, to) && !(isOnRootsVolume(from) && isOnRootsVolume(to))) {
+    return refused("a volume that is mounted in the drive is no part of it", path);
   }
   if (trashed) {
     capability = kMayMoveOutOfTrash;
@@ -72,6 +87,13 @@ std::uint64_t FileOperations::capabilityToMove(const std::string& path, const st
   }
   if (failure) error.store(failure);
   return capability;
+}
+
+bool FileOperations::crossesVolumes(const std::string& path, const std::string& folder) const {
+  StorePlace from;
+  StorePlace to;
+  return !_roots.locate(path, from) && !_roots.locate(joinPath(folder, nameOfPath(path)), to) &&
+         isAcross(from, to);
 }
 
 FileResult FileOperations::rename(const std::string& path, const std::string& newName,
@@ -122,7 +144,13 @@ FileResult FileOperations::moveTo(const StorePlace& from, const std::string& fol
     if (error) return {{}, error};
     if (from.path() == to.path()) return {to.path(), nullptr};
     bool taken = to.folder.exists(to.name) ? bounce : isTakenByAnother(from, to);
-    if (!taken) error = moveOnce(from, to, kind, request, taken);
+    if (!taken && isAcross(from, to)) {
+      bool again = false;
+      error = moveAcross(from, to, kind, request, taken, again);
+      if (again) error = moveAcross(from, to, kind, request, taken, again);
+    } else if (!taken) {
+      error = moveOnce(from, to, kind, request, taken);
+    }
     if (!taken) break;
     error = fileError(EEXIST, "can't move it to", to.path());
   }
@@ -164,13 +192,14 @@ NSErrorPtr FileOperations::moveOnce(const StorePlace& from, const StorePlace& to
     return fileError(failure, doing, from.path());
   }
   if (isAsked(request, to.folder, to.name)) {
-    if (request.moved) request.moved(to.path());
+    if (request.moved) request.moved(to.path(), false);
     failure = syncFolders(to.folder, &from.folder);
   } else {
     failure = ESTALE;
   }
   if (failure != 0) {
-    if (putBack(to.folder, to.name, from) == 0) return fileError(failure, doing, from.path());
+    std::string name = to.name;
+    if (putBack(to.folder, name, from) == 0) return fileError(failure, doing, from.path());
     scope.leaveOpen();
     return fileError(failure, "moved, but perhaps not for good,", to.path());
   }

@@ -8,8 +8,6 @@
 namespace skein::vald {
 namespace {
 
-constexpr std::string_view kTrash = ".Trash";
-
 // Where the extension begins, its dot included; the length when there is none.
 std::size_t extensionOf(const std::string& name) {
   const std::size_t dot = name.rfind('.');
@@ -23,28 +21,6 @@ std::size_t extensionOf(const std::string& name) {
 }
 
 }  // namespace
-
-bool isStagingName(std::string_view name) {
-  return name.starts_with(kImportPrefix) || name.starts_with(kRemovalPrefix);
-}
-
-const char* useOfReservedName(std::string_view name) {
-  if (!name.starts_with('.')) return nullptr;
-  if (isStagingName(name)) return "is used while files are brought in and removed";
-  for (const std::string_view suffix : {kPartSuffix, kFreshSuffix, kAsideSuffix}) {
-    if (name.size() > 1 + suffix.size() && name.ends_with(suffix)) {
-      return "is used while documents come from the cloud and go there";
-    }
-  }
-  return name != kTrash && isTrashName(name) ? "belongs to the trash" : nullptr;
-}
-
-bool isTrashName(std::string_view name) {
-  if (name == kTrash) return true;
-  const std::size_t number = kTrash.size() + 1;
-  return name.starts_with(kTrash) && name.size() > number && name[number - 1] == '-' &&
-         name.find_first_not_of("0123456789", number) == std::string_view::npos;
-}
 
 std::string trashFolderName(uid_t user) { return ".Trash-" + std::to_string(user); }
 
@@ -62,7 +38,7 @@ NSErrorPtr refusalOfName(const std::string& name, bool atStoreRoot) {
     why = "a name has at most 255 bytes; this one has " + std::to_string(name.size());
   } else if (const char* use = useOfReservedName(name)) {
     why = std::string("it ") + use;
-  } else if (atStoreRoot && name == kTrash) {
+  } else if (atStoreRoot && isTrashName(name)) {
     why = "it belongs to the trash";
   } else {
     return nullptr;

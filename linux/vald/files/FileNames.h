@@ -8,6 +8,7 @@
 #include <string_view>
 #include <vector>
 
+#include "linux/protocol/ReservedNames.h"
 #include "platform/foundation/NSError.h"
 
 namespace skein::vald {
@@ -17,25 +18,7 @@ inline constexpr std::size_t kLongestName = 255;  // bytes
 // ones can be removed, and nothing else.
 inline constexpr std::size_t kDeepestTree = 1000;
 
-// What this system puts into a store's folders for a moment, when it has no place on the
-// same volume outside: an import that is under way, and a tree that is being removed.
-inline constexpr char kImportPrefix[] = ".skein-import-";
-inline constexpr char kRemovalPrefix[] = ".skein-removed-";
-bool isStagingName(std::string_view name);
-
-// What it puts beside a document NAME that comes from the cloud or goes there, as ".NAME" and
-// one of these (see EvictionMarker.h).
-inline constexpr std::string_view kPartSuffix = ".skein-part";
-inline constexpr std::string_view kFreshSuffix = ".skein-new";
-inline constexpr std::string_view kAsideSuffix = ".skein-old";
-
-// The one table of names that this system uses itself, in any folder of a store: those above,
-// and ".Trash-<number>". No operation gives one to an item, and the index leaves them out. What
-// such a name is for, in words; null for every other name.
-const char* useOfReservedName(std::string_view name);
-
-// ".Trash" or ".Trash-<number>": a trash where it is at a store's root.
-bool isTrashName(std::string_view name);
+// The user's own trash at a root.
 std::string trashFolderName(uid_t user);
 
 // Null when `name` may be given to an item; else NSFileWriteInvalidFileNameError with

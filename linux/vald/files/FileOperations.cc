@@ -112,12 +112,13 @@ bool FileOperations::isAsked(const FileRequest& request, const DirectoryHandle& 
   return !request.file || (readFileKey(folder.get(), name, key) == 0 && request.file->names(key));
 }
 
-int FileOperations::putBack(const DirectoryHandle& folder, const std::string& name,
+int FileOperations::putBack(const DirectoryHandle& folder, std::string& name,
                             const StorePlace& place) {
   int failure = EEXIST;
   for (unsigned number = 1; failure == EEXIST && number <= kMostNumberedNames; ++number) {
-    failure = _files.renameWithoutReplacing(folder.get(), name, place.folder.get(),
-                                            numberedName(place.name, number, ' '));
+    std::string before = numberedName(place.name, number, ' ');
+    failure = _files.renameWithoutReplacing(folder.get(), name, place.folder.get(), before);
+    if (failure == 0) name = std::move(before);
   }
   return failure;
 }

@@ -18,6 +18,7 @@
 #include "linux/vald/files/StoreRoots.h"
 #include "linux/vald/files/TagAttributes.h"
 #include "linux/vald/files/TrashInfo.h"
+#include "linux/vald/files/TreeComparison.h"
 #include "linux/vald/files/TreeCopy.h"
 #include "platform/log/Log.h"
 
@@ -36,12 +37,18 @@ struct FileOperationsOptions {
 
 // Whose request an operation is: what provenance tells.
 struct FileRequest {
-  std::string origin;            // in words, such as "skein trash (process 4711)"
-  std::string document;          // the item's persistent identifier, where it is known
-  FileProgressHandler progress;  // importing and removing: how far it is, and whether to go on
+  std::string origin;    // in words, such as "skein trash (process 4711)"
+  std::string document;  // the item's persistent identifier, where it is known
+  // Importing, removing and moving between volumes: how far it is, and whether to go on.
+  FileProgressHandler progress;
   // Renaming and moving alone: called when the item is at `path`, while the disk is yet to be
-  // written; when that fails, it is taken back after this call.
-  std::function<void(const std::string& path)> moved = {};
+  // written; when that fails, it is taken back after this call. `isCopy`: on another volume, where
+  // it is another file, and stays.
+  std::function<void(const std::string& path, bool isCopy)> moved = {};
+  // Moving between volumes alone: called before the item leaves its place. From then on until
+  // moved(), or until the operation answers an error, nothing that is seen there, or at `path`,
+  // tells what became of it.
+  std::function<void(const std::string& path)> leaves = {};
   // Removing alone: called when the item is out of sight, and nothing of it is deleted yet.
   // False: it is put back.
   std::function<bool()> removed = {};
@@ -64,7 +71,7 @@ struct FileResult {
 enum MoveCapability : std::uint64_t {
   kMayRename = 1u << 0,  // within the same folder
   kMayMoveToAnotherFolder = 1u << 3,
-  kMayMoveToAnotherRoot = 1u << 4,  // between the drive and an app's folder, on one volume
+  kMayMoveToAnotherRoot = 1u << 4,  // between the drive and an app's folder
   kMayMoveOutOfTrash = 1u << 5,
 };
 
@@ -102,9 +109,14 @@ class FileOperations {
                     const FileRequest& request);
   // Out of the trash this is putting back: without a name the item gets the one it had.
   // `bounce`: a taken name is tried again as "name 2.ext", "name 3.ext" ...
+  // To another volume (see crossesVolumes) this copies, compares, and then removes what it has
+  // copied: it takes as long as that takes, and can be cancelled. What a copy cannot keep is
+  // refused. Hard links to what is moved are no links to it any more.
   FileResult move(const std::string& path, const std::string& folder,
                   const std::optional<std::string>& newName, bool bounce,
                   const FileRequest& request);
+  // Whether the folder is on another volume than the item: then move() copies.
+  bool crossesVolumes(const std::string& path, const std::string& folder) const;
   // Removes a file or tree for good. Answers without a path; when it was cancelled and the name
   // is taken by then, with the path that the item has now.
   FileResult remove(const std::string& path, const FileRequest& request);
@@ -163,9 +175,9 @@ class FileOperations {
   // renamed, since no claim keeps other programs from renaming in the last moment.
   static bool isAsked(const FileRequest& request, const DirectoryHandle& folder,
                       const std::string& name);
-  // Renames an entry back to where it was; with a number when the name was taken since. 0 or an
-  // errno.
-  int putBack(const DirectoryHandle& folder, const std::string& name, const StorePlace& place);
+  // Renames an entry back to where it was; with a number when the name was taken since. `name` is
+  // then what it is called. 0 or an errno.
+  int putBack(const DirectoryHandle& folder, std::string& name, const StorePlace& place);
   // Claims a place where something new shall be; refuses taken names and the trash.
   NSErrorPtr takeNew(const std::string& folder, const std::string& name, StorePlace& place,
                      Hold& hold);
@@ -178,7 +190,8 @@ class FileOperations {
   // Deletes what an import left; what stays is the next start's.
   void discardStaged(const StagingPlace& staged, OperationScope& scope);
   FileResult removeAside(const StorePlace& place, const FileRequest& request, bool& again);
-  // Back to its name, or to the next one that is free. 0 or an errno.
+
+  // putBack() of what is aside, which waits for the disk. `name`: what it is called then.
   int putBackRemoved(const StagingPlace& aside, const StorePlace& place, std::string& name);
 
   FileResult moveTo(const StorePlace& from, const std::string& folder, const std::string& name,
@@ -186,6 +199,9 @@ class FileOperations {
   // One try: `taken` when the name is.
   NSErrorPtr moveOnce(const StorePlace& from, const StorePlace& to, OperationKind kind,
                       const FileRequest& request, bool& taken);
+  // The same to another volume. `again`: the staging was on another volume after all.
+  NSErrorPtr moveAcross(const StorePlace& from, const StorePlace& to, OperationKind kind,
+                        const FileRequest& request, bool& taken, bool& again);
   // 0 or an errno; EEXIST when another item has the name.
   int renameItem(const StorePlace& from, const StorePlace& to);
   // Finds the destination too. An error when no such move may be.
@@ -216,6 +232,7 @@ class FileOperations {
   bool placeToComeBack(const std::string& path, StorePlace& place) const;
   std::optional<OperationState> recoverTrash(const OperationEntry& entry);
   std::optional<OperationState> recoverPutBack(const OperationEntry& entry);
+  std::optional<OperationState> recoverMoveAcross(const OperationEntry& entry);
   NSErrorPtr recover();
   bool exists(const std::string& path) const;
 

@@ -53,12 +53,14 @@ std::optional<OperationState> FileOperations::recoverEntry(OperationEntry& entry
     case OperationKind::Import: return recoverImport(entry);
     case OperationKind::Remove: return recoverRemoval(entry);
     case OperationKind::Trash: return recoverTrash(entry);
-    case OperationKind::PutBack: return recoverPutBack(entry);
+    case OperationKind::PutBack:
+      return entry.isCopied() ? recoverMoveAcross(entry) : recoverPutBack(entry);
     case OperationKind::CreateFolder:
     case OperationKind::MakeAlias:
       return exists(entry.destination) ? OperationState::Done : OperationState::Undone;
     case OperationKind::Rename:
     case OperationKind::Move:
+      if (entry.isCopied()) return recoverMoveAcross(entry);
       // One step: it was taken or not.
       return exists(entry.destination) && !exists(entry.path) ? OperationState::Done
                                                               : OperationState::Undone;
@@ -71,8 +73,7 @@ int FileOperations::finishLinking(const OperationEntry& entry) {
   DirectoryHandle folders[2];
   std::string names[2];
   struct stat found[2];
-  const bool isImport = entry.kind == OperationKind::Import;
-  const std::string* paths[2] = {isImport ? &entry.aside : &entry.path,
+  const std::string* paths[2] = {entry.isCopied() ? &entry.aside : &entry.path,
                                  entry.destination.empty() ? &entry.aside : &entry.destination};
   for (int at = 0; at < 2; ++at) {
     StagingPlace staged;

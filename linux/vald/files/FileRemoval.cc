@@ -11,8 +11,6 @@ namespace skein::vald {
 
 namespace {
 
-constexpr unsigned kMostTakenNames = 1000;
-
 FileResult cancelledRemoval(const StorePlace& place, const std::string& name) {
   const bool isTaken = name != place.name;
   const std::string now = joinPath(place.folderPath(), name);
@@ -104,13 +102,9 @@ FileResult FileOperations::removeAside(const StorePlace& place, const FileReques
 
 int FileOperations::putBackRemoved(const StagingPlace& aside, const StorePlace& place,
                                    std::string& name) {
-  int failure = EEXIST;
-  for (unsigned number = 1; failure == EEXIST && number <= kMostTakenNames; ++number) {
-    name = numberedName(place.name, number, ' ');
-    failure =
-        _files.renameWithoutReplacing(aside.folder.get(), aside.name, place.folder.get(), name);
-  }
-  // A disk that refuses this one may forget the put back in a power cut; it is made all the same.
+  name = aside.name;
+  const int failure = putBack(aside.folder, name, place);
+  // A disk that refuses this may forget in a power cut that it is back; it is, all the same.
   if (failure == 0) syncFolders(place.folder, &aside.folder);
   return failure;
 }

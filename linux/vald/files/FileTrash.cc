@@ -126,7 +126,8 @@ NSErrorPtr FileOperations::trashAs(const StorePlace& place, const std::string& n
       scope.done();
       return nullptr;
     }
-    if (putBack(trashed, name, place) != 0) {
+    std::string now = name;
+    if (putBack(trashed, now, place) != 0) {
       scope.leaveOpen();
       return fileError(failure, "trashed, but perhaps not for good,", path);
     }

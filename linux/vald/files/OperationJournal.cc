@@ -67,9 +67,10 @@ int posixOf(sqlite3* database, int code) {
 }
 
 // Recovery has nothing to finish of these.
-bool isOneStep(OperationKind kind) {
-  return kind == OperationKind::CreateFolder || kind == OperationKind::Rename ||
-         kind == OperationKind::Move || kind == OperationKind::MakeAlias;
+bool isOneStep(const OperationEntry& entry) {
+  return entry.kind == OperationKind::CreateFolder || entry.kind == OperationKind::Rename ||
+         (entry.kind == OperationKind::Move && !entry.isCopied()) ||
+         entry.kind == OperationKind::MakeAlias;
 }
 
 }  // namespace
@@ -227,7 +228,7 @@ NSErrorPtr OperationJournal::begin(OperationEntry& entry) {
 }
 
 int OperationJournal::writeBegin(OperationEntry& entry) {
-  int code = setDurable(!isOneStep(entry.kind));
+  int code = setDurable(!isOneStep(entry));
   if (code == SQLITE_OK) code = run(_beginTransaction);
   if (code != SQLITE_OK) return code;
   for (const End& end : _unwritten) {

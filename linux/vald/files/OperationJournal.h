@@ -48,6 +48,10 @@ struct OperationEntry {
   std::string path;         // what it was done to; for an import, where it came from
   std::string destination;  // where it is afterwards; empty for a removal
   std::string aside;        // where contents are kept meanwhile; empty when nowhere
+
+  // Whether contents that are no other name of what stood somewhere appear at `destination`: of
+  // an import, and of a move between volumes.
+  bool isCopied() const { return !aside.empty() && !destination.empty(); }
 };
 
 // The durable journal of file operations: an SQLite database of its own in the drive's

@@ -54,6 +54,10 @@ NSErrorPtr Staging::place(const char* prefix, const StorePlace& beside, StagingP
   return nullptr;
 }
 
+std::string Staging::sourceName(const std::string& copyPath) {
+  return kRemovalPrefix + nameOfPath(copyPath).substr(sizeof kImportPrefix - 1);
+}
+
 void Staging::refuseOutside(const StorePlace& beside) {
   MutexLock lock(_mutex);
   _refused.insert(beside.root->path);

@@ -30,6 +30,9 @@ class Staging {
 
   // `prefix`: kImportPrefix or kRemovalPrefix. `beside`: where the item goes or is.
   NSErrorPtr place(const char* prefix, const StorePlace& beside, StagingPlace& place);
+  // The name beside a moved item under which it waits, out of sight, to be deleted, when its copy
+  // is staged at `copyPath`, which place() gave.
+  static std::string sourceName(const std::string& copyPath);
   // The outside staging of this root turned out to be another volume to the system (as
   // with quotas by project): from now on in the folder itself.
   void refuseOutside(const StorePlace& beside);

@@ -9,7 +9,9 @@
 #include <string_view>
 
 #include "linux/vald/files/AccessList.h"
+#include "linux/vald/files/DocumentHint.h"
 #include "linux/vald/files/FileErrors.h"
+#include "linux/vald/files/FileKey.h"
 #include "linux/vald/files/FileNames.h"
 #include "linux/vald/files/OwnFolders.h"
 #include "linux/vald/files/TreeWalk.h"
@@ -48,9 +50,9 @@ bool isUnchanged(int file, const struct stat& before) {
          isSame(now.st_mtim, before.st_mtim) && isSame(now.st_ctim, before.st_ctim);
 }
 
-NSErrorPtr refused(const std::string& path, const std::string& why) {
+NSErrorPtr refused(const char* doing, const std::string& path, const std::string& why) {
   return fileErrorWithWords(NSFileWriteUnknownError, EINVAL,
-                            "can't bring in \"" + printable(path) + "\": " + why, path);
+                            std::string(doing) + " \"" + printable(path) + "\": " + why, path);
 }
 
 bool saysImpossible(int number) {
@@ -86,16 +88,18 @@ class TreeCopy::Measure final : public TreeWalk {
     // The first one's name is what the caller makes of it.
     if (depth() > 0) _refusal = refusalOfName(name, false);
     if (isOwnFolder(status)) {
-      _refusal = refused(path(), "it is where this system keeps its own files; leave it out");
+      _refusal = refused(_copy._doing, path(),
+                         "it is where this system keeps its own files; leave it out");
     }
     if (S_ISREG(status.st_mode)) {
       state.totalBytes += static_cast<std::uint64_t>(status.st_size);
     } else if (!S_ISLNK(status.st_mode) && !S_ISDIR(status.st_mode)) {
-      _refusal = refused(path(), "it is a device, a pipe or a socket; leave it out");
+      _refusal = refused(_copy._doing, path(), "it is a device, a pipe or a socket; leave it out");
     }
     if (depth() > kDeepestTree) {
-      _refusal = refused(path(), "it is more than " + std::to_string(kDeepestTree) +
-                                     " folders deep; bring in its parts one by one");
+      _refusal = refused(_copy._doing, path(),
+                         "it is more than " + std::to_string(kDeepestTree) +
+                             " folders deep; take its parts one by one");
     }
     return _refusal ? EINVAL : 0;
   }
@@ -109,7 +113,7 @@ NSErrorPtr TreeCopy::measure(const DirectoryHandle& folder, const std::string& n
   Measure measure(*this);
   const int failure = measure.walk(folder, name, path);
   if (failure == 0 || measure.refusal()) return measure.refusal();
-  return fileError(failure, failure == ECANCELED ? "can't bring in" : "can't read", measure.path());
+  return fileError(failure, failure == ECANCELED ? _doing : "can't read", measure.path());
 }
 
 class TreeCopy::Copy final : public TreeWalk {
@@ -146,7 +150,8 @@ class TreeCopy::Copy final : public TreeWalk {
     int failure = from.status(status);
     if (failure == 0) failure = _copy.copyAttributes(from.get(), _made.get());
     // Also from a read-only medium the owner gets a folder that can be filled and moved.
-    if (failure == 0) failure = _copy.copyAccess(from.get(), _made.get(), status, 0700);
+    const mode_t least = _copy._isMove ? 0 : 0700;
+    if (failure == 0) failure = _copy.copyAccess(from.get(), _made.get(), status, least);
     const timespec times[2] = {status.st_atim, status.st_mtim};
     if (failure == 0) failure = _copy._files.setTimes(_made.get(), {}, times);
     if (failure == 0) failure = _copy.advance(1, 0);
@@ -167,7 +172,7 @@ NSErrorPtr TreeCopy::copy(const DirectoryHandle& from, const std::string& name,
                           const std::string& newName) {
   Copy copy(*this, to, newName);
   const int failure = copy.walk(from, name, path);
-  return failure == 0 ? nullptr : fileError(failure, "can't bring in", copy.path());
+  return failure == 0 ? nullptr : fileError(failure, _doing, copy.path());
 }
 
 int TreeCopy::copyFile(const DirectoryHandle& from, const std::string& name,
@@ -188,7 +193,7 @@ int TreeCopy::copyFile(const DirectoryHandle& from, const std::string& name,
   if (failure == 0) failure = copyAttributes(source.get(), made.get());
   if (failure == 0 && !isUnchanged(source.get(), status)) failure = ETXTBSY;
   _lease = nullptr;
-  if (failure == 0) failure = copyAccess(source.get(), made.get(), status, 0400);
+  if (failure == 0) failure = copyAccess(source.get(), made.get(), status, _isMove ? 0 : 0400);
   const timespec times[2] = {status.st_atim, status.st_mtim};
   if (failure == 0) failure = _files.setTimes(made.get(), {}, times);
   return failure != 0 ? failure : advance(1, 0);
@@ -275,7 +280,8 @@ int TreeCopy::copyAttributes(int from, int to) {
   for (std::size_t at = 0; at < names.size();) {
     const std::string name(names.c_str() + at);
     at += name.size() + 1;
-    if (!name.starts_with("user.") || name.starts_with(kOwnAttributes)) continue;
+    if (!name.starts_with("user.") || name == kHintAttribute) continue;
+    if (!_isMove && name.starts_with(kOwnAttributes)) continue;
     std::string value(kLargestAttribute, '\0');
     const ssize_t size = ::fgetxattr(from, name.c_str(), value.data(), value.size());
     if (size < 0) continue;  // gone meanwhile, or not ours to read
@@ -284,25 +290,37 @@ int TreeCopy::copyAttributes(int from, int to) {
     // A file system without attributes takes the contents all the same.
     if (failure != 0 && failure != ENOTSUP && failure != EPERM) return failure;
   }
-  return 0;
+  return _isMove ? copyHint(from, to) : 0;
+}
+
+int TreeCopy::copyHint(int from, int to) {
+  auto hint = DocumentHint::parse(attributeOf(from, kHintAttribute));
+  FileKey source;
+  FileKey made;
+  if (!hint || readFileKey(from, {}, source) != 0 || hint->inode != source.inode) return 0;
+  if (const int failure = readFileKey(to, {}, made)) return failure;
+  hint->inode = made.inode;
+  hint->generation = made.generation;
+  const int failure = _files.setAttribute(descriptorPath(to), kHintAttribute, hint->asText());
+  return failure == ENOTSUP || failure == EPERM ? 0 : failure;
 }
 
 int TreeCopy::copyAccess(int from, int to, const struct stat& status, mode_t least) {
   struct stat made {};
   if (::fstat(to, &made) != 0) return errno;
-  mode_t mode = status.st_mode & 0777;
+  mode_t mode = status.st_mode & (_isMove && S_ISDIR(status.st_mode) ? 03777 : 0777);
   AccessList list(attributeOf(from, kAccessList));
   int failure = made.st_gid == status.st_gid ? 0 : _files.setGroup(to, status.st_gid);
   if (failure == EPERM || failure == EINVAL) {
     // To another group the copy is what it is to everybody.
     list.limitGroup(mode & 07);
-    if (list.isEmpty()) mode &= 0707 | (mode & 07) << 3;
+    if (list.isEmpty()) mode &= 03707 | (mode & 07) << 3;
     failure = 0;
   }
   if (failure == 0) failure = copyList(to, kAccessList, list.bytes());
   if (failure == ENOTSUP || failure == EPERM || failure == EINVAL) {
     // Without the list the group's bits are the group's own, not the most that anybody has.
-    if (!list.isEmpty()) mode = (mode & 0707) | static_cast<mode_t>(list.groupPermissions() << 3);
+    if (!list.isEmpty()) mode = (mode & 03707) | static_cast<mode_t>(list.groupPermissions() << 3);
     failure = 0;
   }
   if (failure == 0 && S_ISDIR(status.st_mode)) {
@@ -341,7 +359,7 @@ NSErrorPtr TreeCopy::sync(const DirectoryHandle& to, const std::string& newName,
                                               : Sync(_files).walk(to, newName, path);
   // The disk may have taken its time.
   if (failure == 0 && _progress && !_progress(_state)) failure = ECANCELED;
-  return failure == 0 ? nullptr : fileError(failure, "can't bring in", path);
+  return failure == 0 ? nullptr : fileError(failure, _doing, path);
 }
 
 }  // namespace skein::vald

@@ -31,11 +31,19 @@ using FileProgressHandler = std::function<bool(const FileProgress&)>;
 // A file that another program has open for writing is refused with ETXTBSY (files of this
 // user's own, on file systems with leases), and so is one that changed while it was read.
 //
+// A copy that takes its source's place (Purpose::Move) has the attributes of this system too, and
+// gives the owner no more than the source did; see TreeComparison for what must be the same.
+//
 // Memory does not grow with the tree. One use; one thread.
 class TreeCopy {
  public:
-  TreeCopy(FileLayer& files, FileProgressHandler progress)
-      : _files(files), _progress(std::move(progress)) {}
+  enum class Purpose : std::uint8_t { Import, Move };
+
+  TreeCopy(FileLayer& files, FileProgressHandler progress, Purpose purpose = Purpose::Import)
+      : _files(files),
+        _progress(std::move(progress)),
+        _isMove(purpose == Purpose::Move),
+        _doing(_isMove ? "can't move" : "can't bring in") {}
 
   // Counts what is there, before anything is made. An error for what cannot be copied
   // (devices, pipes, sockets, what may not be read, reserved names, what is more than
@@ -61,6 +69,8 @@ class TreeCopy {
   int copyRange(int from, int to, std::int64_t offset, std::int64_t end, bool untilEnd);
   int copyByReading(int from, int to, std::int64_t offset, std::int64_t end, bool untilEnd);
   int copyAttributes(int from, int to);
+  // The copy of a file that says which document it is says so, too.
+  int copyHint(int from, int to);
   // Group, access lists and mode of the source, whose status is `status`, `least` at least.
   int copyAccess(int from, int to, const struct stat& status, mode_t least);
   int copyList(int to, const char* name, const std::string& list);
@@ -71,6 +81,8 @@ class TreeCopy {
 
   FileLayer& _files;
   const FileProgressHandler _progress;
+  const bool _isMove;
+  const char* const _doing;
   FileProgress _state;
   std::uint64_t _toldItems = 0;
   std::uint64_t _toldBytes = 0;

@@ -61,8 +61,9 @@ int TreeWalk::list(const DirectoryHandle& folder) {
   const int failure = folder.list([&](const std::string& name) {
     level.isEmpty = false;
     struct stat status {};
-    // It may have gone.
-    if (folder.status(name, status) != 0) return true;
+    const int looking = folder.status(name, status);
+    if (looking == ENOENT) return true;  // gone since
+    if (looking != 0) return (ending = unreadable(looking)) == 0;
     _path = joinPath(_path, name);
     ending = visit(folder, name, status);
     if (ending > 0) return false;

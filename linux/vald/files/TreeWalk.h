@@ -37,7 +37,8 @@ class TreeWalk {
   virtual int leave(const DirectoryHandle&, bool /*isEmpty*/) { return 0; }
   // After leave(), from outside.
   virtual int didLeave(const DirectoryHandle& /*parent*/, const std::string& /*name*/) { return 0; }
-  // A folder cannot be opened, or not be read to its end. 0 goes on without.
+  // A folder cannot be opened, or not be read to its end, or an entry not be looked at. 0 goes on
+  // without.
   virtual int unreadable(int failure) { return failure; }
 
   // Of the folder that is entered or left; 1 is the first.

@@ -41,6 +41,7 @@ void Reconciler::forget() {
   _selves.clear();
   _newFolders.clear();
   _removedFolders.clear();
+  _copiedFolders.clear();
   _deciding.clear();
   _appearedByInode.clear();
   _replacedByInode.clear();
@@ -242,6 +243,10 @@ void Reconciler::endRound() {
 void Reconciler::appeared(const Difference& difference) {
   const Place& place = difference.place;
   if (_folders.find(place.folder) == nullptr) return;
+  if (std::any_of(_expected.begin(), _expected.end(),
+                  [&](const auto& copy) { return copy.second == place; })) {
+    return;
+  }
   if (const auto row = rowAt(place)) {
     // Another decision has filled the name meanwhile.
     if (row->state.kind == difference.state.kind && row->state.key.names(difference.state.key)) {
@@ -337,6 +342,11 @@ void Reconciler::replaced(const Difference& difference) {
 void Reconciler::vanished(const ItemRow& seen) {
   const std::optional<ItemRow> row = _index.rowWithID(seen.id);
   if (!row || row->parent != seen.parent || row->name != seen.name) return;
+  if (std::any_of(_expected.begin(), _expected.end(), [&](const auto& copy) {
+        return copy.first == Place{row->parent, row->name};
+      })) {
+    return;
+  }
   FileState there;
   const Whereabouts where = whereabouts(*row, there);
   if (where == Whereabouts::StillThere || where == Whereabouts::Unknown) return;
@@ -349,6 +359,42 @@ void Reconciler::vanished(const ItemRow& seen) {
     }
   }
   buryTree(*row);
+}
+
+bool Reconciler::takeCopy(const Place& from, const Place& to, const FileState& state) {
+  _now = _clock();
+  const std::optional<ItemRow> row = rowAt(from);
+  if (!row || row->state.kind != state.kind || rowAt(to)) return false;
+  FileState there;
+  const Whereabouts where = whereabouts(*row, there);
+  if (where == Whereabouts::StillThere || where == Whereabouts::Unknown) return false;
+  becomeCopy(*row, to, state);
+  return true;
+}
+
+void Reconciler::takeCopies(FolderKey folder, const FolderSnapshot& snapshot) {
+  for (const DiskEntry& entry : snapshot.entries) {
+    const Place place{folder, std::string(entry.name)};
+    const std::optional<ItemRow> row = rowAt(place);
+    if (row && row->state.kind == entry.state.kind && !row->state.key.names(entry.state.key)) {
+      becomeCopy(*row, place, entry.state);
+    }
+  }
+}
+
+void Reconciler::becomeCopy(ItemRow row, const Place& place, const FileState& state) {
+  // The copy was made now, the item was not.
+  ItemDetails details = row.hasDetails ? _index.details(row.id) : ItemDetails();
+  if (!details.created && !row.state.isEvicted && row.state.key.born != 0) {
+    details.created = row.state.key.born;
+    _details.put(row, details);
+  }
+  if (Folder* folder = _folders.find(row.folder)) {
+    folder->row.key = state.key;
+    _folders.touch(row.folder);
+    _copiedFolders.push_back(row.folder);
+  }
+  move(std::move(row), place, state);
 }
 
 // The youngest link to the document's file that is at its name and came after it; `there` is it.

@@ -27,7 +27,9 @@
 //  6. Two hard links are two documents. When the first goes while the second is young, the
 //     number goes with it: that was a rename. When the second goes, the first stays.
 //  7. A file that comes back (its tombstone is still kept) takes its number up again.
-//  8. A marker is its document, not present: evicting and downloading are rule 2. A marker,
+//  8. What was moved to another volume is the item that it is a copy of; whoever moved it says so
+//     (expectCopy, takeCopy).
+//  9. A marker is its document, not present: evicting and downloading are rule 2. A marker,
 //     or a file with a hint, that nothing is known of is the document that it names, unless
 //     that lives: then it is a copy, and new.
 //
@@ -41,6 +43,7 @@
 #include <string>
 #include <unordered_map>
 #include <unordered_set>
+#include <utility>
 #include <vector>
 
 #include "linux/vald/scan/Details.h"
@@ -55,6 +58,12 @@ namespace skein::vald {
 class Reconciler {
  public:
   using Clock = std::function<std::int64_t()>;  // milliseconds since 1970
+  struct Place {
+    FolderKey folder = kNoFolder;
+    std::string name;
+
+    friend bool operator==(const Place&, const Place&) = default;
+  };
 
   Reconciler(IndexWriter& index, Journal& journal, FolderTable& folders, Disk& disk,
              Details& details, std::chrono::milliseconds graceWindow, Clock clock);
@@ -90,6 +99,19 @@ class Reconciler {
   void decide(bool inRound, const IsFollowed& isFollowed = nullptr);
   void endRound();
 
+  // From now on until forgetCopy(), that nothing is at `from`, or something at `to`, means nothing.
+  void expectCopy(const Place& from, const Place& to) { _expected.emplace_back(from, to); }
+  void forgetCopy(const Place& from) {
+    std::erase_if(_expected, [&](const auto& copy) { return copy.first == from; });
+  }
+  // What is seen at `to` is a copy of the item whose place was `from`, and is the item from now on.
+  // False when no item of its kind has gone from there.
+  bool takeCopy(const Place& from, const Place& to, const FileState& state);
+  // The same for what is in a folder that was taken so, name by name.
+  void takeCopies(FolderKey folder, const FolderSnapshot& snapshot);
+  // Folders that are other folders on the disk since this was last asked, with the same items.
+  std::vector<FolderKey> takeCopiedFolders() { return std::exchange(_copiedFolders, {}); }
+
   // Removes a folder's item and everything below it.
   void buryTree(const ItemRow& row);
   void forget();
@@ -100,10 +122,6 @@ class Reconciler {
   std::vector<FolderKey> takeRemovedFolders() { return std::exchange(_removedFolders, {}); }
 
  private:
-  struct Place {
-    FolderKey folder = kNoFolder;
-    std::string name;
-  };
   struct Difference {
     Place place;
     FileState state;
@@ -134,6 +152,7 @@ class Reconciler {
   void insertNew(const Place& place, const FileState& state);
   void move(ItemRow row, const Place& place, const FileState& state);
   void retarget(ItemRow row, const FileState& state);
+  void becomeCopy(ItemRow row, const Place& place, const FileState& state);
   // The row takes the file's state, which may be another file's.
   void take(ItemRow& row, const FileState& state);
   void recordDeparture(const ItemRow& row, const Place& to);
@@ -185,6 +204,8 @@ class Reconciler {
   std::unordered_set<FolderKey> _selves;
   std::vector<FolderKey> _newFolders;
   std::vector<FolderKey> _removedFolders;
+  std::vector<FolderKey> _copiedFolders;
+  std::vector<std::pair<Place, Place>> _expected;  // copies that are being made: from, to
   // Documents that left a name for a backup's, by folder and name.
   std::unordered_map<std::string, Departure> _departures;
   std::int64_t _now = 0;
