@@ -58,4 +58,9 @@ endfunction()
 option(SKEIN_UNITY "Compile files in groups" OFF)
 function(skein_unity target size)
   set_target_properties(${target} PROPERTIES UNITY_BUILD ${SKEIN_UNITY} UNITY_BUILD_BATCH_SIZE ${size})
+  if(SKEIN_UNITY AND CMAKE_CXX_COMPILER_ID STREQUAL "GNU")
+    # A class of one file may have members of that file's unnamed namespace: g++ takes a file in
+    # a group for a header.
+    target_compile_options(${target} PRIVATE -Wno-subobject-linkage)
+  endif()
 endfunction()

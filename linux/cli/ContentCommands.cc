@@ -1,5 +1,8 @@
 // skein get, skein cat, skein evict
 #include <fcntl.h>
+#include <linux/openat2.h>
+#include <sys/stat.h>
+#include <sys/syscall.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -60,8 +63,19 @@ NSErrorPtr fileError(const std::string& path) {
 
 // Null when all of it was written.
 NSErrorPtr copyToOutput(const std::string& path, Output& output) {
-  const FileDescriptor file(open(path.c_str(), O_RDONLY | O_CLOEXEC));
-  if (!file) return fileError(path);
+  // Another program may put anything in the document's place meanwhile: a link to a file outside
+  // the drive is not followed, and a pipe not waited for.
+  open_how how{};
+  how.flags = O_RDONLY | O_CLOEXEC | O_NONBLOCK;
+  how.resolve = RESOLVE_NO_SYMLINKS;
+  const FileDescriptor file(
+      static_cast<int>(syscall(SYS_openat2, AT_FDCWD, path.c_str(), &how, sizeof(how))));
+  struct stat status {};
+  if (!file || fstat(file.get(), &status) != 0) return fileError(path);
+  if (!S_ISREG(status.st_mode)) {
+    errno = ESTALE;
+    return fileError(path);
+  }
   std::string buffer(std::size_t{256} * 1024, '\0');
   for (;;) {
     const ssize_t got = read(file.get(), buffer.data(), buffer.size());

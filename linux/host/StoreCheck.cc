@@ -416,11 +416,13 @@ class StoreCheck::Work final : public std::enable_shared_from_this<Work> {
                                "the document, or rename this file to its name"});
       }
       if (useOfReservedName(name) != nullptr) continue;  // vald leaves it out, too
-      differences.push_back({HostDifference::Kind::MissingInListing, joined(folder.drivePath, name),
-                             isLeftMarker(name, look->items)
-                                 ? "the marker of an older version: the document was written anew "
-                                   "while it was evicted; evict the document, or remove this file"
-                                 : "on disk, but not listed"});
+      differences.push_back(
+          {HostDifference::Kind::MissingInListing, joined(folder.drivePath, name),
+           isLeftMarker(name, look->items)
+               ? "the marker of an evicted document whose name another file took; "
+                 "rename this file, and that document is listed under the new "
+                 "name"
+               : "on disk, but not listed"});
     }
     if (!differences.empty()) {
       settle(look, std::move(differences));

@@ -61,8 +61,7 @@ NSErrorPtr Files::willLeave(const Subject& subject) const {
       subject.item->fileObjectID().isFolderOrAliasID()) {
     return nullptr;
   }
-  return removeMarkerOfOlderVersion(_parts.places, subject.place.path,
-                                    subject.item->fileObjectID());
+  return nameOlderVersionApart(_parts.places, subject.place.path, subject.item->fileObjectID());
 }
 
 bool Files::recognize(Subject& subject, VLFileObjectID id) {

@@ -559,6 +559,12 @@ TEST_F(DriveTest, AnOlderVersionDoesNotComeBackWhenTheNewerFileLeaves) {
     settle();
     EXPECT_FALSE(exists(".doc.txt.skein")) << answer;
     EXPECT_FALSE(item("doc.txt")) << answer;
+    // It may have been another document's: what was evicted is still there.
+    ASSERT_TRUE(eventually([&] { return item("doc 2.txt") != nullptr; })) << answer;
+    EXPECT_NE(id("doc 2.txt"), before);
+    EXPECT_EQ(downloaded("doc 2.txt"), "");
+    EXPECT_EQ(read("doc 2.txt"), "old");
+    EXPECT_EQ(removed("doc 2.txt"), "");
   }
 }
 

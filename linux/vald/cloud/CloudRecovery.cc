@@ -236,8 +236,8 @@ NSErrorPtr removeStaleMarker(const CloudPlaces& places, const StorePlace& place,
   return code == 0 ? nullptr : fileError(code, "can't remove the old marker of", place.path());
 }
 
-NSErrorPtr removeMarkerOfOlderVersion(const CloudPlaces& places, const std::string& path,
-                                      VLFileObjectID document) {
+NSErrorPtr nameOlderVersionApart(const CloudPlaces& places, const std::string& path,
+                                 VLFileObjectID document) {
   StorePlace place;
   if (places.roots.locate(path, place) != nullptr || place.isRoot()) return nullptr;
   const MarkerNames names(place.name);
@@ -248,9 +248,16 @@ NSErrorPtr removeMarkerOfOlderVersion(const CloudPlaces& places, const std::stri
   if (!marker || marker->marker.document != document || !place.folder.exists(place.name)) {
     return nullptr;
   }
-  int code = places.files.unlink(place.folder.get(), names.marker);
+  constexpr unsigned kMostTries = 1000;
+  int code = EEXIST;
+  for (unsigned number = 2; code == EEXIST && number < kMostTries; ++number) {
+    const std::string name = numberedName(place.name, number, ' ');
+    if (place.folder.exists(name)) continue;
+    code = places.files.renameWithoutReplacing(place.folder.get(), names.marker, place.folder.get(),
+                                               MarkerNames(name).marker);
+  }
   if (code == 0) code = places.files.sync(place.folder.get());
-  return code == 0 ? nullptr : fileError(code, "can't remove the old marker of", path);
+  return code == 0 ? nullptr : fileError(code, "can't rename the old marker of", path);
 }
 
 NSErrorPtr recoverUnfinishedWork(const CloudPlaces& places) {

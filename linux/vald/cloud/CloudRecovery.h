@@ -31,10 +31,12 @@ NSErrorPtr removeStaleMarker(const CloudPlaces& places, const StorePlace& place,
                              VLFileObjectID document);
 
 // A document's file that is about to leave its place would leave the marker of an older version
-// behind, which would then stand for the document: removes that. Nothing happens where there is
-// no such marker. Takes the place's lock.
-NSErrorPtr removeMarkerOfOlderVersion(const CloudPlaces& places, const std::string& path,
-                                      VLFileObjectID document);
+// behind, which would then stand for the document. It gets another name ("letter 2.txt" of
+// letter.txt) and is a document of its own: whether the file is a newer version, or another
+// document that was moved to the name of an evicted one, nobody can tell. Nothing happens where
+// there is no such marker. Takes the place's lock.
+NSErrorPtr nameOlderVersionApart(const CloudPlaces& places, const std::string& path,
+                                 VLFileObjectID document);
 
 // recoverPlace() for everything that was under way when the process ended. At start, before the
 // first eviction or download. Goes on after a place that cannot be mended, which stays noted
