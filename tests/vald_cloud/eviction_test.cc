@@ -372,6 +372,15 @@ TEST_F(EvictionTest, WhatHappensToTheFileWhileItGoesKeepsIt) {
   EXPECT_EQ(contentsOf(path), "the d0cument");
   EXPECT_EQ(contentsOf((rig.top / "drive/b").string()), "the document");
   std::filesystem::remove(rig.top / "drive/b");
+  // It gets another name.
+  ASSERT_TRUE(std::holds_alternative<UploadDone>(rig.upload(kDocument, path)));
+  rig.files.before = [&](FileStep step, std::string_view name) {
+    if (step == FileStep::Rename && name == "a") std::filesystem::rename(path, path + "2");
+  };
+  EXPECT_NE(rig.evict(kDocument, path), nullptr);
+  rig.files.before = nullptr;
+  EXPECT_EQ(rig.names(), std::vector<std::string>{"a2"});
+  std::filesystem::rename(path + "2", path);
 
   // It is uploaded again before it is looked at: those contents were not verified.
   ASSERT_TRUE(std::holds_alternative<UploadDone>(rig.upload(kDocument, path)));

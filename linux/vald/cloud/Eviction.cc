@@ -57,6 +57,7 @@ struct Eviction::Subject {
   UploadStamp uploadedAs;
   CloudRecord record;
   std::optional<CloudContents::Hold> contents;
+  ino_t marker = 0;       // of the marker that was written; 0: none
   bool isDurable = true;  // that the file is gone
 };
 
@@ -79,7 +80,10 @@ NSErrorPtr Eviction::evict(const Request& request) {
   if (error != nullptr) {
     subject.lease.giveUp();
     // What is not undone now stays noted and is undone at the next start.
-    if (recoverPlace(_places, subject.place, work->contents) != nullptr) return error;
+    if (recoverPlace(_places, subject.place, work->contents) != nullptr ||
+        !takeMarkerBack(subject)) {
+      return error;
+    }
   } else {
     // A stamp that is left fits no file any more: nothing depends on this.
     _places.records.setStamp(request.document, std::nullopt);
@@ -235,6 +239,21 @@ NSErrorPtr Eviction::perform(Subject& subject) {
   return code == 0 ? nullptr : fileError(code, "can't evict", subject.request.path);
 }
 
+// The document was renamed while its marker was written: it is not evicted, and the marker would
+// show it a second time. A file that has no name any more has only the marker left.
+bool Eviction::takeMarkerBack(const Subject& subject) {
+  struct stat file {};
+  struct stat marker {};
+  const DirectoryHandle& folder = subject.place.folder;
+  if (subject.marker == 0 || folder.status(subject.names->marker, marker) != 0 ||
+      marker.st_ino != subject.marker || fstat(subject.file.get(), &file) != 0 ||
+      file.st_nlink == 0) {
+    return true;
+  }
+  return _places.files.unlink(folder.get(), subject.names->marker) == 0 &&
+         _places.files.sync(folder.get()) == 0;
+}
+
 NSErrorPtr Eviction::writeMarker(Subject& subject) {
   const std::string& path = subject.request.path;
   struct stat status {};
@@ -263,7 +282,9 @@ NSErrorPtr Eviction::writeMarker(Subject& subject) {
     return error;
   }
   code = _places.files.sync(fresh.get());
+  if (code == 0 && fstat(fresh.get(), &status) != 0) code = errno;
   if (code == 0) {
+    subject.marker = status.st_ino;
     code = _places.files.renameWithoutReplacing(folder, subject.names->fresh, folder,
                                                 subject.names->marker);
   }

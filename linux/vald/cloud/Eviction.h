@@ -60,6 +60,8 @@ class Eviction {
   NSErrorPtr perform(Subject& subject);
   NSErrorPtr writeMarker(Subject& subject);
   NSErrorPtr setAside(Subject& subject);
+  // False when it is still there.
+  bool takeMarkerBack(const Subject& subject);
 
   const CloudPlaces _places;
 };
