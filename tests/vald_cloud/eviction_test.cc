@@ -83,10 +83,13 @@ TEST_F(EvictionTest, TagsThatChangedAfterTheUploadGoWithTheFile) {
 
 TEST_F(EvictionTest, NamesOfEveryLengthAndByte) {
   const std::string odd = "a\n%b\xff é.txt";
+  std::string longest(253, 'z');
+  longest.insert(0, "\xc3\xa9");
+  // Cut within a character, were it cut at 200 bytes.
+  std::string accented(249, 'w');
+  accented.insert(199, "\xc3\xa9");
   for (const std::string& name :
-       {odd, std::string(240, 'x'), std::string(241, 'y'), "\xc3\xa9" + std::string(253, 'z'),
-        // Cut within a character, were it cut at 200 bytes.
-        std::string(199, 'w') + "\xc3\xa9" + std::string(50, 'w')}) {
+       {odd, std::string(240, 'x'), std::string(241, 'y'), longest, accented}) {
     const std::string path = uploaded(name, name);
     ASSERT_EQ(brief(rig.evict(kDocument, path)), "none") << name;
     ASSERT_EQ(rig.names().size(), 1u);
