@@ -1,6 +1,7 @@
 #include "linux/host/HostFileRequests.h"
 
 #include <chrono>
+#include <functional>
 #include <utility>
 
 #include "linux/framework/RequestOrigin.h"
@@ -46,6 +47,27 @@ ItemCompletion completionFor(const std::shared_ptr<DriveRequests>& drive,
   return [drive, timed](NSFileProviderItemPtr item, NSErrorPtr error) {
     answerWith(*drive, *timed, std::move(item), std::move(error));
   };
+}
+
+// Answers with a transfer, which cancels what `start` starts; `start` ends it.
+void startTransfer(const DriveRequests& drive, const RequestOrigin& origin,
+                   const TimedTransfer& timed,
+                   const std::function<void(const std::shared_ptr<Transfer>&,
+                                            const std::shared_ptr<RequestProgress>&)>& start) {
+  const auto transfer = std::make_shared<Transfer>(drive.tools());
+  const auto progress = std::make_shared<RequestProgress>();
+  const RequestOriginScope originScope(origin);
+  const RequestProgressScope progressScope(progress);
+  start(transfer, progress);
+  (*timed)(streamOf(transfer, [progress] { progress->cancel(); }), nullptr);
+}
+
+void finishWith(const DriveRequests& drive, Transfer& transfer, NSFileProviderItemPtr item,
+                NSErrorPtr error) {
+  const auto finish = [&](HostItem placed, NSErrorPtr reason) {
+    transfer.finish(std::move(placed), std::move(reason));
+  };
+  answerWith(drive, finish, std::move(item), std::move(error));
 }
 
 // Where the identifier's item is; null with an error.
@@ -207,22 +229,16 @@ void HostFileRequests::importDocument(std::string source, HostTarget parent, Req
           (*timed)(nullptr, error);
           return;
         }
-        const auto transfer = std::make_shared<Transfer>(drive->tools());
-        const auto progress = std::make_shared<RequestProgress>();
-        transfer->follow(progress);
-        const RequestOriginScope originScope(origin);
-        const RequestProgressScope progressScope(progress);
-        drive->extension().importDocumentAtURL(
-            NSURL::fileURLWithPath(source), *folder,
-            [drive, transfer, source, folder](NSFileProviderItemPtr item, NSErrorPtr problem) {
-              // The extension does not say why it found no item after the import.
-              if (!item && !problem) item = importedItem(*drive, source, *folder);
-              const auto finish = [&](HostItem placed, NSErrorPtr reason) {
-                transfer->finish(std::move(placed), std::move(reason));
-              };
-              answerWith(*drive, finish, std::move(item), std::move(problem));
-            });
-        (*timed)(streamOf(transfer, [progress] { progress->cancel(); }), nullptr);
+        startTransfer(*drive, origin, timed, [&](const auto& transfer, const auto& progress) {
+          transfer->follow(progress);
+          drive->extension().importDocumentAtURL(
+              NSURL::fileURLWithPath(source), *folder,
+              [drive, transfer, source, folder](NSFileProviderItemPtr item, NSErrorPtr problem) {
+                // The extension does not say why it found no item after the import.
+                if (!item && !problem) item = importedItem(*drive, source, *folder);
+                finishWith(*drive, *transfer, std::move(item), std::move(problem));
+              });
+        });
       });
 }
 
@@ -294,20 +310,14 @@ void HostFileRequests::reparent(HostTarget target, HostTarget parent,
           (*timed)(nullptr, error);
           return;
         }
-        const auto transfer = std::make_shared<Transfer>(drive->tools());
-        const auto progress = std::make_shared<RequestProgress>();
-        transfer->follow(progress);
-        const RequestOriginScope originScope(origin);
-        const RequestProgressScope progressScope(progress);
-        drive->extension().reparentItemWithIdentifier(
-            *identifier, *folder, name,
-            [drive, transfer](NSFileProviderItemPtr item, NSErrorPtr problem) {
-              const auto finish = [&](HostItem placed, NSErrorPtr reason) {
-                transfer->finish(std::move(placed), std::move(reason));
-              };
-              answerWith(*drive, finish, std::move(item), std::move(problem));
-            });
-        (*timed)(streamOf(transfer, [progress] { progress->cancel(); }), nullptr);
+        startTransfer(*drive, origin, timed, [&](const auto& transfer, const auto& progress) {
+          transfer->follow(progress);
+          drive->extension().reparentItemWithIdentifier(
+              *identifier, *folder, name,
+              [drive, transfer](NSFileProviderItemPtr item, NSErrorPtr problem) {
+                finishWith(*drive, *transfer, std::move(item), std::move(problem));
+              });
+        });
       });
 }
 
@@ -349,14 +359,11 @@ void HostFileRequests::remove(HostTarget target, RequestOrigin origin,
           (*timed)(nullptr, error);
           return;
         }
-        const auto transfer = std::make_shared<Transfer>(drive->tools());
-        const auto progress = std::make_shared<RequestProgress>();
-        const RequestOriginScope originScope(origin);
-        const RequestProgressScope progressScope(progress);
-        drive->extension().deleteItemWithIdentifier(*identifier, [transfer](NSErrorPtr problem) {
-          transfer->finish({}, std::move(problem));
+        startTransfer(*drive, origin, timed, [&](const auto& transfer, const auto&) {
+          drive->extension().deleteItemWithIdentifier(*identifier, [transfer](NSErrorPtr problem) {
+            transfer->finish({}, std::move(problem));
+          });
         });
-        (*timed)(streamOf(transfer, [progress] { progress->cancel(); }), nullptr);
       });
 }
 

@@ -64,6 +64,7 @@ void Files::setTagNames(NSURLPtr url, std::vector<std::string> names, Reply<NSEr
     if (subject.error) return answered(subject.error);
     // Before the tags, so that one look at the file sees both.
     if (subject.item) writeHint(subject);
+    const TagResult earlier = _parts.operations.tags(subject.place.physical);
     // The store looks while the disk is still written to.
     std::function<void()> waitForStore;
     const TagResult result = _parts.operations.setTags(
@@ -78,10 +79,15 @@ void Files::setTagNames(NSURLPtr url, std::vector<std::string> names, Reply<NSEr
     // Also where the file has them: an index that was told is not behind.
     const bool isOnFile = result.storage == TagStorage::Kept;
     const std::string tags = joinTags(names);
-    answered(changeDetails(subject, [tags, isOnFile](ItemDetails& details) {
+    NSErrorPtr error = changeDetails(subject, [tags, isOnFile](ItemDetails& details) {
       details.tags = tags;
       details.tagsAreOnFile = isOnFile && !tags.empty();
-    }));
+    });
+    // Who is told that nothing was changed finds the file as it was.
+    if (error && isOnFile && earlier.storage == TagStorage::Kept) {
+      _parts.operations.setTags(subject.place.physical, earlier.names, nullptr, subject.file);
+    }
+    answered(std::move(error));
   });
 }
 

@@ -639,19 +639,21 @@ bool Reconciler::returned(const Place& place, const FileState& state) {
   row.state = state;
   // One of several links is one that came later.
   if (state.kind == ItemKind::Document && isKnownAsAnother(place, state, {})) row.seen = _now;
-  if (state.kind == ItemKind::Folder) {
-    FolderRow folder;
-    folder.id = row.id;
-    folder.parent = place.folder;
-    folder.name = place.name;
-    folder.key = state.key;
-    row.folder = _folders.add(std::move(folder));
-    _newFolders.push_back(row.folder);
-  }
+  if (state.kind == ItemKind::Folder) addFolderOf(row);
   _details.recall(row);
   _details.refresh(row, true);
   _journal.insert(row);
   return true;
+}
+
+void Reconciler::addFolderOf(ItemRow& row) {
+  FolderRow folder;
+  folder.id = row.id;
+  folder.parent = row.parent;
+  folder.name = row.name;
+  folder.key = row.state.key;
+  row.folder = _folders.add(std::move(folder));
+  _newFolders.push_back(row.folder);
 }
 
 VLFileObjectID Reconciler::newID(const FileState& state) {
@@ -676,15 +678,7 @@ void Reconciler::insertNew(const Place& place, const FileState& state) {
   // A file that a round finds was there before, unless its dates say otherwise.
   const std::int64_t changed = state.changed / 1'000'000;
   row.seen = _now - changed < kYouth ? _now : 0;
-  if (state.kind == ItemKind::Folder) {
-    FolderRow folder;
-    folder.id = row.id;
-    folder.parent = place.folder;
-    folder.name = place.name;
-    folder.key = state.key;
-    row.folder = _folders.add(std::move(folder));
-    _newFolders.push_back(row.folder);
-  }
+  if (state.kind == ItemKind::Folder) addFolderOf(row);
   if (hinted) _details.recall(row);
   _details.refresh(row, false);
   _journal.insert(row);

@@ -150,6 +150,8 @@ class Reconciler {
   std::optional<Tombstone> deadWith(const FileState& state);
   bool wasAnother(const FileState& state, const std::string& name);
   void insertNew(const Place& place, const FileState& state);
+  // The folder whose item the row is, of which nothing is known yet.
+  void addFolderOf(ItemRow& row);
   void move(ItemRow row, const Place& place, const FileState& state);
   void retarget(ItemRow row, const FileState& state);
   void becomeCopy(ItemRow row, const Place& place, const FileState& state);
